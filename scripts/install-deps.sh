@@ -1,0 +1,34 @@
+#!/usr/bin/env bash
+# Installs what the library needs to build and test, from Debian's packages.
+# Safe to run again: it asks apt only for packages that are not installed yet.
+set -euo pipefail
+
+packages=(
+  cmake
+  g++
+  make
+  pkg-config
+  libjsoncpp-dev
+  libgtest-dev
+  libgmock-dev
+  libbenchmark-dev
+)
+
+missing=()
+for p in "${packages[@]}"; do
+  if ! dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q 'install ok installed'; then
+    missing+=("$p")
+  fi
+done
+
+if [ "${#missing[@]}" -eq 0 ]; then
+  exit 0
+fi
+
+SUDO=""
+if [ "$(id -u)" -ne 0 ]; then
+  SUDO="sudo"
+fi
+export DEBIAN_FRONTEND=noninteractive
+$SUDO apt-get update -q
+$SUDO apt-get install -y -q --no-install-recommends "${missing[@]}"

@@ -1,0 +1,100 @@
+#define FILEINDEX_LOG_UNIT "config"
+
+#include "fileindex/config.h"
+
+#include <fcntl.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdlib>
+
+#include "fileindex/error.h"
+#include "fileindex/utils.h"
+#include "json_io.h"
+#include "log.h"
+
+namespace WEZO {
+namespace FILEINDEX {
+namespace {
+
+constexpr int kLockAttempts = 3;
+constexpr mode_t kFileMode = 0644;
+
+}  // namespace
+
+Config::Config() : m_jsRoot(Json::objectValue), m_lockFd(-1) {}
+
+// Releasing the lock is always the owner's explicit Unlock(); see the class comment.
+Config::~Config() = default;
+
+bool Config::LoadJson() {
+  const std::string path = GetPath();
+  // A missing file is an empty configuration; so is a symbolic link in its place, which is
+  // never followed.
+  if (!IsFileExist(path)) {
+    return true;
+  }
+  if (!JsonFromFile(m_jsRoot, path)) {
+    FILEINDEX_LOG("Failed to load json from %s", path.c_str());
+    ErrorHandler::SetError(FILEINDEX_ERR_LOAD_JSON);
+    return false;
+  }
+  return true;
+}
+
+bool Config::SaveJson() {
+  const std::string path = GetPath();
+  switch (JsonToFile(m_jsRoot, path, kFileMode)) {
+    case JsonSaveResult::kSaved:
+      return true;
+    case JsonSaveResult::kSavedModeNotSet:
+      FILEINDEX_LOG("chmod failed, path=%s", path.c_str());
+      return true;
+    case JsonSaveResult::kFailed:
+      break;
+  }
+  FILEINDEX_LOG("Failed to save json to %s", path.c_str());
+  ErrorHandler::SetError(FILEINDEX_ERR_SAVE_JSON);
+  return false;
+}
+
+bool Config::Lock(bool exclusive) {
+  const std::string path = GetLockPath();
+  const int operation = (exclusive ? LOCK_EX : LOCK_SH) | LOCK_NB;
+  for (int attempt = 1; attempt <= kLockAttempts; ++attempt) {
+    // The lock files live in world-writable /tmp: never follow a link planted there.
+    const int fd = open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, kFileMode);
+    if (fd < 0) {
+      break;
+    }
+    if (flock(fd, operation) == 0) {
+      m_lockFd = fd;
+      return true;
+    }
+    const int reason = errno;
+    close(fd);
+    if (reason != EINTR && reason != EWOULDBLOCK) {
+      break;
+    }
+    if (attempt < kLockAttempts) {
+      usleep(static_cast<useconds_t>(rand() % 10) * 1000);  // NOLINT(cert-msc30-c,cert-msc50-cpp)
+    }
+  }
+  FILEINDEX_LOG("Failed to lock folder");
+  ErrorHandler::SetError(FILEINDEX_ERR_LOCK);
+  return false;
+}
+
+void Config::Unlock() {
+  if (m_lockFd < 0) {
+    return;
+  }
+  flock(m_lockFd, LOCK_UN);
+  close(m_lockFd);
+  m_lockFd = -1;
+}
+
+}  // namespace FILEINDEX
+}  // namespace WEZO

@@ -1,0 +1,49 @@
+// The four whole-document JSON operations of the library, on jsoncpp's reader and writer.
+//
+// None of them logs; the caller decides what a failure means. The parser is strict about trailing
+// text ("{} x" does not parse) and keeps one reader per thread, so parsing many short texts, such
+// as the lines of an event queue, costs no allocation of a reader per call.
+#ifndef FILEINDEX_SRC_JSON_IO_H_
+#define FILEINDEX_SRC_JSON_IO_H_
+
+#include <json/value.h>
+#include <sys/types.h>
+
+#include <cstddef>
+#include <string>
+
+namespace WEZO {
+namespace FILEINDEX {
+
+// Parses the whole file at `path` into `value`. Returns false, leaving `value` as it was, when the
+// file cannot be read or does not parse. Follows symbolic links; callers that must not, test
+// first.
+bool JsonFromFile(Json::Value& value, const std::string& path);
+
+enum class JsonSaveResult {
+  kSaved,          // the file holds the document and has the requested mode
+  kSavedModeNotSet,  // the file holds the document, but its mode could not be set
+  kFailed,         // nothing was replaced; the old file, if any, is as it was
+};
+
+// Replaces the file at `path` with `value` rendered as an indented document: writes a temporary
+// file in the same directory, flushes it to disk, gives it `mode` and renames it over `path`, so
+// a reader sees the old file or the new one and never a part of either. The temporary file is
+// removed on every failure. The directory must exist.
+JsonSaveResult JsonToFile(const Json::Value& value, const std::string& path, mode_t mode);
+
+// Parses `text` (the `size` bytes at `text`) into `value`. Returns false, leaving `value` as it
+// was, when it is not exactly one JSON value, optionally surrounded by white space.
+bool JsonFromString(Json::Value& value, const char* text, size_t size);
+inline bool JsonFromString(Json::Value& value, const std::string& text) {
+  return JsonFromString(value, text.data(), text.size());
+}
+
+// Renders `value` as compact JSON on one line: no newline, no indentation, non-ASCII text as
+// UTF-8, control characters, '"' and '\\' escaped.
+std::string JsonToString(const Json::Value& value);
+
+}  // namespace FILEINDEX
+}  // namespace WEZO
+
+#endif  // FILEINDEX_SRC_JSON_IO_H_

@@ -1,0 +1,35 @@
+// The library's one way of writing a log line.
+//
+// Every line goes to the system log at LOG_ERR as "<unit>:<line> <message>", where <unit> is the
+// source file's name without extension. A source file defines FILEINDEX_LOG_UNIT before including
+// this header. Lines written with FILEINDEX_LOG_DEBUG appear only while LOG_LEVEL is exactly 7;
+// all others appear whatever LOG_LEVEL holds. Logging never changes errno.
+#ifndef FILEINDEX_SRC_LOG_H_
+#define FILEINDEX_SRC_LOG_H_
+
+namespace WEZO {
+namespace FILEINDEX {
+namespace detail {
+
+// Where finished lines go: the system log unless a sink is installed. The tests install one to
+// read the lines back.
+using LogSink = void (*)(int priority, const char* line);
+
+// Installs `sink` for every later line; nullptr restores the system log. Not thread-safe.
+void SetLogSink(LogSink sink);
+
+// Formats `format` (printf conventions, %m included) and writes
+// "<unit>:<line> <formatted text>" at LOG_ERR. With `debugOnly`, writes only when LOG_LEVEL is 7.
+void WriteLog(bool debugOnly, const char* unit, int line, const char* format, ...)
+    __attribute__((format(gnu_printf, 4, 5)));
+
+}  // namespace detail
+}  // namespace FILEINDEX
+}  // namespace WEZO
+
+#define FILEINDEX_LOG(...) \
+  ::WEZO::FILEINDEX::detail::WriteLog(false, FILEINDEX_LOG_UNIT, __LINE__, __VA_ARGS__)
+#define FILEINDEX_LOG_DEBUG(...) \
+  ::WEZO::FILEINDEX::detail::WriteLog(true, FILEINDEX_LOG_UNIT, __LINE__, __VA_ARGS__)
+
+#endif  // FILEINDEX_SRC_LOG_H_

@@ -1,0 +1,115 @@
+#define FILEINDEX_LOG_UNIT "utils"
+
+#include "fileindex/utils.h"
+
+#include <sys/stat.h>
+#include <wezo/platform.h>
+
+#include <cstring>
+
+#include "fileindex/error.h"
+#include "log.h"
+#include "share_record.h"
+
+namespace WEZO {
+namespace FILEINDEX {
+namespace {
+
+bool LstatTypeIs(const std::string& path, mode_t type) {
+  struct stat st {};
+  return lstat(path.c_str(), &st) == 0 && (st.st_mode & S_IFMT) == type;
+}
+
+}  // namespace
+
+bool IsDirExist(const std::string& path) { return LstatTypeIs(path, S_IFDIR); }
+
+bool IsFileExist(const std::string& path) { return LstatTypeIs(path, S_IFREG); }
+
+bool RetrieveStringFromJsonObj(std::string& out, const std::string& key, const Json::Value& obj) {
+  if (!obj.isObject()) {
+    return false;
+  }
+  const Json::Value* member = obj.find(key.data(), key.data() + key.size());
+  if (member == nullptr || !member->isString()) {
+    return false;
+  }
+  std::string value = member->asString();
+  out.swap(value);
+  return true;
+}
+
+bool RetrieveBoolFromJsonObj(bool& out, const std::string& key, const Json::Value& obj) {
+  if (!obj.isObject()) {
+    return false;
+  }
+  const Json::Value* member = obj.find(key.data(), key.data() + key.size());
+  if (member == nullptr || !member->isBool()) {
+    return false;
+  }
+  out = member->asBool();
+  return true;
+}
+
+bool StringStartWith(const std::string& str, const std::string& prefix) {
+  if (prefix.size() > str.size()) {
+    return false;
+  }
+  return std::strncmp(str.c_str(), prefix.c_str(), prefix.size()) == 0;
+}
+
+bool GetShareNameByPath(std::string& shareName, const std::string& path) {
+  if (path.empty()) {
+    return false;
+  }
+  // The leading slash is assumed, not checked: callers always pass share paths.
+  const size_t slash = path.find('/', 1);
+  shareName = path.substr(1, slash == std::string::npos ? std::string::npos : slash - 1);
+  return true;
+}
+
+bool GetShareNamePathByFullPath(std::string& shareName, std::string& sharePath,
+                                const std::string& fullPath) {
+  char name[WEZO_SHARE_NAME_MAX] = {};
+  char path[WEZO_SHARE_PATH_MAX] = {};
+  if (WEZOShareNamePathGet(fullPath.c_str(), name, sizeof name, path, sizeof path) < 0) {
+    FILEINDEX_LOG("WEZOShareNamePathGet failed, path=%s", fullPath.c_str());
+    ErrorHandler::SetError(FILEINDEX_ERR_PATH);
+    return false;
+  }
+  shareName.assign(name, strnlen(name, sizeof name));
+  sharePath.assign(path, strnlen(path, sizeof path));
+  return true;
+}
+
+bool GetFullPath(std::string& fullPath, const std::string& path) {
+  std::string shareName;
+  if (!GetShareNameByPath(shareName, path)) {
+    FILEINDEX_LOG("GetShareNameByPath failed, path=%s", path.c_str());
+    return false;
+  }
+  ShareRecord share;
+  if (LookUpShare(shareName, share) < 0 || !share) {
+    ErrorHandler::SetError(FILEINDEX_ERR_PATH);
+    return false;
+  }
+  // The volume comes from where the share really lies: everything before the share's own name.
+  const std::string sharePath = SharePathOf(*share);
+  const size_t slash = sharePath.rfind('/');
+  fullPath = (slash == std::string::npos ? sharePath : sharePath.substr(0, slash)) + path;
+  return true;
+}
+
+std::string ReplaceShareName(const std::string& path, const std::string& newShareName) {
+  if (path.empty()) {
+    return std::string();
+  }
+  const size_t slash = path.find('/', 1);
+  if (slash == std::string::npos) {
+    return "/" + newShareName;
+  }
+  return "/" + newShareName + path.substr(slash);
+}
+
+}  // namespace FILEINDEX
+}  // namespace WEZO
