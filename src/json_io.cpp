@@ -19,7 +19,10 @@ namespace {
 Json::CharReader& Reader() {
   thread_local std::unique_ptr<Json::CharReader> reader = [] {
     Json::CharReaderBuilder builder;
-    builder["failIfExtra"] = true;
+    // Strict JSON: no comments, trailing commas, duplicate keys or text after the value. A
+    // scalar is still a document, so that its caller can say what it expected instead.
+    Json::CharReaderBuilder::strictMode(&builder.settings_);
+    builder["strictRoot"] = false;
     return std::unique_ptr<Json::CharReader>(builder.newCharReader());
   }();
   return *reader;

@@ -1,7 +1,8 @@
 // The four whole-document JSON operations of the library, on jsoncpp's reader and writer.
 //
-// None of them logs; the caller decides what a failure means. The parser is strict about trailing
-// text ("{} x" does not parse) and keeps one reader per thread, so parsing many short texts, such
+// None of them logs; the caller decides what a failure means. The parser takes strict JSON (no
+// comments, trailing commas, duplicate keys or text after the value) and keeps one reader per
+// thread, so parsing many short texts, such
 // as the lines of an event queue, costs no allocation of a reader per call.
 #ifndef FILEINDEX_SRC_JSON_IO_H_
 #define FILEINDEX_SRC_JSON_IO_H_

@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <cstdarg>
 #include <cstdio>
+#include <cstring>
 #include <string>
 
 #include "fileindex/error.h"
@@ -19,6 +20,15 @@ void SyslogSink(int priority, const char* line) { syslog(priority, "%s", line); 
 LogSink g_sink = SyslogSink;
 
 }  // namespace
+
+std::string ErrnoText() {
+  const int saved = errno;
+  char buffer[256];
+  // The GNU strerror_r returns the text, which need not be in `buffer`.
+  std::string text = strerror_r(saved, buffer, sizeof buffer);
+  errno = saved;
+  return text;
+}
 
 void SetLogSink(LogSink sink) { g_sink = sink != nullptr ? sink : SyslogSink; }
 
@@ -38,12 +48,9 @@ void WriteLog(bool debugOnly, const char* unit, int line, const char* format, ..
   va_start(args, format);
   std::va_list again;
   va_copy(again, args);
-  // %m reads errno, which the caller's failure set: give it back before formatting.
-  errno = savedErrno;
   int body = std::vsnprintf(text.data() + prefix, text.size() - prefix, format, args);
   if (body >= 0 && static_cast<size_t>(prefix + body) >= text.size()) {
     text.resize(static_cast<size_t>(prefix + body) + 1);
-    errno = savedErrno;
     body = std::vsnprintf(text.data() + prefix, text.size() - prefix, format, again);
   }
   va_end(again);

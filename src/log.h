@@ -4,8 +4,13 @@
 // source file's name without extension. A source file defines FILEINDEX_LOG_UNIT before including
 // this header. Lines written with FILEINDEX_LOG_DEBUG appear only while LOG_LEVEL is exactly 7;
 // all others appear whatever LOG_LEVEL holds. Logging never changes errno.
+//
+// Formats are checked at compile time, which refuses syslog's %m; a line that names the reason
+// of a failed call writes "reason=%s" with ErrnoText(), which prints what %m would.
 #ifndef FILEINDEX_SRC_LOG_H_
 #define FILEINDEX_SRC_LOG_H_
+
+#include <string>
 
 namespace WEZO {
 namespace FILEINDEX {
@@ -18,7 +23,10 @@ using LogSink = void (*)(int priority, const char* line);
 // Installs `sink` for every later line; nullptr restores the system log. Not thread-safe.
 void SetLogSink(LogSink sink);
 
-// Formats `format` (printf conventions, %m included) and writes
+// The text of errno, as %m of syslog would print it. Leaves errno as it was.
+std::string ErrnoText();
+
+// Formats `format` (printf conventions) and writes
 // "<unit>:<line> <formatted text>" at LOG_ERR. With `debugOnly`, writes only when LOG_LEVEL is 7.
 void WriteLog(bool debugOnly, const char* unit, int line, const char* format, ...)
     __attribute__((format(gnu_printf, 4, 5)));

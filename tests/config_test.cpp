@@ -1,0 +1,169 @@
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include "fileindex/config.h"
+#include "fileindex/error.h"
+#include "paths.h"
+#include "test_support.h"
+
+namespace WEZO {
+namespace FILEINDEX {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+// A configuration file at the folder list's locations, with its document in the open.
+class TestConfig : public Config {
+ public:
+  bool Load() override { return LoadJson(); }
+  bool Save() override { return SaveJson(); }
+  std::string GetLockPath() const override { return FolderLockPath(); }
+  std::string GetPath() const override { return FolderConfPath(); }
+  Json::Value& Doc() { return m_jsRoot; }
+};
+
+class ConfigTest : public testsupport::LibraryTest {};
+
+TEST_F(ConfigTest, MissingFileLoadsAsAnEmptyObjectAndSaveCreatesIt) {
+  TestConfig cfg;
+  ASSERT_TRUE(cfg.LoadJson());
+  EXPECT_EQ(cfg.Doc(), Json::Value(Json::objectValue));
+  EXPECT_FALSE(testsupport::ModeOf(FolderConfPath()) >= 0);
+
+  const mode_t old = umask(0077);
+  cfg.Doc()["/photo"]["name"] = "Photo";
+  EXPECT_TRUE(cfg.SaveJson());
+  umask(old);
+  EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);
+
+  TestConfig again;
+  ASSERT_TRUE(again.LoadJson());
+  EXPECT_EQ(again.Doc(), cfg.Doc());
+  EXPECT_THAT(log.Lines(), IsEmpty());
+}
+
+TEST_F(ConfigTest, UnreadableFileFailsWithCodeSix) {
+  for (const char* text : {"{\"a\":", "not json", "{} trailing", ""}) {
+    testsupport::WriteFile(FolderConfPath(), text);
+    TestConfig cfg;
+    log.Clear();
+    EXPECT_FALSE(cfg.LoadJson()) << text;
+    EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_LOAD_JSON);
+    EXPECT_THAT(log.Lines(), ElementsAre("config:N Failed to load json from " + FolderConfPath()));
+  }
+}
+
+TEST_F(ConfigTest, SymbolicLinkInPlaceOfTheFileCountsAsMissing) {
+  const std::string real = sandbox.Path("/real.conf");
+  testsupport::WriteFile(real, R"({"/photo":{"name":"x"}})");
+  ASSERT_EQ(symlink(real.c_str(), FolderConfPath().c_str()), 0);
+  TestConfig cfg;
+  EXPECT_TRUE(cfg.LoadJson());
+  EXPECT_EQ(cfg.Doc(), Json::Value(Json::objectValue));
+}
+
+TEST_F(ConfigTest, SaveIntoAMissingDirectoryFailsWithCodeSeven) {
+  ASSERT_EQ(rmdir(sandbox.Path("/usr/wezo/etc/fileindex").c_str()), 0);
+  TestConfig cfg;
+  EXPECT_FALSE(cfg.SaveJson());
+  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_SAVE_JSON);
+  EXPECT_THAT(log.Lines(), ElementsAre("config:N Failed to save json to " + FolderConfPath()));
+}
+
+TEST_F(ConfigTest, ExclusiveLockHeldByAnotherProcessFailsAfterThreeAttempts) {
+  testsupport::LockHolder other(FolderLockPath(), /*exclusive=*/true);
+  ASSERT_TRUE(other.Holding());
+  const int fdsBefore = testsupport::OpenDescriptorCount();
+  for (bool exclusive : {true, false}) {
+    TestConfig cfg;
+    log.Clear();
+    ErrorHandler::SetError(FILEINDEX_ERR_NONE);
+    EXPECT_FALSE(cfg.Lock(exclusive));
+    EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_LOCK);
+    EXPECT_THAT(log.Lines(), ElementsAre("config:N Failed to lock folder"));
+    cfg.Unlock();
+  }
+  // No attempt leaves its descriptor behind.
+  EXPECT_EQ(testsupport::OpenDescriptorCount(), fdsBefore);
+}
+
+TEST_F(ConfigTest, SharedLockOfAnotherProcessAdmitsSharedButNotExclusive) {
+  testsupport::LockHolder other(FolderLockPath(), /*exclusive=*/false);
+  ASSERT_TRUE(other.Holding());
+  TestConfig shared;
+  EXPECT_TRUE(shared.Lock(false));
+  shared.Unlock();
+  TestConfig exclusive;
+  EXPECT_FALSE(exclusive.Lock(true));
+  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_LOCK);
+  exclusive.Unlock();
+}
+
+TEST_F(ConfigTest, LockIsReleasedByUnlockAndLockFileIsKept) {
+  TestConfig first;
+  ASSERT_TRUE(first.Lock(true));
+  EXPECT_EQ(testsupport::ModeOf(FolderLockPath()), 0644);
+  {
+    TestConfig second;
+    EXPECT_FALSE(second.Lock(true));  // two objects of one process lock independently
+    second.Unlock();
+  }
+  first.Unlock();
+  TestConfig third;
+  EXPECT_TRUE(third.Lock(true));
+  third.Unlock();
+  EXPECT_EQ(testsupport::ModeOf(FolderLockPath()), 0644);
+}
+
+TEST_F(ConfigTest, LockDescriptorIsCloseOnExec) {
+  TestConfig cfg;
+  ASSERT_TRUE(cfg.Lock(true));
+  int flagged = 0;
+  for (int fd = 0; fd < 1024; ++fd) {
+    char link[64];
+    char target[4096];
+    snprintf(link, sizeof link, "/proc/self/fd/%d", fd);
+    const ssize_t n = readlink(link, target, sizeof target - 1);
+    if (n > 0 && std::string(target, static_cast<size_t>(n)) == FolderLockPath()) {
+      EXPECT_NE(fcntl(fd, F_GETFD) & FD_CLOEXEC, 0);
+      ++flagged;
+    }
+  }
+  EXPECT_EQ(flagged, 1);
+  cfg.Unlock();
+}
+
+TEST_F(ConfigTest, SymbolicLinkAsLockFileIsRefusedAndItsTargetUntouched) {
+  const std::string target = sandbox.Path("/victim");
+  testsupport::WriteFile(target, "precious");
+  ASSERT_EQ(symlink(target.c_str(), FolderLockPath().c_str()), 0);
+  TestConfig cfg;
+  EXPECT_FALSE(cfg.Lock(true));
+  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_LOCK);
+  EXPECT_THAT(log.Lines(), ElementsAre("config:N Failed to lock folder"));
+  EXPECT_EQ(testsupport::ReadFile(target), "precious");
+  cfg.Unlock();
+}
+
+TEST_F(ConfigTest, UnlockTwiceNeverClosesSomeoneElsesDescriptor) {
+  TestConfig never;
+  never.Unlock();  // never locked: nothing happens
+
+  TestConfig cfg;
+  ASSERT_TRUE(cfg.Lock(true));
+  cfg.Unlock();
+  // The number the lock used is likely handed out again right away.
+  const int reused = open("/dev/null", O_RDONLY | O_CLOEXEC);
+  ASSERT_GE(reused, 0);
+  cfg.Unlock();
+  EXPECT_NE(fcntl(reused, F_GETFD), -1) << "a second Unlock closed another descriptor";
+  close(reused);
+}
+
+}  // namespace
+}  // namespace FILEINDEX
+}  // namespace WEZO

@@ -1,0 +1,136 @@
+#include <dirent.h>
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <string>
+
+#include "json_io.h"
+#include "test_support.h"
+
+namespace WEZO {
+namespace FILEINDEX {
+namespace {
+
+class JsonIoTest : public testsupport::LibraryTest {
+ protected:
+  std::string Dir() const { return sandbox.Path("/usr/wezo/etc/fileindex"); }
+  std::vector<std::string> DirEntries() const {
+    std::vector<std::string> names;
+    DIR* dir = opendir(Dir().c_str());
+    while (dirent* e = readdir(dir)) {
+      if (std::string(e->d_name) != "." && std::string(e->d_name) != "..") {
+        names.emplace_back(e->d_name);
+      }
+    }
+    closedir(dir);
+    return names;
+  }
+};
+
+TEST_F(JsonIoTest, ToStringKeepsEveryValueOnOneLine) {
+  Json::Value v(Json::objectValue);
+  v["path"] = "/volume1/photo/line\nbreak\t\"quoted\"\\";
+  v["name"] = "Fotos \xC3\xA9t\xC3\xA9";  // UTF-8 stays UTF-8
+  v["nested"]["list"].append(1);
+  v["nested"]["list"].append(Json::Value());
+  const std::string text = JsonToString(v);
+  EXPECT_EQ(text.find('\n'), std::string::npos);
+  EXPECT_EQ(text,
+            R"({"name":"Fotos )"
+            "\xC3\xA9t\xC3\xA9"
+            R"(","nested":{"list":[1,null]},"path":"/volume1/photo/line\nbreak\t\"quoted\"\\"})");
+  Json::Value back;
+  ASSERT_TRUE(JsonFromString(back, text));
+  EXPECT_EQ(back, v);
+}
+
+TEST_F(JsonIoTest, FromStringRefusesAnythingButOneWholeValue) {
+  const char* refused[] = {"", "{", R"({"event":65536,"path":"/v)", "{} x", "{}{}", "nul", "[1,]",
+                           R"({"a":1,"a":2})", "{} // note"};
+  for (const char* text : refused) {
+    Json::Value v("untouched");
+    EXPECT_FALSE(JsonFromString(v, text)) << text;
+    EXPECT_EQ(v, Json::Value("untouched")) << text;
+  }
+  Json::Value v;
+  EXPECT_TRUE(JsonFromString(v, "  {\"a\": [1, 2]}\n"));
+  EXPECT_EQ(v["a"][1].asInt(), 2);
+  EXPECT_TRUE(JsonFromString(v, "5"));
+  EXPECT_EQ(v.asInt(), 5);
+}
+
+TEST_F(JsonIoTest, ToFileWritesMode0644WhateverTheUmask) {
+  const mode_t old = umask(077);
+  const std::string path = Dir() + "/a.conf";
+  Json::Value v(Json::objectValue);
+  v["k"] = true;
+  EXPECT_EQ(JsonToFile(v, path, 0644), JsonSaveResult::kSaved);
+  umask(old);
+  EXPECT_EQ(testsupport::ModeOf(path), 0644);
+  Json::Value back;
+  ASSERT_TRUE(JsonFromFile(back, path));
+  EXPECT_EQ(back, v);
+  EXPECT_EQ(DirEntries(), std::vector<std::string>{"a.conf"});
+}
+
+TEST_F(JsonIoTest, FailedSaveLeavesTheOldFileAndNoTemporaryFile) {
+  // A directory in the file's place makes the final rename fail after the data is written.
+  const std::string path = Dir() + "/blocked.conf";
+  ASSERT_EQ(mkdir(path.c_str(), 0755), 0);
+  EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kFailed);
+  EXPECT_EQ(DirEntries(), std::vector<std::string>{"blocked.conf"});
+
+  EXPECT_EQ(JsonToFile(Json::Value(1), sandbox.Path("/no/such/dir/x.conf"), 0644),
+            JsonSaveResult::kFailed);
+}
+
+TEST_F(JsonIoTest, SaveReplacesASymbolicLinkInsteadOfWritingThroughIt) {
+  const std::string target = sandbox.Path("/target");
+  testsupport::WriteFile(target, "keep");
+  const std::string path = Dir() + "/x.conf";
+  ASSERT_EQ(symlink(target.c_str(), path.c_str()), 0);
+  EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kSaved);
+  EXPECT_EQ(testsupport::ReadFile(target), "keep");
+  EXPECT_EQ(testsupport::ReadFile(path), "{}\n");
+}
+
+TEST_F(JsonIoTest, ReaderNeverSeesAPartialFileWhileAnotherProcessSaves) {
+  const std::string path = Dir() + "/folder.conf";
+  Json::Value big(Json::objectValue);
+  for (int i = 0; i < 2000; ++i) {
+    big["/photo/" + std::to_string(i)]["name"] = std::string(40, 'n');
+  }
+  ASSERT_EQ(JsonToFile(big, path, 0644), JsonSaveResult::kSaved);
+
+  const pid_t writer = fork();
+  if (writer == 0) {
+    Json::Value doc = big;
+    for (int i = 0; i < 60; ++i) {
+      doc["/video/" + std::to_string(i)]["name"] = "v";
+      if (JsonToFile(doc, path, 0644) != JsonSaveResult::kSaved) {
+        _exit(1);
+      }
+    }
+    _exit(0);
+  }
+  ASSERT_GT(writer, 0);
+  int reads = 0;
+  int bad = 0;
+  int status = 0;
+  while (waitpid(writer, &status, WNOHANG) == 0) {
+    Json::Value v;
+    ++reads;
+    if (!JsonFromFile(v, path) || !v.isObject() || v.size() < 2000) {
+      ++bad;
+    }
+  }
+  ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
+  EXPECT_GT(reads, 0);
+  EXPECT_EQ(bad, 0) << "of " << reads << " reads";
+}
+
+}  // namespace
+}  // namespace FILEINDEX
+}  // namespace WEZO

@@ -1,0 +1,101 @@
+// An in-memory platform for the library's tests.
+//
+// It implements every operation of wezo/platform.h and wezo/wezotifyd.h from the state below,
+// records each call with its arguments, and fails an operation on request. Only the platform is
+// faked: the one operation that creates something on disk (WEZOEAMKDir) really creates the
+// directory, because configuration files, locks, queues and sockets in the tests are real files
+// under a sandbox root. The state is per process; each test process starts from Reset().
+#ifndef FILEINDEX_TESTS_SUPPORT_FAKE_PLATFORM_H_
+#define FILEINDEX_TESTS_SUPPORT_FAKE_PLATFORM_H_
+
+#include <json/value.h>
+
+#include <map>
+#include <set>
+#include <string>
+#include <vector>
+
+namespace fake {
+
+// File-system type codes that the fake answers with (any code works; these name the classes).
+constexpr int kLocalFs = 1;
+constexpr int kRemoteFs = 20;
+constexpr int kImageFs = 30;
+
+// The platform error number that an injected failure leaves in the last-error slot.
+constexpr int kInjectedError = 0x0E01;
+
+struct Share {
+  std::string name;
+  std::string path;  // the share's own full path
+  bool encrypted = false;
+  bool encryption = false;
+  bool readOnly = false;
+};
+
+// What the file-system queries answer for one full path.
+struct PathFacts {
+  int fsType = kLocalFs;
+  int mountPoint = 0;  // WEZOFSDirIsMntPoint's answer
+  bool recycle = false;
+  bool snapshot = false;
+};
+
+struct Call {
+  std::string op;
+  std::vector<std::string> args;
+};
+
+struct Platform {
+  // ---- state ----
+  std::map<std::string, Share> shares;       // by name
+  std::map<std::string, PathFacts> facts;    // by exact full path
+  PathFacts defaultFacts;                    // for every other path
+  std::set<int> remoteTypes{kRemoteFs};
+  std::set<int> imageTypes{kImageFs};
+  std::set<std::string> hiddenDirNames{"@eaDir"};
+  bool quotaEnough = true;
+  int quotaError = 0;                        // last error left by a "not enough" answer
+  std::map<std::string, bool> running;       // services by name
+  int spotlight = 0;                         // 1 on, 0 off
+  int execResult = 0;                        // what WLIBCExec and WLIBCExecv return
+  // Monitor registrations by client, then queue path.
+  std::map<std::string, std::map<std::string, Json::Value>> monitor;
+
+  // ---- failure injection ----
+  bool share_get_fails = false;
+  bool share_name_path_get_fails = false;
+  bool encrypted_query_fails = false;
+  bool encryption_query_fails = false;
+  bool read_only_query_fails = false;
+  bool snapshot_query_fails = false;
+  bool ea_mkdir_fails = false;
+  bool service_start_fails = false;
+  bool service_stop_fails = false;
+  bool service_restart_fails = false;
+  bool spotlight_query_fails = false;
+  bool spotlight_set_fails = false;
+  bool monitor_upsert_fails = false;
+  bool monitor_delete_fails = false;
+
+  // ---- observation ----
+  std::vector<Call> calls;   // every call but the string comparison, in order
+  int openShareRecords = 0;  // records handed out by WEZOShareGet and not yet freed
+  int errCode = 0;
+  std::string errFile;
+  int errLine = 0;
+
+  void AddShare(const std::string& name, const std::string& path);
+  std::vector<Call> CallsTo(const std::string& op) const;
+  std::vector<std::string> OpNames() const;  // the ops of `calls`, in order
+};
+
+// The process's fake platform.
+Platform& Get();
+
+// Back to a fresh platform: no shares, no calls, no failures, no last error.
+void Reset();
+
+}  // namespace fake
+
+#endif  // FILEINDEX_TESTS_SUPPORT_FAKE_PLATFORM_H_
