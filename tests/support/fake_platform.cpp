@@ -9,12 +9,18 @@
 #include <cstdio>
 #include <cstring>
 
-#include "json_io.h"
+#include <json/writer.h>
 
 namespace fake {
 namespace {
 
 Platform* g_platform = new Platform();  // never destroyed: outlives every static user
+
+std::string OneLine(const Json::Value& value) {
+  Json::StreamWriterBuilder builder;
+  builder["indentation"] = "";
+  return Json::writeString(builder, value);
+}
 
 std::string Str(const char* s) { return s != nullptr ? std::string(s) : std::string("(null)"); }
 
@@ -106,8 +112,8 @@ int WEZOShareGet(const char* szName, PWEZOSHARE* ppShare) {
     return fake::Fail(__LINE__);
   }
   auto* record = new WEZOSHARE();
-  std::snprintf(record->szName, sizeof record->szName, "%s", it->second.name.c_str());
-  std::snprintf(record->szPath, sizeof record->szPath, "%s", it->second.path.c_str());
+  (void)std::snprintf(record->szName, sizeof record->szName, "%s", it->second.name.c_str());
+  (void)std::snprintf(record->szPath, sizeof record->szPath, "%s", it->second.path.c_str());
   *ppShare = record;
   ++Get().openShareRecords;
   return 0;
@@ -139,8 +145,8 @@ int WEZOShareNamePathGet(const char* szFullPath, char* szShareName, int cbShareN
   if (best == nullptr) {
     return fake::Fail(__LINE__);
   }
-  std::snprintf(szShareName, static_cast<size_t>(cbShareName), "%s", best->name.c_str());
-  std::snprintf(szSharePath, static_cast<size_t>(cbSharePath), "%s", best->path.c_str());
+  (void)std::snprintf(szShareName, static_cast<size_t>(cbShareName), "%s", best->name.c_str());
+  (void)std::snprintf(szSharePath, static_cast<size_t>(cbSharePath), "%s", best->path.c_str());
   return 0;
 }
 
@@ -291,7 +297,7 @@ namespace WEZOTIFYD {
 
 bool MonitorQueue::Upsert(const MonitorQueue& entry, const std::string& client, QueueType type) {
   Record("MonitorQueue::Upsert",
-         {WEZO::FILEINDEX::JsonToString(entry.Entry()), client, std::to_string(type)});
+         {fake::OneLine(entry.Entry()), client, std::to_string(type)});
   if (Get().monitor_upsert_fails) {
     fake::Fail(__LINE__);
     return false;

@@ -1,0 +1,95 @@
+// Costs of the configuration file cycle on a full folder list (1000 folders): load, save, and
+// one lock-unlock cycle. Runs in a temporary root of its own.
+//
+//   build/bench/fileindex_bench [--benchmark_filter=...]
+#include <benchmark/benchmark.h>
+#include <ftw.h>
+#include <sys/stat.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <string>
+
+#include "fileindex/config.h"
+#include "fileindex/root.h"
+#include "paths.h"
+
+namespace {
+
+using WEZO::FILEINDEX::Config;
+
+class FolderFile : public Config {
+ public:
+  bool Load() override { return LoadJson(); }
+  bool Save() override { return SaveJson(); }
+  std::string GetLockPath() const override { return WEZO::FILEINDEX::FolderLockPath(); }
+  std::string GetPath() const override { return WEZO::FILEINDEX::FolderConfPath(); }
+  Json::Value& Doc() { return m_jsRoot; }
+};
+
+int RemoveEntry(const char* path, const struct stat* /*st*/, int /*flag*/, struct FTW* /*ftw*/) {
+  return remove(path);
+}
+
+// A temporary root holding a folder list of `folders` entries, removed afterwards.
+class Root {
+ public:
+  explicit Root(int folders) {
+    char pattern[] = "/tmp/fileindex-bench.XXXXXX";
+    m_dir = mkdtemp(pattern);
+    for (const char* d : {"/tmp", "/usr", "/usr/wezo", "/usr/wezo/etc", "/usr/wezo/etc/fileindex"}) {
+      mkdir((m_dir + d).c_str(), 0755);
+    }
+    WEZO::FILEINDEX::SetRootPrefix(m_dir);
+    FolderFile file;
+    for (int i = 0; i < folders; ++i) {
+      const std::string path = "/photo/" + std::to_string(100000 + i);
+      Json::Value& f = file.Doc()[path];
+      f["path"] = path;
+      f["name"] = std::to_string(100000 + i);
+      f["document"] = i % 2 == 0;
+      f["audio"] = false;
+      f["video"] = true;
+      f["photo"] = true;
+    }
+    file.Save();
+  }
+  ~Root() {
+    WEZO::FILEINDEX::SetRootPrefix("");
+    nftw(m_dir.c_str(), RemoveEntry, 16, FTW_DEPTH | FTW_PHYS);
+  }
+
+ private:
+  std::string m_dir;
+};
+
+void BM_LoadFullFolderList(benchmark::State& state) {
+  Root root(1000);
+  for (auto _ : state) {
+    FolderFile file;
+    benchmark::DoNotOptimize(file.Load());
+  }
+}
+BENCHMARK(BM_LoadFullFolderList);
+
+void BM_SaveFullFolderList(benchmark::State& state) {
+  Root root(1000);
+  FolderFile file;
+  file.Load();
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(file.Save());
+  }
+}
+BENCHMARK(BM_SaveFullFolderList);
+
+void BM_LockUnlock(benchmark::State& state) {
+  Root root(0);
+  for (auto _ : state) {
+    FolderFile file;
+    benchmark::DoNotOptimize(file.Lock(true));
+    file.Unlock();
+  }
+}
+BENCHMARK(BM_LockUnlock);
+
+}  // namespace
