@@ -38,25 +38,25 @@ void WriteLog(bool debugOnly, const char* unit, int line, const char* format, ..
   }
   const int savedErrno = errno;
 
-  std::string text(256, '\0');
-  const int prefix = std::snprintf(text.data(), text.size(), "%s:%d ", unit, line);
-  if (prefix < 0) {
-    errno = savedErrno;
-    return;
-  }
-  std::va_list args;
+  va_list args;
   va_start(args, format);
-  std::va_list again;
-  va_copy(again, args);
-  int body = std::vsnprintf(text.data() + prefix, text.size() - prefix, format, args);
-  if (body >= 0 && static_cast<size_t>(prefix + body) >= text.size()) {
-    text.resize(static_cast<size_t>(prefix + body) + 1);
-    body = std::vsnprintf(text.data() + prefix, text.size() - prefix, format, again);
-  }
-  va_end(again);
+  char buffer[1024];
+  const int length = std::vsnprintf(buffer, sizeof buffer, format, args);
   va_end(args);
-  if (body >= 0) {
-    text.resize(static_cast<size_t>(prefix + body));
+  std::string message;
+  if (length >= 0 && static_cast<size_t>(length) < sizeof buffer) {
+    message.assign(buffer, static_cast<size_t>(length));
+  } else if (length >= 0) {
+    // Too long for the stack: format again into a buffer of the right size.
+    message.resize(static_cast<size_t>(length) + 1);
+    va_start(args, format);
+    (void)std::vsnprintf(message.data(), message.size(), format, args);
+    va_end(args);
+    message.resize(static_cast<size_t>(length));
+  }
+
+  if (length >= 0) {
+    const std::string text = std::string(unit) + ":" + std::to_string(line) + " " + message;
     g_sink(LOG_ERR, text.c_str());
   }
   errno = savedErrno;

@@ -126,7 +126,7 @@ TEST_F(ConfigTest, LockDescriptorIsCloseOnExec) {
   for (int fd = 0; fd < 1024; ++fd) {
     char link[64];
     char target[4096];
-    snprintf(link, sizeof link, "/proc/self/fd/%d", fd);
+    (void)snprintf(link, sizeof link, "/proc/self/fd/%d", fd);
     const ssize_t n = readlink(link, target, sizeof target - 1);
     if (n > 0 && std::string(target, static_cast<size_t>(n)) == FolderLockPath()) {
       EXPECT_NE(fcntl(fd, F_GETFD) & FD_CLOEXEC, 0);

@@ -3,7 +3,6 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <ftw.h>
-#include <signal.h>
 #include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -37,7 +36,7 @@ void CaptureSink(int priority, const char* line) {
 }
 
 int RemoveEntry(const char* path, const struct stat* /*st*/, int /*flag*/, struct FTW* /*ftw*/) {
-  remove(path);
+  (void)remove(path);  // best effort: a leftover only wastes space in the temporary directory
   return 0;
 }
 
