@@ -1,0 +1,19 @@
+#!/usr/bin/env bash
+# Installs what is missing, builds, and runs the whole test suite twice: once as the library ships
+# and once under AddressSanitizer and UndefinedBehaviorSanitizer. Then runs each benchmark briefly
+# to show it still works (timings from this short run mean nothing).
+set -euo pipefail
+cd "$(dirname "$0")/.."
+
+jobs=$(nproc)
+./scripts/install-deps.sh
+
+cmake -S . -B build -DCMAKE_BUILD_TYPE=RelWithDebInfo -DFILEINDEX_BUILD_BENCH=ON
+cmake --build build -j"$jobs"
+ctest --test-dir build -j"$jobs" --output-on-failure
+
+cmake -S . -B build-sanitize -DCMAKE_BUILD_TYPE=Debug -DFILEINDEX_SANITIZE=ON -DFILEINDEX_BUILD_BENCH=OFF
+cmake --build build-sanitize -j"$jobs"
+ctest --test-dir build-sanitize -j"$jobs" --output-on-failure
+
+build/bench/fileindex_bench --benchmark_min_time=0.01 >/dev/null
