@@ -12,24 +12,17 @@ class RootPrefixTest : public ::testing::Test {
   ~RootPrefixTest() override { SetRootPrefix(""); }
 };
 
-TEST_F(RootPrefixTest, ProductionRootIsEmptyAndPathsAreTheAppliances) {
-  EXPECT_EQ(GetRootPrefix(), "");
-  EXPECT_EQ(FolderConfPath(), "/usr/wezo/etc/fileindex/folder.conf");
-  EXPECT_EQ(StatusConfPath(), "/usr/wezo/etc/fileindex/status.conf");
-  EXPECT_EQ(FolderLockPath(), "/tmp/fileidx_cfg_folder.lock");
-  EXPECT_EQ(StatusLockPath(), "/tmp/fileidx_cfg_status.lock");
-  EXPECT_EQ(DaemonSocketPath(), "/var/run/fileindexd.sock");
-  EXPECT_EQ(NotifyToolPath(), "/usr/wezo/bin/wezohxonotify");
-}
-
-TEST_F(RootPrefixTest, EveryFixedPathMovesUnderTheRoot) {
-  ASSERT_TRUE(SetRootPrefix("/srv/sandbox"));
-  EXPECT_EQ(FolderConfPath(), "/srv/sandbox/usr/wezo/etc/fileindex/folder.conf");
-  EXPECT_EQ(StatusConfPath(), "/srv/sandbox/usr/wezo/etc/fileindex/status.conf");
-  EXPECT_EQ(FolderLockPath(), "/srv/sandbox/tmp/fileidx_cfg_folder.lock");
-  EXPECT_EQ(StatusLockPath(), "/srv/sandbox/tmp/fileidx_cfg_status.lock");
-  EXPECT_EQ(DaemonSocketPath(), "/srv/sandbox/var/run/fileindexd.sock");
-  EXPECT_EQ(NotifyToolPath(), "/srv/sandbox/usr/wezo/bin/wezohxonotify");
+TEST_F(RootPrefixTest, EveryFixedPathIsTheAppliancesUnderTheRoot) {
+  for (const std::string root : {"", "/srv/sandbox"}) {
+    ASSERT_TRUE(SetRootPrefix(root));
+    EXPECT_EQ(GetRootPrefix(), root);
+    EXPECT_EQ(FolderConfPath(), root + "/usr/wezo/etc/fileindex/folder.conf");
+    EXPECT_EQ(StatusConfPath(), root + "/usr/wezo/etc/fileindex/status.conf");
+    EXPECT_EQ(FolderLockPath(), root + "/tmp/fileidx_cfg_folder.lock");
+    EXPECT_EQ(StatusLockPath(), root + "/tmp/fileidx_cfg_status.lock");
+    EXPECT_EQ(DaemonSocketPath(), root + "/var/run/fileindexd.sock");
+    EXPECT_EQ(NotifyToolPath(), root + "/usr/wezo/bin/wezohxonotify");
+  }
 }
 
 TEST_F(RootPrefixTest, AcceptsAbsoluteRootsAndRefusesOthers) {

@@ -32,15 +32,6 @@ TEST_F(UtilsTest, ErrorCodeSurvivesLaterSuccesses) {
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_PATH);
 }
 
-TEST_F(UtilsTest, ErrorCodesKeepTheirNumbersAndDescriptions) {
-  EXPECT_EQ(FILEINDEX_ERR_BAD_PARAM, 1);
-  EXPECT_EQ(FILEINDEX_ERR_NO_SUCH_FOLDER, 4);
-  EXPECT_EQ(FILEINDEX_ERR_LOCK, 9);
-  EXPECT_STREQ(ErrorHandler::Describe(FILEINDEX_ERR_EXCEED_MAX_FOLDER), "folder list is full");
-  EXPECT_STREQ(ErrorHandler::Describe(10), "unknown error");
-  EXPECT_STREQ(ErrorHandler::Describe(-1), "unknown error");
-}
-
 TEST_F(UtilsTest, ErrorLinesAppearAtEveryLevelAndDebugLinesOnlyAtSeven) {
   for (int level : {3, 0, 7}) {
     LOG_LEVEL = level;
