@@ -29,9 +29,6 @@ class UniqueFd {
   int get() const { return m_fd; }
   explicit operator bool() const { return m_fd >= 0; }
 
-  // Gives up ownership without closing.
-  int Release() { return std::exchange(m_fd, -1); }
-
   // Closes now; returns close()'s result, 0 when nothing was open.
   int Close() {
     if (m_fd < 0) {

@@ -30,6 +30,9 @@ TEST_F(UtilsTest, ErrorCodeSurvivesLaterSuccesses) {
   ASSERT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_PATH);
   ASSERT_TRUE(GetFullPath(full, "/photo/x"));
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_PATH);
+  EXPECT_STREQ(ErrorHandler::Describe(ErrorHandler::GetError()),
+               "path or share could not be resolved");
+  EXPECT_STREQ(ErrorHandler::Describe(10), "unknown error");
 }
 
 TEST_F(UtilsTest, ErrorLinesAppearAtEveryLevelAndDebugLinesOnlyAtSeven) {
