@@ -43,10 +43,14 @@ void WriteLog(bool debugOnly, const char* unit, int line, const char* format, ..
   char buffer[1024];
   const int length = std::vsnprintf(buffer, sizeof buffer, format, args);
   va_end(args);
+  if (length < 0) {
+    errno = savedErrno;
+    return;
+  }
   std::string message;
-  if (length >= 0 && static_cast<size_t>(length) < sizeof buffer) {
+  if (static_cast<size_t>(length) < sizeof buffer) {
     message.assign(buffer, static_cast<size_t>(length));
-  } else if (length >= 0) {
+  } else {
     // Too long for the stack: format again into a buffer of the right size.
     message.resize(static_cast<size_t>(length) + 1);
     va_start(args, format);
@@ -54,11 +58,8 @@ void WriteLog(bool debugOnly, const char* unit, int line, const char* format, ..
     va_end(args);
     message.resize(static_cast<size_t>(length));
   }
-
-  if (length >= 0) {
-    const std::string text = std::string(unit) + ":" + std::to_string(line) + " " + message;
-    g_sink(LOG_ERR, text.c_str());
-  }
+  const std::string text = std::string(unit) + ":" + std::to_string(line) + " " + message;
+  g_sink(LOG_ERR, text.c_str());
   errno = savedErrno;
 }
 
