@@ -1,0 +1,51 @@
+// What may be indexed: whether a share may hold indexed folders, whether a folder may be added to
+// the folder list, whether an item met while crawling is skipped, and whether a share's volume
+// still has room for index data.
+//
+// Plain predicates over the platform's share database and file-system queries; none changes any
+// state, and a failing platform query answers "no" unless a comment says otherwise. Reentrant.
+#ifndef FILEINDEX_ELIGIBILITY_H_
+#define FILEINDEX_ELIGIBILITY_H_
+
+#include <string>
+
+#include "fileindex/export.h"
+
+// A share record of the platform's share database (wezo/platform.h).
+struct _tag_WEZOSHARE;  // NOLINT(bugprone-reserved-identifier,cert-dcl37-c,cert-dcl51-cpp)
+
+namespace WEZO {
+namespace FILEINDEX {
+
+// True when the share may hold indexed folders: not one of the excluded shares ("surveillance",
+// "NetBackup", case-sensitive), not encrypted and not read-only. False for a null share or when
+// the platform cannot answer.
+FILEINDEX_EXPORT bool CanShareBeIndexed(_tag_WEZOSHARE* share);
+
+// True when the single name `name` is never indexed: the platform's hidden metadata directory,
+// the index's own database and queue, and a few system files (compared case-sensitively).
+FILEINDEX_EXPORT bool IsSystemPreservedFileName(const std::string& name);
+
+// True when the item at `fullPath`, met while crawling, is to be skipped: a string without "/",
+// a never-indexed name, something in a recycle bin or snapshot, or on a network, image or
+// never-indexed file system. An item whose file-system type is unknown is not skipped.
+FILEINDEX_EXPORT bool IsSkipIndex(const std::string& fullPath);
+
+// True when the folder at `fullPath` may be added to the folder list: not in a recycle bin or
+// snapshot, on a known local file system, in a share that may be indexed, not a mount point
+// (unless the share is set up for encryption), and `fullPath` is exactly what it resolves to
+// (no symbolic link, trailing slash, "." or ".." component; the folder exists). Sets no code.
+FILEINDEX_EXPORT bool CanFullPathBeIndexed(const std::string& fullPath);
+
+// CanFullPathBeIndexed for the share path `path`. Returns false with FILEINDEX_ERR_PATH (logged)
+// when the share path cannot be resolved.
+FILEINDEX_EXPORT bool CanPathBeIndexed(const std::string& path);
+
+// True when the volume of the share `shareName` has room for 10 MiB of index data. Only a definite
+// "no space" or "over quota" answer of the platform gives false; an unknown share gives false too.
+FILEINDEX_EXPORT bool IsShareSpaceEnough(const std::string& shareName);
+
+}  // namespace FILEINDEX
+}  // namespace WEZO
+
+#endif  // FILEINDEX_ELIGIBILITY_H_
