@@ -9,6 +9,7 @@
 
 #include "fileindex/error.h"
 #include "log.h"
+#include "paths.h"
 #include "share_record.h"
 
 namespace WEZO {
@@ -109,6 +110,25 @@ std::string ReplaceShareName(const std::string& path, const std::string& newShar
     return "/" + newShareName;
   }
   return "/" + newShareName + path.substr(slash);
+}
+
+bool NotifyNoSpace() {
+  const std::string tool = NotifyToolPath();
+  const char* const argv[] = {
+      tool.c_str(),
+      "-e",
+      "false",
+      "-c",
+      "WEZO.RKS.AdminCenter.Application",
+      "@administrators",
+      "fileindex:fileindex_title",
+      "fileindex:notify_no_space",
+      "<a data-wezo-app=\"WEZO.RKS.AdminCenter.Application\" "
+      "data-wezo-fn=\"WEZO.RKS.AdminCenter.MediaIndex.Main\" data-wezo-tab=\"fileIndex\">",
+      "</a>",
+      nullptr,
+  };
+  return WLIBCExecv(tool.c_str(), argv, 1) == 0;
 }
 
 }  // namespace FILEINDEX

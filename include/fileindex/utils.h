@@ -62,6 +62,11 @@ FILEINDEX_EXPORT bool GetFullPath(std::string& fullPath, const std::string& path
 FILEINDEX_EXPORT std::string ReplaceShareName(const std::string& path,
                                               const std::string& newShareName);
 
+// Tells the administrators, with a desktop notification that links to the file-index settings,
+// that a share has no room left for its index. Runs the platform's notification tool and returns
+// true when it ran and succeeded. Neither logs nor sets a code.
+FILEINDEX_EXPORT bool NotifyNoSpace();
+
 }  // namespace FILEINDEX
 }  // namespace WEZO
 
