@@ -7,8 +7,12 @@
 #define FILEINDEX_FILEINDEX_H_
 
 #include "fileindex/config.h"
+#include "fileindex/eligibility.h"
 #include "fileindex/error.h"
+#include "fileindex/folder.h"
+#include "fileindex/folders.h"
 #include "fileindex/root.h"
+#include "fileindex/status.h"
 #include "fileindex/utils.h"
 
 #endif  // FILEINDEX_FILEINDEX_H_

@@ -1,0 +1,246 @@
+#define FILEINDEX_LOG_UNIT "folders"
+
+#include "fileindex/folders.h"
+
+#include <wezo/platform.h>
+
+#include <algorithm>
+#include <utility>
+
+#include "fileindex/error.h"
+#include "fileindex/utils.h"
+#include "json_io.h"
+#include "log.h"
+#include "paths.h"
+
+namespace WEZO {
+namespace FILEINDEX {
+namespace {
+
+// The file types of a change report, in the order the report lists them.
+constexpr const char* kFileTypes[] = {"document", "audio", "video", "photo"};
+
+// Per file type: true when the setting differs between `before` and `after`, or when either of
+// them has no setting for it.
+Json::Value ChangeReport(const Json::Value& before, const Json::Value& after) {
+  Json::Value report(Json::objectValue);
+  for (const char* type : kFileTypes) {
+    const bool comparable = before.isMember(type) && after.isMember(type);
+    report[type] = !comparable || before[type].asBool() != after[type].asBool();
+  }
+  return report;
+}
+
+// A share path that names one place and no other: it starts with "/" and none of its components
+// is empty (doubled or trailing slashes), "." or "..". The monitor watches what the list names
+// with root's rights, so "/photo/../../etc" must never get in.
+bool IsCleanSharePath(const std::string& path) {
+  if (path.empty() || path.front() != '/') {
+    return false;
+  }
+  size_t start = 1;
+  while (true) {
+    const size_t slash = path.find('/', start);
+    const std::string component =
+        path.substr(start, slash == std::string::npos ? std::string::npos : slash - start);
+    if (component.empty() || component == "." || component == "..") {
+      return false;
+    }
+    if (slash == std::string::npos) {
+      return true;
+    }
+    start = slash + 1;
+  }
+}
+
+using FolderOrder = bool (*)(const Folder&, const Folder&);
+
+FolderOrder OrderBy(const std::string& sortBy) {
+  if (sortBy == "name") {
+    return [](const Folder& a, const Folder& b) {
+      return WLIBCUnicodeUTF8StrCaseCmp(a.GetName().c_str(), b.GetName().c_str()) < 0;
+    };
+  }
+  if (sortBy == "document") {
+    return [](const Folder& a, const Folder& b) { return !a.GetDocument() && b.GetDocument(); };
+  }
+  if (sortBy == "audio") {
+    return [](const Folder& a, const Folder& b) { return !a.GetAudio() && b.GetAudio(); };
+  }
+  if (sortBy == "video") {
+    return [](const Folder& a, const Folder& b) { return !a.GetVideo() && b.GetVideo(); };
+  }
+  if (sortBy == "photo") {
+    return [](const Folder& a, const Folder& b) { return !a.GetPhoto() && b.GetPhoto(); };
+  }
+  return [](const Folder& a, const Folder& b) {
+    return WLIBCUnicodeUTF8StrCaseCmp(a.GetPath().c_str(), b.GetPath().c_str()) < 0;
+  };
+}
+
+}  // namespace
+
+std::string Folders::GetLockPath() const { return FolderLockPath(); }
+
+std::string Folders::GetPath() const { return FolderConfPath(); }
+
+bool Folders::Load() {
+  if (!LoadJson()) {
+    return false;
+  }
+  if (!m_jsRoot.isObject()) {
+    FILEINDEX_LOG("Malformed folders: %s", JsonToString(m_jsRoot).c_str());
+    ErrorHandler::SetError(FILEINDEX_ERR_MALFORMED_FOLDERS);
+    return false;
+  }
+  for (auto it = m_jsRoot.begin(); it != m_jsRoot.end(); ++it) {
+    // A folder whose share is gone is kept: it reports itself as not valid, and the user removes
+    // it. The stored "path" is ignored; the member's name is the folder's path.
+    Folder folder;
+    const std::string path = it.name();
+    folder.Load(path, *it);
+    m_folders.emplace(path, std::move(folder));
+  }
+  return true;
+}
+
+bool Folders::Save() {
+  m_jsRoot = Json::Value(Json::objectValue);
+  for (const auto& entry : m_folders) {
+    if (!entry.second.AddToJson(m_jsRoot)) {
+      return false;
+    }
+  }
+  return SaveJson();
+}
+
+bool Folders::List(std::vector<Folder>& out) const { return List(out, std::string()); }
+
+bool Folders::List(std::vector<Folder>& out, const std::string& share) const {
+  out.clear();
+  for (const auto& entry : m_folders) {
+    if (!share.empty()) {
+      std::string name;
+      if (!GetShareNameByPath(name, entry.first) || name != share) {
+        continue;
+      }
+    }
+    out.push_back(entry.second);
+  }
+  return true;
+}
+
+bool Folders::List(Json::Value& out, unsigned long offset, unsigned long limit,
+                   const std::string& sort_by, const std::string& sort_direction,
+                   const Json::Value& additional) const {
+  std::vector<Folder> folders;
+  List(folders);
+  const size_t total = folders.size();
+
+  out = Json::Value(Json::objectValue);
+  out["total"] = static_cast<Json::UInt>(total);
+  out["offset"] = static_cast<Json::UInt64>(offset);
+
+  std::sort(folders.begin(), folders.end(), OrderBy(sort_by));
+
+  const size_t count = offset >= total ? 0 : std::min<size_t>(total - offset, limit);
+  Json::Value page(Json::arrayValue);
+  if (sort_direction == "DESC") {
+    // A descending page is the start of the ascending order, reversed, whatever the offset; the
+    // management interface has always paged this way.
+    for (size_t i = count; i > 0; --i) {
+      page.append(folders[i - 1].asJson(additional));
+    }
+  } else {
+    for (size_t i = 0; i < count; ++i) {
+      page.append(folders[offset + i].asJson(additional));
+    }
+  }
+  out["folder"] = std::move(page);
+  return true;
+}
+
+bool Folders::Get(Json::Value& out, const std::string& path) const {
+  const auto it = m_folders.find(path);
+  if (it == m_folders.end()) {
+    FILEINDEX_LOG("No such folder: %s", path.c_str());
+    ErrorHandler::SetError(FILEINDEX_ERR_NO_SUCH_FOLDER);
+    return false;
+  }
+  out = it->second.asJson();
+  return true;
+}
+
+bool Folders::Upsert(Json::Value& result, const Json::Value& request) {
+  std::vector<Folder> before;
+  if (!List(before)) {
+    return false;
+  }
+
+  std::string path;
+  std::string fullPath;
+  if (!RetrieveStringFromJsonObj(path, "path", request) || !IsCleanSharePath(path) ||
+      !WEZO::FILEINDEX::GetFullPath(fullPath, path)) {
+    FILEINDEX_LOG("Bad param: %s", JsonToString(request).c_str());
+    ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
+    return false;
+  }
+
+  auto it = m_folders.find(path);
+  if (it == m_folders.end()) {
+    Folder folder;
+    folder.Load(path, request);
+    it = m_folders.emplace(path, std::move(folder)).first;
+    // Counted after the insertion, so a change to a folder of a full list still goes through.
+    if (m_folders.size() > kMaxFolders) {
+      FILEINDEX_LOG("Exceed max folder size");
+      ErrorHandler::SetError(FILEINDEX_ERR_EXCEED_MAX_FOLDER);
+      return false;
+    }
+  } else {
+    Folder changed = it->second;
+    changed.Reload(path, request);
+    it->second = std::move(changed);
+  }
+
+  result = ChangeReport(GetMostSuitableCfg(std::move(before), fullPath), it->second.asJson());
+  return true;
+}
+
+bool Folders::Delete(Json::Value& result, const std::string& path) {
+  std::vector<Folder> before;
+  if (!List(before)) {
+    return false;
+  }
+  m_folders.erase(path);
+  std::vector<Folder> after;
+  if (!List(after)) {
+    return false;
+  }
+
+  std::string fullPath;
+  if (!WEZO::FILEINDEX::GetFullPath(fullPath, path)) {
+    return true;
+  }
+  result = Json::Value(Json::objectValue);
+  result[path] = ChangeReport(GetMostSuitableCfg(std::move(before), fullPath),
+                              GetMostSuitableCfg(std::move(after), fullPath));
+  return true;
+}
+
+// NOLINTNEXTLINE(performance-unnecessary-value-param): callers hand over lists they are done with
+Json::Value GetMostSuitableCfg(std::vector<Folder> folders, const std::string& fullPath) {
+  const std::string target = fullPath + "/";
+  const Folder* match = nullptr;
+  for (const Folder& folder : folders) {
+    const std::string folderPath = folder.GetFullPath();
+    // The last match wins: in share-path order that is the deepest folder enclosing the target.
+    if (!folderPath.empty() && StringStartWith(target, folderPath + "/")) {
+      match = &folder;
+    }
+  }
+  return match != nullptr ? match->asJson() : Json::Value(Json::objectValue);
+}
+
+}  // namespace FILEINDEX
+}  // namespace WEZO
