@@ -17,6 +17,7 @@
 #include "fake_platform.h"
 #include "fileindex/error.h"
 #include "fileindex/root.h"
+#include "json_io.h"
 #include "log.h"
 
 namespace testsupport {
@@ -91,6 +92,12 @@ std::vector<std::string> LogCapture::Lines() const {
 }
 
 void LogCapture::Clear() { Captured().clear(); }
+
+Json::Value ParseJson(const std::string& text) {
+  Json::Value value;
+  EXPECT_TRUE(WEZO::FILEINDEX::JsonFromString(value, text)) << text;
+  return value;
+}
 
 void WriteFile(const std::string& path, const std::string& text) {
   std::ofstream out(path, std::ios::binary | std::ios::trunc);

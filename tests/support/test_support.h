@@ -4,10 +4,17 @@
 #define FILEINDEX_TESTS_SUPPORT_TEST_SUPPORT_H_
 
 #include <gtest/gtest.h>
+#include <json/value.h>
 #include <sys/types.h>
 
+#include <ostream>
 #include <string>
 #include <vector>
+
+namespace Json {
+// Failed expectations show JSON values as text.
+inline void PrintTo(const Value& value, std::ostream* os) { *os << value.toStyledString(); }
+}  // namespace Json
 
 namespace testsupport {
 
@@ -44,6 +51,9 @@ class LogCapture {
   std::vector<std::string> RawLines() const;
   void Clear();
 };
+
+// `text` parsed as JSON. Fails the test when it is not JSON.
+Json::Value ParseJson(const std::string& text);
 
 // Writes `text` to `path`, replacing it. Fails the test on error.
 void WriteFile(const std::string& path, const std::string& text);

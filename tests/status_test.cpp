@@ -1,0 +1,144 @@
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <json/value.h>
+
+#include <string>
+
+#include "fake_platform.h"
+#include "fileindex/status.h"
+#include "fileindex/utils.h"
+#include "json_io.h"
+#include "paths.h"
+#include "test_support.h"
+
+namespace WEZO {
+namespace FILEINDEX {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+
+class StatusTest : public testsupport::LibraryTest {
+ protected:
+  // A status object loaded from a status file holding `text`.
+  void LoadText(Status& status, const std::string& text) {
+    testsupport::WriteFile(StatusConfPath(), text);
+    ASSERT_TRUE(status.Load());
+  }
+  Json::Value SavedFile() {
+    Json::Value saved;
+    EXPECT_TRUE(JsonFromString(saved, testsupport::ReadFile(StatusConfPath())));
+    return saved;
+  }
+};
+
+TEST_F(StatusTest, PauseStateReadsMinusOneWhenAbsentAndRefusesWhatIsNotAnInteger) {
+  struct Case {
+    const char* file;
+    bool readable;
+    long long resumeTime;
+  };
+  const Case cases[] = {
+      {"{}", true, -1},
+      {R"({"resume_time":0})", true, 0},
+      {R"({"resume_time":4102444800})", true, 4102444800LL},
+      {R"({"resume_time":-1})", true, -1},
+      {R"({"resume_time":"abc"})", false, 42},
+      {R"({"resume_time":[1]})", false, 42},
+      {R"({"resume_time":1e30})", false, 42},
+      {"[1]", false, 42},
+  };
+  for (const Case& c : cases) {
+    Status status;
+    LoadText(status, c.file);
+    log.Clear();
+    long long resumeTime = 42;
+    EXPECT_EQ(status.GetPauseInfo(resumeTime), c.readable) << c.file;
+    EXPECT_EQ(resumeTime, c.resumeTime) << c.file;
+    if (c.readable) {
+      EXPECT_THAT(log.Lines(), IsEmpty());
+    } else {
+      EXPECT_THAT(log.Lines(), ElementsAre("status:N json exception"));
+    }
+  }
+
+  Status status;
+  status.Pause(0);
+  ASSERT_TRUE(status.Save());
+  EXPECT_EQ(SavedFile(), testsupport::ParseJson(R"({"resume_time":0})"));
+  status.Resume();
+  ASSERT_TRUE(status.Save());
+  EXPECT_EQ(SavedFile(), testsupport::ParseJson(R"({"resume_time":-1})"));
+}
+
+TEST_F(StatusTest, NoSpaceNotifiesOncePerTransitionWithTheExactCommandLine) {
+  Status status;
+  status.ShareSetNoSpace("photo", true);
+  status.ShareSetNoSpace("photo", true);
+  status.ShareSetNoSpace("video", false);
+  EXPECT_TRUE(status.ShareIsNoSpace("photo"));
+  EXPECT_FALSE(status.ShareIsNoSpace("video"));
+  auto runs = fake::Get().CallsTo("WLIBCExecv");
+  ASSERT_EQ(runs.size(), 1U);
+  const std::string tool = NotifyToolPath();
+  EXPECT_THAT(runs[0].args,
+              ElementsAre(tool, tool, "-e", "false", "-c", "WEZO.RKS.AdminCenter.Application",
+                          "@administrators", "fileindex:fileindex_title",
+                          "fileindex:notify_no_space",
+                          "<a data-wezo-app=\"WEZO.RKS.AdminCenter.Application\" "
+                          "data-wezo-fn=\"WEZO.RKS.AdminCenter.MediaIndex.Main\" "
+                          "data-wezo-tab=\"fileIndex\">",
+                          "</a>", "1"));
+
+  status.ShareSetNoSpace("photo", false);
+  EXPECT_FALSE(status.ShareIsNoSpace("photo"));
+  fake::Get().execResult = 1;
+  EXPECT_TRUE(status.ShareSetNoSpace("photo", true));
+  EXPECT_TRUE(status.ShareIsNoSpace("photo"));
+  EXPECT_EQ(fake::Get().CallsTo("WLIBCExecv").size(), 2U);
+  EXPECT_THAT(log.Lines(), ElementsAre("status:N NotifyNoSpace failed"));
+  EXPECT_FALSE(NotifyNoSpace());
+}
+
+TEST_F(StatusTest, ShareFlagsAreAddedAndRemovedByPresence) {
+  Status status;
+  LoadText(status, R"({"need_reindex":{"video":false},"no_space":"corrupt","marker":true})");
+  EXPECT_TRUE(status.ShareIsNeedReindex("video"));
+  EXPECT_FALSE(status.ShareIsNoSpace("corrupt"));
+  status.ShareSetNeedReindex("video", false);
+  status.ShareSetNeedReindex("photo", false);
+  status.ShareSetNoSpace("photo", true);
+  ASSERT_TRUE(status.Save());
+  EXPECT_EQ(SavedFile(), testsupport::ParseJson(R"({"need_reindex":{},"no_space":{"photo":true},
+                                                    "marker":true})"));
+
+  status.ShareSetNeedReindex("photo", true);
+  EXPECT_TRUE(status.ShareIsNeedReindex("photo"));
+  EXPECT_FALSE(status.ShareIsNeedReindex("Photo"));
+}
+
+TEST_F(StatusTest, MarkersReadAsBooleansWithoutThrowing) {
+  Status status;
+  LoadText(status, R"({"t":true,"f":false,"one":1,"zero":0,"text":"yes","obj":{},"null":null})");
+  const std::pair<const char*, bool> cases[] = {{"t", true},     {"f", false},    {"one", true},
+                                                {"zero", false}, {"text", false}, {"obj", false},
+                                                {"null", false}, {"absent", false}};
+  for (const auto& [key, expected] : cases) {
+    EXPECT_EQ(status.IsUpdated(key), expected) << key;
+  }
+  status.SetUpdated("absent");
+  EXPECT_TRUE(status.IsUpdated("absent"));
+
+  // A status file that is not an object holds nothing; the first change starts a new one.
+  Status odd;
+  LoadText(odd, "[true]");
+  EXPECT_FALSE(odd.IsUpdated("0"));
+  EXPECT_FALSE(odd.ShareIsNoSpace("photo"));
+  odd.SetUpdated("x");
+  ASSERT_TRUE(odd.Save());
+  EXPECT_EQ(SavedFile(), testsupport::ParseJson(R"({"x":true})"));
+}
+
+}  // namespace
+}  // namespace FILEINDEX
+}  // namespace WEZO
