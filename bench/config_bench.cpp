@@ -1,5 +1,7 @@
 // Costs of the configuration file cycle on a full folder list (1000 folders): load, save, and
-// one lock-unlock cycle. Runs in a temporary root of its own.
+// one lock-unlock cycle; then the folder list's own work on it: loading into records (one share
+// lookup per folder), a sorted page, and a change of one folder with its change report. Runs in a
+// temporary root of its own, over the fake platform.
 //
 //   build/bench/fileindex_bench [--benchmark_filter=...]
 #include <benchmark/benchmark.h>
@@ -10,7 +12,9 @@
 #include <cstdlib>
 #include <string>
 
+#include "fake_platform.h"
 #include "fileindex/config.h"
+#include "fileindex/folders.h"
 #include "fileindex/root.h"
 #include "paths.h"
 
@@ -41,6 +45,8 @@ class Root {
       mkdir((m_dir + d).c_str(), 0755);
     }
     WEZO::FILEINDEX::SetRootPrefix(m_dir);
+    fake::Reset();
+    fake::Get().AddShare("photo", m_dir + "/volume1/photo");
     FolderFile file;
     for (int i = 0; i < folders; ++i) {
       const std::string path = "/photo/" + std::to_string(100000 + i);
@@ -91,5 +97,40 @@ void BM_LockUnlock(benchmark::State& state) {
   }
 }
 BENCHMARK(BM_LockUnlock);
+
+void BM_LoadFolderRecords(benchmark::State& state) {
+  Root root(1000);
+  for (auto _ : state) {
+    WEZO::FILEINDEX::Folders folders;
+    benchmark::DoNotOptimize(folders.Load());
+  }
+}
+BENCHMARK(BM_LoadFolderRecords);
+
+void BM_PageSortedByName(benchmark::State& state) {
+  Root root(1000);
+  WEZO::FILEINDEX::Folders folders;
+  folders.Load();
+  const Json::Value none(Json::arrayValue);
+  for (auto _ : state) {
+    Json::Value page;
+    benchmark::DoNotOptimize(folders.List(page, 500, 50, "name", "ASC", none));
+  }
+}
+BENCHMARK(BM_PageSortedByName);
+
+void BM_UpsertIntoFullList(benchmark::State& state) {
+  Root root(1000);
+  WEZO::FILEINDEX::Folders folders;
+  folders.Load();
+  Json::Value request;
+  request["path"] = "/photo/100500";
+  request["photo"] = true;
+  for (auto _ : state) {
+    Json::Value report;
+    benchmark::DoNotOptimize(folders.Upsert(report, request));
+  }
+}
+BENCHMARK(BM_UpsertIntoFullList);
 
 }  // namespace
