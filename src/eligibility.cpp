@@ -5,6 +5,7 @@
 
 #include <wezo/platform.h>
 
+#include <algorithm>
 #include <array>
 #include <climits>
 #include <cstdlib>
@@ -27,12 +28,7 @@ const std::array<std::string, 2> kExcludedShares = {"surveillance", "NetBackup"}
 
 template <size_t N>
 bool IsListed(const std::array<std::string, N>& list, const std::string& name) {
-  for (const std::string& entry : list) {
-    if (entry == name) {
-      return true;
-    }
-  }
-  return false;
+  return std::find(list.begin(), list.end(), name) != list.end();
 }
 
 bool Contains(const std::string& text, const char* part) {

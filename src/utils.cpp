@@ -113,6 +113,11 @@ std::string ReplaceShareName(const std::string& path, const std::string& newShar
 }
 
 bool NotifyNoSpace() {
+  // The link that the notification's text is wrapped in: it opens the file-index page of the
+  // administration application.
+  static constexpr char kLinkOpen[] =
+      "<a data-wezo-app=\"WEZO.RKS.AdminCenter.Application\" "
+      "data-wezo-fn=\"WEZO.RKS.AdminCenter.MediaIndex.Main\" data-wezo-tab=\"fileIndex\">";
   const std::string tool = NotifyToolPath();
   const char* const argv[] = {
       tool.c_str(),
@@ -123,8 +128,7 @@ bool NotifyNoSpace() {
       "@administrators",
       "fileindex:fileindex_title",
       "fileindex:notify_no_space",
-      "<a data-wezo-app=\"WEZO.RKS.AdminCenter.Application\" "
-      "data-wezo-fn=\"WEZO.RKS.AdminCenter.MediaIndex.Main\" data-wezo-tab=\"fileIndex\">",
+      kLinkOpen,
       "</a>",
       nullptr,
   };
