@@ -1,6 +1,7 @@
 // Program execution and service control through systemd.
 #include <spawn.h>
 #include <sys/wait.h>
+#include <unistd.h>
 #include <wezo/platform.h>
 
 #include <cerrno>
@@ -11,7 +12,6 @@
 
 #include "internal.h"
 
-extern char** environ;  // NOLINT(readability-redundant-declaration): POSIX declares it nowhere
 
 namespace {
 
@@ -36,9 +36,8 @@ int Spawn(const char* path, const char* const argv[]) {
 
   pid_t pid = -1;
   // posix_spawn does not write to argv; its prototype only predates const.
-  const int rc = posix_spawn(&pid, path, nullptr, &attr,
-                             const_cast<char* const*>(argv),  // NOLINT(cppcoreguidelines-pro-type-const-cast)
-                             environ);
+  const int rc =
+      posix_spawn(&pid, path, nullptr, &attr, const_cast<char* const*>(argv), environ);
   posix_spawnattr_destroy(&attr);
   if (rc != 0) {
     return PLATFORM_FAIL(rc == ENOENT ? kErrNotFound : kErrProgram);

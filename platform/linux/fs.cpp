@@ -9,7 +9,7 @@
 
 #include <cerrno>
 #include <climits>
-#include <cstdio>
+#include <cstdlib>
 #include <string>
 #include <vector>
 #include <cstring>
@@ -146,11 +146,12 @@ bool ReadMounts(std::vector<Mount>& mounts) {
     }
     std::string type;
     fields >> type;
-    unsigned major = 0;
-    unsigned minor = 0;
-    if (type.empty() || std::sscanf(devField.c_str(), "%u:%u", &major, &minor) != 2) {
+    char* colon = nullptr;
+    const unsigned long major = std::strtoul(devField.c_str(), &colon, 10);
+    if (type.empty() || *colon != ':') {
       continue;
     }
+    const unsigned long minor = std::strtoul(colon + 1, nullptr, 10);
     mounts.push_back(Mount{makedev(major, minor), Unescape(mountPoint), type});
   }
   return true;

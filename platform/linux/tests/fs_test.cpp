@@ -54,7 +54,7 @@ TEST_F(FsTest, CreatesTheMetadataFolderButNeverThroughALink) {
   struct stat st {};
   ASSERT_EQ(lstat(At("@eaDir").c_str(), &st), 0);
   EXPECT_TRUE(S_ISDIR(st.st_mode));
-  EXPECT_EQ(st.st_mode & 07777, 0755u);
+  EXPECT_EQ(st.st_mode & 07777, 0755U);
   EXPECT_EQ(WEZOEAMKDir(0, At("@eaDir").c_str()), 0);
 
   Write("target/keep", "");

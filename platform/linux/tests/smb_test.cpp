@@ -61,7 +61,7 @@ TEST_F(SpotlightTest, RewritesOnlyTheGlobalSpotlightValue) {
     EXPECT_EQ(WEZOSMBIsEnableSpotlight(), c.enable);
     struct stat st {};
     ASSERT_EQ(stat(At("etc/samba/smb.conf").c_str(), &st), 0);
-    EXPECT_EQ(st.st_mode & 07777, 0640u);
+    EXPECT_EQ(st.st_mode & 07777, 0640U);
     EXPECT_EQ(EntriesIn(At("etc/samba")), 1) << "a temporary file was left behind";
     ExpectSambaAccepts(At("etc/samba/smb.conf"));
   }
