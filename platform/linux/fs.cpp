@@ -1,10 +1,15 @@
 // File-system facts: type codes, mount points, the hidden metadata folder and free space.
 #include <fcntl.h>
+#include <linux/fs.h>
 #include <linux/magic.h>
+#include <linux/quota.h>
+#include <sys/ioctl.h>
+#include <sys/syscall.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
 #include <sys/sysmacros.h>
 #include <sys/vfs.h>
+#include <unistd.h>
 #include <wezo/platform.h>
 
 #include <cerrno>
@@ -178,6 +183,30 @@ int FuseCode(const char* path) {
   return WEZO_FSTYPE_UNKNOWN;
 }
 
+// Bytes the project quota of the folder's project still allows, or -1 when no project quota
+// applies (no project, quotas off, or a kernel without quotactl_fd). Only the project quota
+// counts: the index data is written by root, whose user quota is never enforced.
+long long ProjectQuotaRoom(const char* path) {
+#ifndef SYS_quotactl_fd
+  (void)path;
+  return -1;
+#else
+  WEZO::FILEINDEX::UniqueFd fd(open(path, O_RDONLY | O_CLOEXEC));
+  struct fsxattr attr {};
+  if (!fd || ioctl(fd.get(), FS_IOC_FSGETXATTR, &attr) != 0 || attr.fsx_projid == 0) {
+    return -1;
+  }
+  struct if_dqblk quota {};
+  if (syscall(SYS_quotactl_fd, fd.get(), QCMD(Q_GETQUOTA, PRJQUOTA), attr.fsx_projid, &quota) !=
+          0 ||
+      (quota.dqb_valid & QIF_BLIMITS) == 0 || quota.dqb_bhardlimit == 0) {
+    return -1;
+  }
+  const unsigned long long limit = quota.dqb_bhardlimit * QIF_DQBLKSIZE;
+  return quota.dqb_curspace >= limit ? 0 : static_cast<long long>(limit - quota.dqb_curspace);
+#endif
+}
+
 }  // namespace
 
 extern "C" {
@@ -281,6 +310,11 @@ int WEZOQuotaIsEnough(int /*flags*/, const char* szPath, unsigned long long cbNe
   const bool overflows = blockSize != 0 && blocks > ULLONG_MAX / blockSize;
   if (!overflows && blocks * blockSize < cbNeeded) {
     PLATFORM_FAIL(WLIBC_ERR_NO_SPACE);
+    return 0;
+  }
+  const long long room = ProjectQuotaRoom(szPath);
+  if (room >= 0 && static_cast<unsigned long long>(room) < cbNeeded) {
+    PLATFORM_FAIL(WLIBC_ERR_OVER_QUOTA);
     return 0;
   }
   return 1;
