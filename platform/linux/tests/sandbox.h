@@ -3,21 +3,43 @@
 #define WEZO_PLATFORM_LINUX_TESTS_SANDBOX_H_
 
 #include <gtest/gtest.h>
-#include <sys/types.h>
+#include <sys/stat.h>
 
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
 #include <string>
+
+#include "fileindex/root.h"
 
 class SandboxTest : public ::testing::Test {
  protected:
-  void SetUp() override;
-  void TearDown() override;
+  void SetUp() override {
+    const char* tmp = std::getenv("TMPDIR");
+    std::string dir = std::string(tmp != nullptr && tmp[0] == '/' ? tmp : "/tmp") + "/plt.XXXXXX";
+    ASSERT_NE(mkdtemp(dir.data()), nullptr);
+    root_ = dir;
+    ASSERT_TRUE(WEZO::FILEINDEX::SetRootPrefix(root_));
+  }
+  void TearDown() override {
+    WEZO::FILEINDEX::SetRootPrefix("");
+    std::error_code ec;
+    std::filesystem::remove_all(root_, ec);
+  }
 
-  // The absolute path of `relative` under the sandbox root.
   std::string At(const std::string& relative) const { return root_ + "/" + relative; }
-  // Writes `text` to `relative`, creating its folders, with `mode`.
-  void Write(const std::string& relative, const std::string& text, mode_t mode = 0644) const;
-  std::string Read(const std::string& relative) const;
-  void WriteSmbConf(const std::string& text) const { Write("etc/samba/smb.conf", text); }
+  // Writes `text` to `relative` with `mode`, creating its folders.
+  void Write(const std::string& relative, const std::string& text, mode_t mode = 0644) const {
+    std::filesystem::create_directories(std::filesystem::path(At(relative)).parent_path());
+    std::ofstream(At(relative), std::ios::binary | std::ios::trunc) << text;
+    ASSERT_EQ(chmod(At(relative).c_str(), mode), 0);
+  }
+  std::string Read(const std::string& relative) const {
+    std::ostringstream text;
+    text << std::ifstream(At(relative), std::ios::binary).rdbuf();
+    return text.str();
+  }
 
   std::string root_;
 };
