@@ -12,6 +12,9 @@ packages=(
   libgtest-dev
   libgmock-dev
   libbenchmark-dev
+  libicu-dev
+  # testparm, to check the Samba configuration the platform writes; brings no daemon with it
+  samba-common-bin
 )
 
 missing=()

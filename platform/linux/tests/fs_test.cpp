@@ -1,0 +1,68 @@
+#include <sys/stat.h>
+#include <unistd.h>
+#include <wezo/platform.h>
+
+#include <algorithm>
+#include <climits>
+
+#include "sandbox.h"
+
+namespace {
+
+using FsTest = SandboxTest;
+
+TEST_F(FsTest, TellsFileSystemTypesAndMountPoints) {
+  const int local = WEZOGetFSType(root_.c_str(), 0);
+  EXPECT_NE(local, WEZO_FSTYPE_UNKNOWN) << "the test folder's file system is not in the table";
+  EXPECT_FALSE(WEZOFSIsRemoteFS(local) || WEZOFSIsImageFS(local));
+  EXPECT_EQ(WEZOGetFSType(At("missing").c_str(), 0), WEZO_FSTYPE_UNKNOWN);
+
+  Write("dir/file", "");
+  ASSERT_EQ(symlink("/", At("link").c_str()), 0);
+  const struct {
+    std::string path;
+    int mountPoint;
+  } cases[] = {
+      {"/", 1}, {root_, 0}, {At("dir/file"), 0}, {At("link"), 0}, {At("missing"), -1},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.path);
+    EXPECT_EQ(std::max(WEZOFSDirIsMntPoint(c.path.c_str()), -1), c.mountPoint);
+  }
+  if (access("/proc/self", F_OK) == 0) {
+    EXPECT_EQ(WEZOGetFSType("/proc/self", 0), WEZO_FSTYPE_NEVER_INDEXED);
+    EXPECT_EQ(WEZOFSDirIsMntPoint("/proc"), 1);
+  }
+}
+
+TEST_F(FsTest, CreatesTheMetadataFolderButNeverThroughALink) {
+  EXPECT_EQ(WEZOEAIsHiddenDir("@eaDir"), 1);
+  EXPECT_EQ(WEZOEAIsHiddenDir("@eadir"), 0);
+  const mode_t old = umask(077);
+  EXPECT_EQ(WEZOEAMKDir(0, At("@eaDir").c_str()), 0);
+  umask(old);
+  struct stat st {};
+  ASSERT_EQ(lstat(At("@eaDir").c_str(), &st), 0);
+  EXPECT_TRUE(S_ISDIR(st.st_mode));
+  EXPECT_EQ(st.st_mode & 07777, 0755U);
+  EXPECT_EQ(WEZOEAMKDir(0, At("@eaDir").c_str()), 0);
+
+  Write("share/keep", "");
+  Write("file/@eaDir", "");
+  ASSERT_EQ(symlink(At("dir").c_str(), At("share/@eaDir").c_str()), 0);
+  ASSERT_EQ(mkdir(At("dir").c_str(), 0755), 0);
+  for (const char* refused : {"share/@eaDir", "file/@eaDir", "missing/@eaDir"}) {
+    EXPECT_LT(WEZOEAMKDir(0, At(refused).c_str()), 0) << refused;
+  }
+}
+
+TEST_F(FsTest, AnswersTheSpaceQuestion) {
+  EXPECT_NE(WEZOQuotaIsEnough(0, root_.c_str(), 1), 0);
+  EXPECT_EQ(WEZOQuotaIsEnough(0, root_.c_str(), ULLONG_MAX), 0);
+  EXPECT_EQ(WLIBCErrGet(), WLIBC_ERR_NO_SPACE);
+  EXPECT_EQ(WEZOQuotaIsEnough(0, At("missing").c_str(), 1), 0);
+  EXPECT_NE(WLIBCErrGet(), WLIBC_ERR_NO_SPACE);
+  EXPECT_NE(WLIBCErrGet(), WLIBC_ERR_OVER_QUOTA);
+}
+
+}  // namespace

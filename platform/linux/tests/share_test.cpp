@@ -1,0 +1,119 @@
+#include <wezo/platform.h>
+
+#include <string>
+
+#include "internal.h"
+#include "sandbox.h"
+
+namespace {
+
+using ShareTest = SandboxTest;
+
+// Samba's rules at work: comments, continuation lines, names without case or spaces, the last
+// value winning across synonyms, a repeated section, special sections and one without a path.
+const char* const kConf =
+    "; comment\n# [commented]\n[global]\n   read only = no\n"
+    "[photo]\n   path = /volume1/photo/\n   READ ONLY = yes\n   writable = yes\n"
+    "[docs]\n   Path = /volume1/\\\ndocs\n   ReadOnly = yes\n"
+    "[music]\n   path = /volume1/old\n   ; read only = no\n   write ok = no\n"
+    "[ MUSIC ]\n   path = /volume1/music\r\n"
+    "[photo2019]\n   directory = /volume1/photo/2019\n[photos]\n   path = /volume1/photos\n"
+    "[homes]\n   path = /home\n[printers]\n   path = /var/spool\n[nopath]\n   comment = x\n";
+
+TEST_F(ShareTest, ReadsSharesFromTheSambaConfiguration) {
+  Write("etc/samba/smb.conf", kConf);
+  const struct {
+    const char* name;
+    const char* path;  // null: no such share
+    int readOnly;
+  } cases[] = {
+      {"photo", "/volume1/photo", 0}, {"docs", "/volume1/docs", 1},
+      {"music", "/volume1/music", 1}, {"photo2019", "/volume1/photo/2019", 0},
+      {"PHOTO", nullptr, 0},          {"global", nullptr, 0},
+      {"homes", nullptr, 0},          {"printers", nullptr, 0},
+      {"nopath", nullptr, 0},         {"commented", nullptr, 0},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    PWEZOSHARE share = nullptr;
+    if (c.path == nullptr) {
+      EXPECT_LT(WEZOShareGet(c.name, &share), 0);
+      EXPECT_EQ(WLIBCErrGet(), WEZO::PLATFORM::kErrNotFound);
+      continue;
+    }
+    ASSERT_EQ(WEZOShareGet(c.name, &share), 0);
+    EXPECT_STREQ(share->szPath, c.path);
+    int readOnly = -1;
+    EXPECT_EQ(WLIBShareIsReadOnlyGet(share, &readOnly), 0);
+    EXPECT_EQ(readOnly, c.readOnly);
+    WEZOShareFree(share);
+  }
+}
+
+TEST_F(ShareTest, FindsTheDeepestShareHoldingAPathAndItsFolders) {
+  Write("etc/samba/smb.conf", kConf);
+  const struct {
+    const char* full;
+    const char* share;  // null: no share holds it
+    int recycle;
+    int snapshot;
+  } cases[] = {
+      {"/volume1/photo", "photo", 0, 0},           {"/volume1/photo/2019/x", "photo2019", 0, 0},
+      {"/volume1/photo/20190", "photo", 0, 0},     {"/volume1/photos/x", "photos", 0, 0},
+      {"/volume1/pho", nullptr, 0, 0},             {"/volume1", nullptr, 0, 0},
+      {"/volume1/photo/#recycle", "photo", 1, 0},  {"/volume1/photo/#recycle/a", "photo", 1, 0},
+      {"/volume1/photo/#snapshot/x", "photo", 0, 1}, {"/volume1/photo/#recycle-x", "photo", 0, 0},
+      {"/volume1/photo/a/#recycle", "photo", 0, 0}, {"/elsewhere/#snapshot", nullptr, 0, 0},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.full);
+    char name[WEZO_SHARE_NAME_MAX] = "";
+    char path[WEZO_SHARE_PATH_MAX] = "";
+    const int rc = WEZOShareNamePathGet(c.full, name, sizeof name, path, sizeof path);
+    EXPECT_EQ(rc == 0, c.share != nullptr);
+    EXPECT_STREQ(name, c.share != nullptr ? c.share : "");
+    EXPECT_EQ(WEZOShareIsShareRecycle(c.full), c.recycle);
+    int snapshot = -1;
+    EXPECT_EQ(WLIBFhsPathInSnapshot(c.full, &snapshot), 0);
+    EXPECT_EQ(snapshot, c.snapshot);
+  }
+  char name[4];
+  char path[9];
+  EXPECT_EQ(WEZOShareNamePathGet("/volume1/photo/x", name, sizeof name, path, sizeof path), 0);
+  EXPECT_STREQ(name, "pho");
+  EXPECT_STREQ(path, "/volume1");
+  EXPECT_LT(WEZOShareNamePathGet("/volume1/photo", name, 0, path, sizeof path), 0);
+  EXPECT_EQ(WLIBCErrGet(), WLIBC_ERR_BAD_PARAMETERS);
+}
+
+TEST_F(ShareTest, AMissingOrInvalidConfigurationIsAFailure) {
+  PWEZOSHARE share = nullptr;
+  int flag = -1;
+  EXPECT_LT(WEZOShareGet("photo", &share), 0);
+  EXPECT_EQ(WLIBCErrGet(), WEZO::PLATFORM::kErrNotFound);
+  EXPECT_LT(WLIBFhsPathInSnapshot("/volume1/photo/#snapshot", &flag), 0);
+  EXPECT_EQ(flag, -1);
+
+  Write("etc/samba/smb.conf", "[photo]\n path = /volume1/photo\n read only = maybe\n");
+  EXPECT_LT(WEZOShareGet("photo", &share), 0);
+  EXPECT_EQ(WLIBCErrGet(), WEZO::PLATFORM::kErrBadConfig);
+  EXPECT_STREQ(WLIBCErrorGetFile(), "smb_conf.cpp");
+  EXPECT_GT(WLIBCErrorGetLine(), 0);
+}
+
+TEST_F(ShareTest, AShareOnAPlainFolderIsNotEncrypted) {
+  Write("data/file", "");
+  Write("etc/samba/smb.conf", "[data]\npath = " + At("data") + "\n[gone]\npath = " + At("x") + "\n");
+  for (const char* name : {"data", "gone"}) {
+    PWEZOSHARE share = nullptr;
+    ASSERT_EQ(WEZOShareGet(name, &share), 0);
+    int encrypted = -1;
+    int encryption = -1;
+    const int expected = std::string(name) == "data" ? 0 : -1;
+    EXPECT_EQ(WLIBShareIsEncryptedGet(share, &encrypted) < 0 ? -1 : encrypted, expected);
+    EXPECT_EQ(WLIBShareIsEncryptionGet(share, &encryption) < 0 ? -1 : encryption, expected);
+    WEZOShareFree(share);
+  }
+}
+
+}  // namespace
