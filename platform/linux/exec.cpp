@@ -12,7 +12,6 @@
 
 #include "internal.h"
 
-
 namespace {
 
 using WEZO::PLATFORM::kErrNotFound;
