@@ -10,7 +10,8 @@ namespace {
 using ShareTest = SandboxTest;
 
 // Samba's rules at work: comments, continuation lines, names without case or spaces, the last
-// value winning across synonyms, a repeated section, special sections and one without a path.
+// value winning across a parameter's other names, a repeated section, special sections and one
+// without a path.
 const char* const kConf =
     "; comment\n# [commented]\n[global]\n   read only = no\n"
     "[photo]\n   path = /volume1/photo/\n   READ ONLY = yes\n   writable = yes\n"
