@@ -47,9 +47,9 @@ bool Config::LoadJson() {
 bool Config::SaveJson() {
   const std::string path = GetPath();
   switch (JsonToFile(m_jsRoot, path, kFileMode)) {
-    case JsonSaveResult::kSaved:
+    case JsonSaveResult::kReplaced:
       return true;
-    case JsonSaveResult::kSavedModeNotSet:
+    case JsonSaveResult::kReplacedModeNotSet:
       FILEINDEX_LOG("chmod failed, path=%s", path.c_str());
       return true;
     case JsonSaveResult::kFailed:

@@ -13,6 +13,8 @@
 #include <cstddef>
 #include <string>
 
+#include "file_io.h"
+
 namespace WEZO {
 namespace FILEINDEX {
 
@@ -21,11 +23,8 @@ namespace FILEINDEX {
 // first.
 bool JsonFromFile(Json::Value& value, const std::string& path);
 
-enum class JsonSaveResult {
-  kSaved,          // the file holds the document and has the requested mode
-  kSavedModeNotSet,  // the file holds the document, but its mode could not be set
-  kFailed,         // nothing was replaced; the old file, if any, is as it was
-};
+// kReplaced, kReplacedModeNotSet or kFailed, as ReplaceFile (file_io.h) says.
+using JsonSaveResult = ReplaceResult;
 
 // Replaces the file at `path` with `value` rendered as an indented document: writes a temporary
 // file in the same directory, flushes it to disk, gives it `mode` and renames it over `path`, so

@@ -66,7 +66,7 @@ TEST_F(JsonIoTest, ToFileWritesMode0644WhateverTheUmask) {
   const std::string path = Dir() + "/a.conf";
   Json::Value v(Json::objectValue);
   v["k"] = true;
-  EXPECT_EQ(JsonToFile(v, path, 0644), JsonSaveResult::kSaved);
+  EXPECT_EQ(JsonToFile(v, path, 0644), JsonSaveResult::kReplaced);
   umask(old);
   EXPECT_EQ(testsupport::ModeOf(path), 0644);
   Json::Value back;
@@ -91,7 +91,7 @@ TEST_F(JsonIoTest, SaveReplacesASymbolicLinkInsteadOfWritingThroughIt) {
   testsupport::WriteFile(target, "keep");
   const std::string path = Dir() + "/x.conf";
   ASSERT_EQ(symlink(target.c_str(), path.c_str()), 0);
-  EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kSaved);
+  EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kReplaced);
   EXPECT_EQ(testsupport::ReadFile(target), "keep");
   EXPECT_EQ(testsupport::ReadFile(path), "{}\n");
 }
@@ -102,14 +102,14 @@ TEST_F(JsonIoTest, ReaderNeverSeesAPartialFileWhileAnotherProcessSaves) {
   for (int i = 0; i < 2000; ++i) {
     big["/photo/" + std::to_string(i)]["name"] = std::string(40, 'n');
   }
-  ASSERT_EQ(JsonToFile(big, path, 0644), JsonSaveResult::kSaved);
+  ASSERT_EQ(JsonToFile(big, path, 0644), JsonSaveResult::kReplaced);
 
   const pid_t writer = fork();
   if (writer == 0) {
     Json::Value doc = big;
     for (int i = 0; i < 60; ++i) {
       doc["/video/" + std::to_string(i)]["name"] = "v";
-      if (JsonToFile(doc, path, 0644) != JsonSaveResult::kSaved) {
+      if (JsonToFile(doc, path, 0644) != JsonSaveResult::kReplaced) {
         _exit(1);
       }
     }

@@ -1,44 +1,16 @@
-// The last-error slot, one per thread, and the file helpers of internal.h.
-#include <fcntl.h>
-#include <sys/stat.h>
-#include <unistd.h>
+// The last-error slot, one per thread, and the root prefix of the platform's own files.
 #include <wezo/platform.h>
 
-#include <cerrno>
 #include <cstdio>
 
 #include "fileindex/root.h"
 #include "internal.h"
-#include "unique_fd.h"
 
 namespace {
 
 thread_local int t_code = 0;
 thread_local int t_line = 0;
 thread_local char t_file[128] = "";
-
-bool WriteAll(int fd, const std::string& data) {
-  size_t done = 0;
-  while (done < data.size()) {
-    const ssize_t n = write(fd, data.data() + done, data.size() - done);
-    if (n < 0) {
-      if (errno == EINTR) {
-        continue;
-      }
-      return false;
-    }
-    done += static_cast<size_t>(n);
-  }
-  return true;
-}
-
-std::string DirectoryOf(const std::string& path) {
-  const size_t slash = path.rfind('/');
-  if (slash == std::string::npos) {
-    return ".";
-  }
-  return slash == 0 ? "/" : path.substr(0, slash);
-}
 
 }  // namespace
 
@@ -51,51 +23,6 @@ int Fail(int code, const char* file, int line) {
 }
 
 std::string Rooted(const char* fixedPath) { return FILEINDEX::GetRootPrefix() + fixedPath; }
-
-bool ReadWholeFile(const std::string& path, std::string& out) {
-  FILEINDEX::UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC));
-  if (!fd) {
-    return false;
-  }
-  std::string data;
-  char buffer[16384];
-  for (;;) {
-    const ssize_t n = read(fd.get(), buffer, sizeof buffer);
-    if (n < 0 && errno == EINTR) {
-      continue;
-    }
-    if (n < 0) {
-      return false;
-    }
-    if (n == 0) {
-      break;
-    }
-    data.append(buffer, static_cast<size_t>(n));
-  }
-  out.swap(data);
-  return true;
-}
-
-bool ReplaceFile(const std::string& path, const std::string& data, mode_t mode) {
-  std::string tmpPath = path + ".XXXXXX";
-  FILEINDEX::UniqueFd fd(mkostemp(tmpPath.data(), O_CLOEXEC));
-  if (!fd) {
-    return false;
-  }
-  if (fchmod(fd.get(), mode) != 0 || !WriteAll(fd.get(), data) || fsync(fd.get()) != 0 ||
-      fd.Close() != 0 || rename(tmpPath.c_str(), path.c_str()) != 0) {
-    const int saved = errno;
-    unlink(tmpPath.c_str());
-    errno = saved;
-    return false;
-  }
-  // The rename is durable only once the directory entry is on disk too.
-  FILEINDEX::UniqueFd dir(open(DirectoryOf(path).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (dir) {
-    fsync(dir.get());
-  }
-  return true;
-}
 
 }  // namespace PLATFORM
 }  // namespace WEZO

@@ -20,6 +20,7 @@
 #include <cstring>
 #include <sstream>
 
+#include "file_io.h"
 #include "internal.h"
 #include "unique_fd.h"
 
@@ -133,7 +134,7 @@ struct Mount {
 // The mount table of this process, read from proc/self/mountinfo under the root prefix.
 bool ReadMounts(std::vector<Mount>& mounts) {
   std::string text;
-  if (!WEZO::PLATFORM::ReadWholeFile(WEZO::PLATFORM::Rooted("/proc/self/mountinfo"), text)) {
+  if (!WEZO::FILEINDEX::ReadWholeFile(WEZO::PLATFORM::Rooted("/proc/self/mountinfo"), text)) {
     return false;
   }
   std::istringstream lines(text);

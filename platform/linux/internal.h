@@ -35,14 +35,6 @@ int Fail(int code, const char* file, int line);
 // The fixed absolute path `fixedPath` under the library's root prefix.
 std::string Rooted(const char* fixedPath);
 
-// Reads the whole file at `path` into `out`. Returns false with errno set on failure.
-bool ReadWholeFile(const std::string& path, std::string& out);
-
-// Replaces the file at `path` with `data`: a temporary file in the same directory is written,
-// flushed, given `mode` and renamed over `path`, then the directory is flushed. Returns false
-// with errno set, the old file untouched and the temporary file removed, on failure.
-bool ReplaceFile(const std::string& path, const std::string& data, mode_t mode);
-
 }  // namespace PLATFORM
 }  // namespace WEZO
 

@@ -5,6 +5,7 @@
 #include <cerrno>
 #include <string>
 
+#include "file_io.h"
 #include "internal.h"
 #include "smb_conf.h"
 
@@ -26,7 +27,7 @@ int WEZOSMBSetSpotlight(int fEnable) {
   const std::string path = WEZO::PLATFORM::SmbConfPath();
   std::string text;
   struct stat st {};
-  if (!WEZO::PLATFORM::ReadWholeFile(path, text) || stat(path.c_str(), &st) != 0) {
+  if (!WEZO::FILEINDEX::ReadWholeFile(path, text) || stat(path.c_str(), &st) != 0) {
     return PLATFORM_FAIL(errno == ENOENT ? kErrNotFound : kErrSystem);
   }
   WEZO::PLATFORM::SmbConf conf;
@@ -37,7 +38,9 @@ int WEZOSMBSetSpotlight(int fEnable) {
   if (changed == text) {
     return 0;
   }
-  if (!WEZO::PLATFORM::ReplaceFile(path, changed, st.st_mode & 07777)) {
+  // Content in place with another mode still is a switched setting; only a failed replace is not.
+  if (WEZO::FILEINDEX::ReplaceFile(path, changed, st.st_mode & 07777) ==
+      WEZO::FILEINDEX::ReplaceResult::kFailed) {
     return PLATFORM_FAIL(kErrSystem);
   }
   return 0;

@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <optional>
 
+#include "file_io.h"
 #include "internal.h"
 
 namespace WEZO {
@@ -219,7 +220,7 @@ std::string SmbConfPath() { return Rooted("/etc/samba/smb.conf"); }
 
 bool LoadSmbConf(SmbConf& conf) {
   std::string text;
-  if (!ReadWholeFile(SmbConfPath(), text)) {
+  if (!FILEINDEX::ReadWholeFile(SmbConfPath(), text)) {
     PLATFORM_FAIL(errno == ENOENT ? kErrNotFound : kErrSystem);
     return false;
   }

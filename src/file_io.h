@@ -1,0 +1,33 @@
+// Whole-file reading and atomic replacement, shared by the library's configuration files and the
+// generic-Linux platform's own files. Nothing here logs; on failure errno tells why.
+#ifndef FILEINDEX_SRC_FILE_IO_H_
+#define FILEINDEX_SRC_FILE_IO_H_
+
+#include <sys/types.h>
+
+#include <string>
+
+namespace WEZO {
+namespace FILEINDEX {
+
+// Reads the whole file at `path` (symbolic links followed) into `out`. Returns false with errno
+// set, `out` untouched, when it cannot be opened or read.
+bool ReadWholeFile(const std::string& path, std::string& out);
+
+enum class ReplaceResult {
+  kReplaced,           // the file holds `data` and has the requested mode
+  kReplacedModeNotSet,  // the file holds `data`, but its mode could not be set
+  kFailed,             // nothing was replaced; the old file, if any, is as it was
+};
+
+// Replaces the file at `path` with `data`: writes a temporary file in the same directory, flushes
+// it to disk, gives it `mode` and renames it over `path`, then flushes the directory. A reader
+// sees the old file or the new one, never a part of either; a symbolic link at `path` is replaced,
+// not written through. The temporary file is removed on every failure, errno kept. The directory
+// must exist.
+ReplaceResult ReplaceFile(const std::string& path, const std::string& data, mode_t mode);
+
+}  // namespace FILEINDEX
+}  // namespace WEZO
+
+#endif  // FILEINDEX_SRC_FILE_IO_H_
