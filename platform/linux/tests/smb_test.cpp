@@ -31,6 +31,7 @@ TEST_F(SpotlightTest, RewritesOnlyTheGlobalSpotlightValue) {
       {"[s]\n\tpath = /x", 0, "[s]\n\tpath = /x\n[global]\n\tspotlight = no\n"},
   };
   const std::string conf = At("etc/samba/smb.conf");
+  const bool haveTestparm = access("/usr/bin/testparm", X_OK) == 0;
   for (const auto& c : cases) {
     SCOPED_TRACE(c.before);
     Write("etc/samba/smb.conf", c.before, 0640);
@@ -44,10 +45,14 @@ TEST_F(SpotlightTest, RewritesOnlyTheGlobalSpotlightValue) {
                                        std::filesystem::directory_iterator());
     EXPECT_EQ(entries, 1) << "a temporary file was left behind";
     // Samba's own checker accepts the result, where Samba is installed.
-    if (access("/usr/bin/testparm", X_OK) == 0) {
+    if (haveTestparm) {
       const char* const argv[] = {"testparm", "-s", "--suppress-prompt", conf.c_str(), nullptr};
       EXPECT_EQ(WLIBCExecv("/usr/bin/testparm", argv, 1), 0);
     }
+  }
+  if (!haveTestparm) {
+    GTEST_SKIP() << "testparm (samba-common-bin) is not installed: Samba's acceptance of the "
+                    "rewritten files was not checked";
   }
 }
 
