@@ -1,7 +1,12 @@
 #include "smb_conf.h"
 
+#include <sys/stat.h>
+
 #include <cerrno>
+#include <ctime>
+#include <mutex>
 #include <optional>
+#include <utility>
 
 #include "file_io.h"
 #include "internal.h"
@@ -9,6 +14,27 @@
 namespace WEZO {
 namespace PLATFORM {
 namespace {
+
+// A parsed configuration file and the file's state when it was read.
+struct CachedConf {
+  std::string path;
+  dev_t dev;
+  ino_t ino;
+  off_t size;
+  struct timespec mtime;
+  SmbConf conf;
+
+  bool Describes(const std::string& filePath, const struct stat& st) const {
+    return path == filePath && dev == st.st_dev && ino == st.st_ino && size == st.st_size &&
+           mtime.tv_sec == st.st_mtim.tv_sec && mtime.tv_nsec == st.st_mtim.tv_nsec;
+  }
+};
+
+bool ChangedRecently(const struct stat& st) {
+  constexpr time_t kSettleSeconds = 2;
+  struct timespec now {};
+  return clock_gettime(CLOCK_REALTIME, &now) != 0 || now.tv_sec - st.st_mtim.tv_sec < kSettleSeconds;
+}
 
 // Samba's white space: isspace() without the newline, which ends a line.
 bool IsBlank(char c) { return c == ' ' || c == '\t' || c == '\r' || c == '\v' || c == '\f'; }
@@ -219,15 +245,44 @@ std::string WithSpotlight(const std::string& text, const SmbConf& conf, bool ena
 std::string SmbConfPath() { return Rooted("/etc/samba/smb.conf"); }
 
 bool LoadSmbConf(SmbConf& conf) {
-  std::string text;
-  if (!FILEINDEX::ReadWholeFile(SmbConfPath(), text)) {
+  // Every share lookup reads the configuration, and loading a full folder list looks up a share
+  // per folder, so the parsed file is kept while the file stays the same one with the same size
+  // and modification time.
+  static std::mutex mutex;
+  static std::optional<CachedConf> cache;
+
+  const std::string path = SmbConfPath();
+  struct stat st {};
+  if (stat(path.c_str(), &st) != 0) {
     PLATFORM_FAIL(errno == ENOENT ? kErrNotFound : kErrSystem);
     return false;
   }
-  if (!ParseSmbConf(text, conf)) {
+  {
+    const std::lock_guard<std::mutex> hold(mutex);
+    if (cache && cache->Describes(path, st)) {
+      conf = cache->conf;
+      return true;
+    }
+  }
+
+  std::string text;
+  if (!FILEINDEX::ReadWholeFile(path, text)) {
+    PLATFORM_FAIL(errno == ENOENT ? kErrNotFound : kErrSystem);
+    return false;
+  }
+  SmbConf parsed;
+  if (!ParseSmbConf(text, parsed)) {
     PLATFORM_FAIL(kErrBadConfig);
     return false;
   }
+  // The file's state was taken before reading it, so a change made meanwhile shows as a newer
+  // time on the next call. A change made within the same clock tick as the one before does not:
+  // a file changed in the last seconds is therefore read again every time.
+  if (!ChangedRecently(st)) {
+    const std::lock_guard<std::mutex> hold(mutex);
+    cache = CachedConf{path, st.st_dev, st.st_ino, st.st_size, st.st_mtim, parsed};
+  }
+  conf = std::move(parsed);
   return true;
 }
 

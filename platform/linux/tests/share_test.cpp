@@ -1,5 +1,8 @@
 #include <wezo/platform.h>
 
+#include <chrono>
+#include <cstdio>
+#include <filesystem>
 #include <string>
 
 #include "internal.h"
@@ -115,6 +118,33 @@ TEST_F(ShareTest, AShareOnAPlainFolderIsNotEncrypted) {
     EXPECT_EQ(WLIBShareIsEncryptionGet(share, &encryption) < 0 ? -1 : encryption, expected);
     WEZOShareFree(share);
   }
+}
+
+// A configuration that has settled is parsed once and kept; a new file in its place, or one of
+// another size, is read again even when it carries the same modification time.
+TEST_F(ShareTest, AKeptConfigurationFollowsEveryChangeOfTheFile) {
+  const std::string conf = At("etc/samba/smb.conf");
+  const auto settled = std::filesystem::file_time_type::clock::now() - std::chrono::hours(1);
+  const auto writeSettled = [&](const std::string& relative, const std::string& text) {
+    Write(relative, text);
+    std::filesystem::last_write_time(At(relative), settled);
+  };
+  const auto has = [](const char* name) {
+    PWEZOSHARE share = nullptr;
+    const bool found = WEZOShareGet(name, &share) == 0;
+    WEZOShareFree(share);
+    return found;
+  };
+  writeSettled("etc/samba/smb.conf", "[aaaa]\npath = /v/a\n");
+  ASSERT_TRUE(has("aaaa"));
+
+  writeSettled("etc/samba/next", "[bbbb]\npath = /v/b\n");  // same size, same time, new file
+  ASSERT_EQ(rename(At("etc/samba/next").c_str(), conf.c_str()), 0);
+  EXPECT_TRUE(has("bbbb"));
+  EXPECT_FALSE(has("aaaa"));
+
+  writeSettled("etc/samba/smb.conf", "[cc]\npath = /v/c\n");  // same file, rewritten in place
+  EXPECT_TRUE(has("cc"));
 }
 
 }  // namespace
