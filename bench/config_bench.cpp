@@ -41,7 +41,8 @@ class Root {
   explicit Root(int folders) {
     char pattern[] = "/tmp/fileindex-bench.XXXXXX";
     m_dir = mkdtemp(pattern);
-    for (const char* d : {"/tmp", "/usr", "/usr/wezo", "/usr/wezo/etc", "/usr/wezo/etc/fileindex"}) {
+    for (const char* d :
+         {"/tmp", "/usr", "/usr/wezo", "/usr/wezo/etc", "/usr/wezo/etc/fileindex"}) {
       mkdir((m_dir + d).c_str(), 0755);
     }
     WEZO::FILEINDEX::SetRootPrefix(m_dir);

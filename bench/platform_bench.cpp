@@ -37,9 +37,9 @@ class Root {
     }
     conf.close();
     // A configuration as it usually is: written some time ago.
-    std::filesystem::last_write_time(m_dir + "/etc/samba/smb.conf",
-                                     std::filesystem::last_write_time(m_dir + "/etc/samba/smb.conf") -
-                                         std::chrono::hours(1));
+    std::filesystem::last_write_time(
+        m_dir + "/etc/samba/smb.conf",
+        std::filesystem::last_write_time(m_dir + "/etc/samba/smb.conf") - std::chrono::hours(1));
     Json::Value list(Json::objectValue);
     for (int i = 0; i < folders; ++i) {
       list["/share" + std::to_string(i % 30) + "/" + std::to_string(i)]["photo"] = true;
@@ -69,8 +69,8 @@ BENCHMARK(BM_ShareGet);
 
 void BM_UnicodeCaseCompare(benchmark::State& state) {
   for (auto _ : state) {
-    benchmark::DoNotOptimize(
-        WLIBCUnicodeUTF8StrCaseCmp("Ferienfotos \xC3\x89t\xC3\xA9 2019", "ferienfotos \xC3\xA9T\xC3\xA9 2020"));
+    benchmark::DoNotOptimize(WLIBCUnicodeUTF8StrCaseCmp("Ferienfotos \xC3\x89t\xC3\xA9 2019",
+                                                        "ferienfotos \xC3\xA9T\xC3\xA9 2020"));
   }
 }
 BENCHMARK(BM_UnicodeCaseCompare);

@@ -21,8 +21,7 @@ namespace {
 
 // Names that are never indexed: the index's own database and queue, and system clutter.
 const std::array<std::string, 5> kSkipNames = {".TemporaryItems", "WEZO@.fileindexdb",
-                                                "WEZO@file_index_queue", ".WEZOPPSDB",
-                                                ".DS_Store"};
+                                               "WEZO@file_index_queue", ".WEZOPPSDB", ".DS_Store"};
 // Shares whose contents belong to other services and are never indexed.
 const std::array<std::string, 2> kExcludedShares = {"surveillance", "NetBackup"};
 

@@ -15,9 +15,9 @@ namespace FILEINDEX {
 bool ReadWholeFile(const std::string& path, std::string& out);
 
 enum class ReplaceResult {
-  kReplaced,           // the file holds `data` and has the requested mode
+  kReplaced,            // the file holds `data` and has the requested mode
   kReplacedModeNotSet,  // the file holds `data`, but its mode could not be set
-  kFailed,             // nothing was replaced; the old file, if any, is as it was
+  kFailed,              // nothing was replaced; the old file, if any, is as it was
 };
 
 // Replaces the file at `path` with `data`: writes a temporary file in the same directory, flushes

@@ -102,8 +102,8 @@ bool Status::ShareIsNoSpace(const std::string& share) const { return HasFlag(kNo
 
 bool Status::GetPauseInfo(long long& resumeTime) const {
   try {
-    resumeTime = m_jsRoot.get(kResumeTime, Json::Value(static_cast<Json::Int64>(kNotPaused)))
-                     .asInt64();
+    resumeTime =
+        m_jsRoot.get(kResumeTime, Json::Value(static_cast<Json::Int64>(kNotPaused))).asInt64();
   } catch (const std::exception&) {
     FILEINDEX_LOG("json exception");
     return false;

@@ -67,8 +67,8 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
        [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = fake::kRemoteFs; },
        false, "WEZOFSIsRemoteFS", nullptr},
       {"image file system", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = fake::kImageFs; },
-       false, "WEZOFSIsImageFS", nullptr},
+       [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = fake::kImageFs; }, false,
+       "WEZOFSIsImageFS", nullptr},
       {"never-indexed file system", "/photo/2019",
        [](fake::Platform& pf, const std::string& p) {
          pf.facts[p].fsType = WEZO_FSTYPE_NEVER_INDEXED;
@@ -81,20 +81,20 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
        [](fake::Platform&, const std::string&) { fake::Get().share_get_fails = true; }, false,
        "WEZOShareGet", "WEZOShareGet failed, share=photo"},
       {"excluded share", "/surveillance/cam", none, false, "WEZOShareGet", nullptr},
-      {"excluded names are case-sensitive", "/Surveillance/cam", none, true,
-       "WEZOFSDirIsMntPoint", nullptr},
+      {"excluded names are case-sensitive", "/Surveillance/cam", none, true, "WEZOFSDirIsMntPoint",
+       nullptr},
       {"encrypted share", "/photo/2019",
        [](fake::Platform& pf, const std::string&) { pf.shares["photo"].encrypted = true; }, false,
        "WLIBShareIsReadOnlyGet", nullptr},
       {"encryption query fails", "/photo/2019",
-       [](fake::Platform&, const std::string&) { fake::Get().encrypted_query_fails = true; },
-       false, "WLIBShareIsEncryptedGet", nullptr},
+       [](fake::Platform&, const std::string&) { fake::Get().encrypted_query_fails = true; }, false,
+       "WLIBShareIsEncryptedGet", nullptr},
       {"read-only share", "/photo/2019",
        [](fake::Platform& pf, const std::string&) { pf.shares["photo"].readOnly = true; }, false,
        "WLIBShareIsReadOnlyGet", nullptr},
       {"read-only query fails", "/photo/2019",
-       [](fake::Platform&, const std::string&) { fake::Get().read_only_query_fails = true; },
-       false, "WLIBShareIsReadOnlyGet", nullptr},
+       [](fake::Platform&, const std::string&) { fake::Get().read_only_query_fails = true; }, false,
+       "WLIBShareIsReadOnlyGet", nullptr},
       {"mount point", "/photo/2019",
        [](fake::Platform& pf, const std::string& p) { pf.facts[p].mountPoint = 1; }, false,
        "WLIBShareIsEncryptionGet", "Mount point[%s] is not allowed to be indexed"},
@@ -140,10 +140,10 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
     }
     EXPECT_EQ(ops.back(), c.decidingCall);
     EXPECT_EQ(fake::Get().openShareRecords, 0);
-    EXPECT_EQ(ErrorHandler::GetError(), c.logLine != nullptr &&
-                                                std::string(c.logLine).rfind("GetShare", 0) == 0
-                                            ? FILEINDEX_ERR_PATH
-                                            : FILEINDEX_ERR_NONE);
+    EXPECT_EQ(ErrorHandler::GetError(),
+              c.logLine != nullptr && std::string(c.logLine).rfind("GetShare", 0) == 0
+                  ? FILEINDEX_ERR_PATH
+                  : FILEINDEX_ERR_NONE);
     ErrorHandler::SetError(FILEINDEX_ERR_NONE);
     if (c.logLine == nullptr) {
       EXPECT_THAT(log.Lines(), IsEmpty());

@@ -59,8 +59,10 @@ class FoldersTest : public testsupport::LibraryTest {
 
 TEST_F(FoldersTest, FolderKeepsWhatTheObjectLacksAndStillReadsFieldsOfAnUnknownShare) {
   Folder folder;
-  ASSERT_TRUE(folder.Load("/photo/2019", ParseJson(R"({"name":"2019","audio":true,"photo":true})")));
-  ASSERT_TRUE(folder.Load("/photo/2019", ParseJson(R"({"audio":"false","video":1,"document":true})")));
+  ASSERT_TRUE(
+      folder.Load("/photo/2019", ParseJson(R"({"name":"2019","audio":true,"photo":true})")));
+  ASSERT_TRUE(
+      folder.Load("/photo/2019", ParseJson(R"({"audio":"false","video":1,"document":true})")));
   EXPECT_EQ(folder.asJson(), ParseJson(R"({"path":"/photo/2019","name":"2019","document":true,
                                        "audio":true,"video":false,"photo":true})"));
   EXPECT_EQ(folder.GetFullPath(), volume + "/photo/2019");
@@ -257,8 +259,7 @@ TEST_F(FoldersTest, ChangeReportsCompareWithTheSettingThatApplied) {
        Report(false, false, false, false)},
       {photoFolder, R"({"path":"/photo/2019","photo":true,"audio":true})", nullptr,
        Report(false, true, false, false)},
-      {photoFolder, R"({"path":"/video/x","photo":true})", nullptr,
-       Report(true, true, true, true)},
+      {photoFolder, R"({"path":"/video/x","photo":true})", nullptr, Report(true, true, true, true)},
       {photoFolder, R"({"path":"/photo","photo":false})", nullptr,
        Report(false, false, false, true)},
       {R"({"/photo":{"photo":true},"/photo/2019":{"photo":true}})", nullptr, "/photo/2019",

@@ -47,8 +47,15 @@ TEST_F(JsonIoTest, ToStringKeepsEveryValueOnOneLine) {
 }
 
 TEST_F(JsonIoTest, FromStringRefusesAnythingButOneWholeValue) {
-  const char* refused[] = {"", "{", R"({"event":65536,"path":"/v)", "{} x", "{}{}", "nul", "[1,]",
-                           R"({"a":1,"a":2})", "{} // note"};
+  const char* refused[] = {"",
+                           "{",
+                           R"({"event":65536,"path":"/v)",
+                           "{} x",
+                           "{}{}",
+                           "nul",
+                           "[1,]",
+                           R"({"a":1,"a":2})",
+                           "{} // note"};
   for (const char* text : refused) {
     Json::Value v("untouched");
     EXPECT_FALSE(JsonFromString(v, text)) << text;

@@ -81,14 +81,13 @@ TEST_F(StatusTest, NoSpaceNotifiesOncePerTransitionWithTheExactCommandLine) {
   auto runs = fake::Get().CallsTo("WLIBCExecv");
   ASSERT_EQ(runs.size(), 1U);
   const std::string tool = NotifyToolPath();
-  EXPECT_THAT(runs[0].args,
-              ElementsAre(tool, tool, "-e", "false", "-c", "WEZO.RKS.AdminCenter.Application",
-                          "@administrators", "fileindex:fileindex_title",
-                          "fileindex:notify_no_space",
-                          "<a data-wezo-app=\"WEZO.RKS.AdminCenter.Application\" "
-                          "data-wezo-fn=\"WEZO.RKS.AdminCenter.MediaIndex.Main\" "
-                          "data-wezo-tab=\"fileIndex\">",
-                          "</a>", "1"));
+  EXPECT_THAT(runs[0].args, ElementsAre(tool, tool, "-e", "false", "-c",
+                                        "WEZO.RKS.AdminCenter.Application", "@administrators",
+                                        "fileindex:fileindex_title", "fileindex:notify_no_space",
+                                        "<a data-wezo-app=\"WEZO.RKS.AdminCenter.Application\" "
+                                        "data-wezo-fn=\"WEZO.RKS.AdminCenter.MediaIndex.Main\" "
+                                        "data-wezo-tab=\"fileIndex\">",
+                                        "</a>", "1"));
 
   status.ShareSetNoSpace("photo", false);
   EXPECT_FALSE(status.ShareIsNoSpace("photo"));
@@ -120,8 +119,8 @@ TEST_F(StatusTest, ShareFlagsAreAddedAndRemovedByPresence) {
 TEST_F(StatusTest, MarkersReadAsBooleansWithoutThrowing) {
   Status status;
   LoadText(status, R"({"t":true,"f":false,"one":1,"zero":0,"text":"yes","obj":{},"null":null})");
-  const std::pair<const char*, bool> cases[] = {{"t", true},     {"f", false},    {"one", true},
-                                                {"zero", false}, {"text", false}, {"obj", false},
+  const std::pair<const char*, bool> cases[] = {{"t", true},     {"f", false},     {"one", true},
+                                                {"zero", false}, {"text", false},  {"obj", false},
                                                 {"null", false}, {"absent", false}};
   for (const auto& [key, expected] : cases) {
     EXPECT_EQ(status.IsUpdated(key), expected) << key;

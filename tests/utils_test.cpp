@@ -75,8 +75,8 @@ TEST_F(UtilsTest, FileTestsDoNotFollowSymbolicLinks) {
     bool isDir;
     bool isFile;
   } cases[] = {
-      {"/d", true, false},         {"/f", false, true},         {"/link-d", false, false},
-      {"/link-f", false, false},   {"/dangling", false, false}, {"/missing", false, false},
+      {"/d", true, false},       {"/f", false, true},         {"/link-d", false, false},
+      {"/link-f", false, false}, {"/dangling", false, false}, {"/missing", false, false},
       {"/fifo", false, false},
   };
   for (const Case& c : cases) {
@@ -89,8 +89,8 @@ TEST_F(UtilsTest, FileTestsDoNotFollowSymbolicLinks) {
 
 TEST_F(UtilsTest, JsonReadersTakeOnlyMembersOfTheirOwnType) {
   Json::Value obj;
-  ASSERT_TRUE(JsonFromString(
-      obj, R"({"s":"text","b":true,"n":5,"z":null,"sb":"true","one":1,"e":""})"));
+  ASSERT_TRUE(
+      JsonFromString(obj, R"({"s":"text","b":true,"n":5,"z":null,"sb":"true","one":1,"e":""})"));
   Json::Value array(Json::arrayValue);
   array.append("text");
 
@@ -100,8 +100,8 @@ TEST_F(UtilsTest, JsonReadersTakeOnlyMembersOfTheirOwnType) {
     bool isString;
     bool isBool;
   } cases[] = {
-      {"s", &obj, true, false},   {"e", &obj, true, false},     {"b", &obj, false, true},
-      {"n", &obj, false, false},  {"z", &obj, false, false},    {"sb", &obj, true, false},
+      {"s", &obj, true, false},    {"e", &obj, true, false},       {"b", &obj, false, true},
+      {"n", &obj, false, false},   {"z", &obj, false, false},      {"sb", &obj, true, false},
       {"one", &obj, false, false}, {"absent", &obj, false, false}, {"0", &array, false, false},
   };
   for (const Case& c : cases) {
@@ -148,8 +148,14 @@ TEST_F(UtilsTest, ShareNameIsTheFirstComponentOfASharePath) {
     const char* path;
     const char* name;
   } cases[] = {
-      {"/photo/2019", "photo"}, {"/photo", "photo"}, {"/photo/", "photo"}, {"/", ""},
-      {"/a", "a"},              {"/a/b/c", "a"},     {"photo/2019", "hoto"}, {"//x", ""},
+      {"/photo/2019", "photo"},
+      {"/photo", "photo"},
+      {"/photo/", "photo"},
+      {"/", ""},
+      {"/a", "a"},
+      {"/a/b/c", "a"},
+      {"photo/2019", "hoto"},
+      {"//x", ""},
   };
   for (const Case& c : cases) {
     std::string name = "old";
@@ -168,10 +174,8 @@ TEST_F(UtilsTest, FullPathTakesTheVolumeFromWhereTheShareLies) {
     const char* path;
     std::string full;
   } cases[] = {
-      {"/photo/2019", volume + "/photo/2019"},
-      {"/photo", volume + "/photo"},
-      {"/photo/", volume + "/photo/"},
-      {"/photo/a//b/../c", volume + "/photo/a//b/../c"},
+      {"/photo/2019", volume + "/photo/2019"}, {"/photo", volume + "/photo"},
+      {"/photo/", volume + "/photo/"},         {"/photo/a//b/../c", volume + "/photo/a//b/../c"},
       {"/flat/x", "flatshare/flat/x"},
   };
   for (const Case& c : cases) {
@@ -219,8 +223,8 @@ TEST_F(UtilsTest, ShareOfAFullPathComesFromTheShareDatabase) {
   EXPECT_EQ(name, "n");
   EXPECT_EQ(path, "p");
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_PATH);
-  EXPECT_THAT(log.Lines(), ElementsAre("utils:N WEZOShareNamePathGet failed, path=" + volume +
-                                       "/videos/a.mp4"));
+  EXPECT_THAT(log.Lines(),
+              ElementsAre("utils:N WEZOShareNamePathGet failed, path=" + volume + "/videos/a.mp4"));
 }
 
 TEST_F(UtilsTest, ReplaceShareNameSwapsOnlyTheFirstComponent) {
@@ -228,8 +232,9 @@ TEST_F(UtilsTest, ReplaceShareNameSwapsOnlyTheFirstComponent) {
     const char* path;
     const char* replaced;
   } cases[] = {
-      {"", ""},           {"/a", "/b"},         {"/a/", "/b/"}, {"/a/c/d", "/b/c/d"},
-      {"/", "/b"},        {"/photo/2019", "/b/2019"},
+      {"", ""},       {"/a", "/b"},
+      {"/a/", "/b/"}, {"/a/c/d", "/b/c/d"},
+      {"/", "/b"},    {"/photo/2019", "/b/2019"},
   };
   for (const Case& c : cases) {
     EXPECT_EQ(ReplaceShareName(c.path, "b"), c.replaced) << c.path;

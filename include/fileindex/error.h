@@ -13,7 +13,8 @@ namespace WEZO {
 namespace FILEINDEX {
 
 // The codes are part of the exported interface; their numbers never change.
-enum _tag_fileindex_err_ {  // NOLINT(bugprone-reserved-identifier,cert-dcl37-c,cert-dcl51-cpp)
+// NOLINTNEXTLINE(bugprone-reserved-identifier,cert-dcl37-c,cert-dcl51-cpp)
+enum _tag_fileindex_err_ {
   FILEINDEX_ERR_NONE = 0,               // no error recorded (initial value only)
   FILEINDEX_ERR_BAD_PARAM = 1,          // an argument is malformed, of the wrong type or unknown
   FILEINDEX_ERR_PATH = 2,               // a path, share name or share path could not be resolved

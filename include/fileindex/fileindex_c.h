@@ -18,7 +18,7 @@ extern "C" {
 /* The functions of this interface are declared here as they are added to the library. */
 
 #ifdef __cplusplus
-}  /* extern "C" */
+} /* extern "C" */
 #endif
 
 #endif /* FILEINDEX_FILEINDEX_C_H_ */

@@ -61,9 +61,8 @@ class FILEINDEX_EXPORT Folders : public Config {
   // having it. With `sort_direction` "DESC" the page holds the first entries of the ascending order
   // in reverse, as many as an ascending page at `offset` would hold; otherwise it holds up to
   // `limit` entries from `offset` on. An offset past the end gives an empty page. Always true.
-  bool List(Json::Value& out, unsigned long offset, unsigned long limit,
-            const std::string& sort_by, const std::string& sort_direction,
-            const Json::Value& additional) const;
+  bool List(Json::Value& out, unsigned long offset, unsigned long limit, const std::string& sort_by,
+            const std::string& sort_direction, const Json::Value& additional) const;
 
   // Stores the JSON form of the folder at share path `path` in `out`. Returns false with
   // FILEINDEX_ERR_NO_SUCH_FOLDER (logged) when the list has no such folder.

@@ -35,8 +35,7 @@ int Spawn(const char* path, const char* const argv[]) {
 
   pid_t pid = -1;
   // posix_spawn does not write to argv; its prototype only predates const.
-  const int rc =
-      posix_spawn(&pid, path, nullptr, &attr, const_cast<char* const*>(argv), environ);
+  const int rc = posix_spawn(&pid, path, nullptr, &attr, const_cast<char* const*>(argv), environ);
   posix_spawnattr_destroy(&attr);
   if (rc != 0) {
     return PLATFORM_FAIL(rc == ENOENT ? kErrNotFound : kErrProgram);
@@ -109,9 +108,7 @@ int WLIBCExecv(const char* szPath, const char* const argv[], int /*flags*/) {
   return Spawn(szPath, argv);
 }
 
-int WLIBServiceStart(const char* szService, int /*flags*/) {
-  return Systemctl("start", szService);
-}
+int WLIBServiceStart(const char* szService, int /*flags*/) { return Systemctl("start", szService); }
 
 int WLIBServiceStop(const char* szService, int /*flags*/) { return Systemctl("stop", szService); }
 

@@ -4,9 +4,9 @@
 #include <linux/magic.h>
 #include <linux/quota.h>
 #include <sys/ioctl.h>
-#include <sys/syscall.h>
 #include <sys/stat.h>
 #include <sys/statvfs.h>
+#include <sys/syscall.h>
 #include <sys/sysmacros.h>
 #include <sys/vfs.h>
 #include <unistd.h>
@@ -15,10 +15,10 @@
 #include <cerrno>
 #include <climits>
 #include <cstdlib>
-#include <string>
-#include <vector>
 #include <cstring>
 #include <sstream>
+#include <string>
+#include <vector>
 
 #include "file_io.h"
 #include "internal.h"
@@ -72,39 +72,60 @@ constexpr unsigned long kMqueueMagic = 0x19800202UL;
 constexpr unsigned long kFuseCtlMagic = 0x65735543UL;
 
 constexpr MagicCode kMagicCodes[] = {
-    {EXT4_SUPER_MAGIC, kExt},         {BTRFS_SUPER_MAGIC, kBtrfs},
-    {XFS_SUPER_MAGIC, kXfs},          {kZfsMagic, kZfs},
-    {F2FS_SUPER_MAGIC, kF2fs},        {MSDOS_SUPER_MAGIC, kFat},
-    {EXFAT_SUPER_MAGIC, kExfat},      {kNtfsMagic, kNtfs},
-    {kHfsMagic, kHfs},                {kHfsPlusMagic, kHfs},
-    {TMPFS_MAGIC, kTmpfs},            {RAMFS_MAGIC, kTmpfs},
-    {OVERLAYFS_SUPER_MAGIC, kOverlay}, {ECRYPTFS_SUPER_MAGIC, kEcryptfs},
+    {EXT4_SUPER_MAGIC, kExt},
+    {BTRFS_SUPER_MAGIC, kBtrfs},
+    {XFS_SUPER_MAGIC, kXfs},
+    {kZfsMagic, kZfs},
+    {F2FS_SUPER_MAGIC, kF2fs},
+    {MSDOS_SUPER_MAGIC, kFat},
+    {EXFAT_SUPER_MAGIC, kExfat},
+    {kNtfsMagic, kNtfs},
+    {kHfsMagic, kHfs},
+    {kHfsPlusMagic, kHfs},
+    {TMPFS_MAGIC, kTmpfs},
+    {RAMFS_MAGIC, kTmpfs},
+    {OVERLAYFS_SUPER_MAGIC, kOverlay},
+    {ECRYPTFS_SUPER_MAGIC, kEcryptfs},
     {kBcachefsMagic, kBcachefs},
     // Kernel interfaces that look like file systems: never indexed.
-    {PROC_SUPER_MAGIC, kPseudo},      {SYSFS_MAGIC, kPseudo},
-    {DEVPTS_SUPER_MAGIC, kPseudo},    {CGROUP_SUPER_MAGIC, kPseudo},
-    {CGROUP2_SUPER_MAGIC, kPseudo},   {DEBUGFS_MAGIC, kPseudo},
-    {TRACEFS_MAGIC, kPseudo},         {SECURITYFS_MAGIC, kPseudo},
-    {PSTOREFS_MAGIC, kPseudo},        {BPF_FS_MAGIC, kPseudo},
-    {kConfigfsMagic, kPseudo},        {kMqueueMagic, kPseudo},
-    {HUGETLBFS_MAGIC, kPseudo},       {AUTOFS_SUPER_MAGIC, kPseudo},
-    {BINFMTFS_MAGIC, kPseudo},        {EFIVARFS_MAGIC, kPseudo},
-    {kFuseCtlMagic, kPseudo},         {NSFS_MAGIC, kPseudo},
+    {PROC_SUPER_MAGIC, kPseudo},
+    {SYSFS_MAGIC, kPseudo},
+    {DEVPTS_SUPER_MAGIC, kPseudo},
+    {CGROUP_SUPER_MAGIC, kPseudo},
+    {CGROUP2_SUPER_MAGIC, kPseudo},
+    {DEBUGFS_MAGIC, kPseudo},
+    {TRACEFS_MAGIC, kPseudo},
+    {SECURITYFS_MAGIC, kPseudo},
+    {PSTOREFS_MAGIC, kPseudo},
+    {BPF_FS_MAGIC, kPseudo},
+    {kConfigfsMagic, kPseudo},
+    {kMqueueMagic, kPseudo},
+    {HUGETLBFS_MAGIC, kPseudo},
+    {AUTOFS_SUPER_MAGIC, kPseudo},
+    {BINFMTFS_MAGIC, kPseudo},
+    {EFIVARFS_MAGIC, kPseudo},
+    {kFuseCtlMagic, kPseudo},
+    {NSFS_MAGIC, kPseudo},
     {SELINUX_MAGIC, kPseudo},
     // Network file systems.
-    {NFS_SUPER_MAGIC, kNfs},          {SMB_SUPER_MAGIC, kSmb},
-    {CIFS_SUPER_MAGIC, kSmb},         {SMB2_SUPER_MAGIC, kSmb},
-    {V9FS_MAGIC, k9p},                {CEPH_SUPER_MAGIC, kCeph},
+    {NFS_SUPER_MAGIC, kNfs},
+    {SMB_SUPER_MAGIC, kSmb},
+    {CIFS_SUPER_MAGIC, kSmb},
+    {SMB2_SUPER_MAGIC, kSmb},
+    {V9FS_MAGIC, k9p},
+    {CEPH_SUPER_MAGIC, kCeph},
     // Disk images.
-    {ISOFS_SUPER_MAGIC, kIso9660},    {UDF_SUPER_MAGIC, kUdf},
-    {SQUASHFS_MAGIC, kSquashfs},      {EROFS_SUPER_MAGIC_V1, kErofs},
+    {ISOFS_SUPER_MAGIC, kIso9660},
+    {UDF_SUPER_MAGIC, kUdf},
+    {SQUASHFS_MAGIC, kSquashfs},
+    {EROFS_SUPER_MAGIC_V1, kErofs},
     {CRAMFS_MAGIC, kErofs},
 };
 
 // FUSE file systems whose data lives on another machine, by their mount table subtype.
 constexpr const char* kRemoteFuseTypes[] = {
-    "sshfs", "rclone", "s3fs", "gcsfuse", "glusterfs", "ceph-fuse", "curlftpfs",
-    "smbnetfs", "davfs", "goofys", "juicefs", "afpfs", "webdavfs",
+    "sshfs",    "rclone", "s3fs",   "gcsfuse", "glusterfs", "ceph-fuse", "curlftpfs",
+    "smbnetfs", "davfs",  "goofys", "juicefs", "afpfs",     "webdavfs",
 };
 
 bool IsOctal(char c) { return c >= '0' && c <= '7'; }

@@ -61,8 +61,8 @@ std::string EntryPath(const std::string& queuePath, const std::string& client,
 bool MakeFolders(const std::string& client) {
   const std::string root = WEZO::PLATFORM::Rooted("");
   std::string path = root;
-  for (const std::string& part : {std::string("var"), std::string("lib"),
-                                  std::string("wezotifyd"), client}) {
+  for (const std::string& part :
+       {std::string("var"), std::string("lib"), std::string("wezotifyd"), client}) {
     path += "/" + part;
     if (mkdir(path.c_str(), 0755) != 0 && errno != EEXIST) {
       return false;
@@ -89,8 +89,7 @@ bool MonitorQueue::Upsert(const MonitorQueue& entry, const std::string& client, 
   return true;
 }
 
-bool MonitorQueue::Delete(const std::string& queuePath, const std::string& client,
-                          QueueType type) {
+bool MonitorQueue::Delete(const std::string& queuePath, const std::string& client, QueueType type) {
   const std::string path = EntryPath(queuePath, client, type);
   if (path.empty()) {
     return false;

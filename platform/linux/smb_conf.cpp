@@ -33,7 +33,8 @@ struct CachedConf {
 bool ChangedRecently(const struct stat& st) {
   constexpr time_t kSettleSeconds = 2;
   struct timespec now {};
-  return clock_gettime(CLOCK_REALTIME, &now) != 0 || now.tv_sec - st.st_mtim.tv_sec < kSettleSeconds;
+  return clock_gettime(CLOCK_REALTIME, &now) != 0 ||
+         now.tv_sec - st.st_mtim.tv_sec < kSettleSeconds;
 }
 
 // Samba's white space: isspace() without the newline, which ends a line.
@@ -168,9 +169,8 @@ bool ParseSmbConf(const std::string& text, SmbConf& conf) {
     }
     if (logical[0] == '[') {
       const size_t close = logical.find(']');
-      const std::string name = SectionName(logical.substr(1, close == std::string::npos
-                                                                 ? std::string::npos
-                                                                 : close - 1));
+      const std::string name = SectionName(
+          logical.substr(1, close == std::string::npos ? std::string::npos : close - 1));
       const std::string key = Key(name);
       if (key == "global") {
         current = &global;
@@ -219,7 +219,8 @@ bool ParseSmbConf(const std::string& text, SmbConf& conf) {
     if (s.key == "homes" || s.key == "printers" || !s.path || s.path->empty()) {
       continue;
     }
-    out.shares.push_back(SmbShare{s.name, TrimSlashes(*s.path), s.readOnly.value_or(defaultReadOnly)});
+    out.shares.push_back(
+        SmbShare{s.name, TrimSlashes(*s.path), s.readOnly.value_or(defaultReadOnly)});
   }
   conf = std::move(out);
   return true;

@@ -38,10 +38,9 @@ int WLIBCUnicodeUTF8StrCaseCmp(const char* szA, const char* szB) {
   }
   // Code point order, so that text that differs beyond case sorts as its UTF-8 bytes do.
   UErrorCode err = U_ZERO_ERROR;
-  const int32_t result =
-      u_strCaseCompare(a.data(), static_cast<int32_t>(a.size()), b.data(),
-                       static_cast<int32_t>(b.size()),
-                       U_FOLD_CASE_DEFAULT | U_COMPARE_CODE_POINT_ORDER, &err);
+  const int32_t result = u_strCaseCompare(a.data(), static_cast<int32_t>(a.size()), b.data(),
+                                          static_cast<int32_t>(b.size()),
+                                          U_FOLD_CASE_DEFAULT | U_COMPARE_CODE_POINT_ORDER, &err);
   return U_SUCCESS(err) ? result : std::strcmp(szA, szB);
 }
 

@@ -161,8 +161,8 @@ int WLIBShareIsEncryptionGet(const WEZOSHARE* pShare, int* pfEncryption) {
 }
 
 int WLIBShareIsReadOnlyGet(const WEZOSHARE* pShare, int* pfReadOnly) {
-  return fake::FlagQuery("WLIBShareIsReadOnlyGet", pShare, pfReadOnly,
-                         Get().read_only_query_fails, &fake::Share::readOnly);
+  return fake::FlagQuery("WLIBShareIsReadOnlyGet", pShare, pfReadOnly, Get().read_only_query_fails,
+                         &fake::Share::readOnly);
 }
 
 int WEZOShareIsShareRecycle(const char* szFullPath) {
@@ -296,8 +296,7 @@ namespace WEZO {
 namespace WEZOTIFYD {
 
 bool MonitorQueue::Upsert(const MonitorQueue& entry, const std::string& client, QueueType type) {
-  Record("MonitorQueue::Upsert",
-         {fake::OneLine(entry.Entry()), client, std::to_string(type)});
+  Record("MonitorQueue::Upsert", {fake::OneLine(entry.Entry()), client, std::to_string(type)});
   if (Get().monitor_upsert_fails) {
     fake::Fail(__LINE__);
     return false;
@@ -306,8 +305,7 @@ bool MonitorQueue::Upsert(const MonitorQueue& entry, const std::string& client, 
   return true;
 }
 
-bool MonitorQueue::Delete(const std::string& queuePath, const std::string& client,
-                          QueueType type) {
+bool MonitorQueue::Delete(const std::string& queuePath, const std::string& client, QueueType type) {
   Record("MonitorQueue::Delete", {queuePath, client, std::to_string(type)});
   if (Get().monitor_delete_fails) {
     fake::Fail(__LINE__);

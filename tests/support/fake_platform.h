@@ -48,17 +48,17 @@ struct Call {
 
 struct Platform {
   // ---- state ----
-  std::map<std::string, Share> shares;       // by name
-  std::map<std::string, PathFacts> facts;    // by exact full path
-  PathFacts defaultFacts;                    // for every other path
+  std::map<std::string, Share> shares;     // by name
+  std::map<std::string, PathFacts> facts;  // by exact full path
+  PathFacts defaultFacts;                  // for every other path
   std::set<int> remoteTypes{kRemoteFs};
   std::set<int> imageTypes{kImageFs};
   std::set<std::string> hiddenDirNames{"@eaDir"};
   bool quotaEnough = true;
-  int quotaError = 0;                        // last error left by a "not enough" answer
-  std::map<std::string, bool> running;       // services by name
-  int spotlight = 0;                         // 1 on, 0 off
-  int execResult = 0;                        // what WLIBCExec and WLIBCExecv return
+  int quotaError = 0;                   // last error left by a "not enough" answer
+  std::map<std::string, bool> running;  // services by name
+  int spotlight = 0;                    // 1 on, 0 off
+  int execResult = 0;                   // what WLIBCExec and WLIBCExecv return
   // Monitor registrations by client, then queue path.
   std::map<std::string, std::map<std::string, Json::Value>> monitor;
 

@@ -52,8 +52,8 @@ void MakeDirs(const std::string& path) {
 
 Sandbox::Sandbox() {
   const char* tmp = std::getenv("TMPDIR");
-  std::string pattern = std::string(tmp != nullptr && *tmp != '\0' ? tmp : "/tmp") +
-                        "/fileindex-test.XXXXXX";
+  std::string pattern =
+      std::string(tmp != nullptr && *tmp != '\0' ? tmp : "/tmp") + "/fileindex-test.XXXXXX";
   if (mkdtemp(pattern.data()) == nullptr) {
     ADD_FAILURE() << "mkdtemp failed";
     return;
@@ -85,8 +85,8 @@ std::vector<std::string> LogCapture::Lines() const {
   static const std::regex lineNumber("^((?:priority=\\d+ )?[a-z_]+):[1-9][0-9]* ");
   std::vector<std::string> out;
   for (const std::string& line : Captured()) {
-    out.push_back(std::regex_replace(line, lineNumber, "$1:N ",
-                                     std::regex_constants::format_first_only));
+    out.push_back(
+        std::regex_replace(line, lineNumber, "$1:N ", std::regex_constants::format_first_only));
   }
   return out;
 }

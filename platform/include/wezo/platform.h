@@ -37,7 +37,8 @@ extern "C" {
 
 /* One shared folder. Obtained from WEZOShareGet and released with WEZOShareFree; the library
  * reads szName and szPath and hands the record back to the WLIBShareIs... queries. */
-typedef struct _tag_WEZOSHARE { /* NOLINT(bugprone-reserved-identifier) */
+/* NOLINTNEXTLINE(bugprone-reserved-identifier) */
+typedef struct _tag_WEZOSHARE {
   char szName[WEZO_SHARE_NAME_MAX]; /* the share's name, "photo" */
   char szPath[WEZO_SHARE_PATH_MAX]; /* the share's own full path, "/volume1/photo" */
   void* pPrivate;                   /* the implementation's own data; the library never reads it */

@@ -18,8 +18,8 @@ TEST_F(ExecTest, OnlyAProgramThatExitsWithZeroSucceeds) {
     std::string program;
     bool succeeds;
   } cases[] = {
-      {"/bin/true", true}, {"/bin/false", false}, {At("exit3"), false},
-      {At("killed"), false}, {At("plain"), false}, {At("missing"), false},
+      {"/bin/true", true},   {"/bin/false", false}, {At("exit3"), false},
+      {At("killed"), false}, {At("plain"), false},  {At("missing"), false},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.program);

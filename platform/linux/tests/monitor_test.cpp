@@ -45,7 +45,10 @@ TEST_F(MonitorTest, RefusesWhatCannotBeARegistrationFile) {
     std::string queue;
     std::string client;
   } cases[] = {
-      {"/q", ""}, {"/q", "a/b"}, {"/q", ".."}, {"/q", std::string("a\0b", 3)},
+      {"/q", ""},
+      {"/q", "a/b"},
+      {"/q", ".."},
+      {"/q", std::string("a\0b", 3)},
       {std::string(100, '/'), "c"},
   };
   for (const auto& c : cases) {

@@ -62,12 +62,18 @@ TEST_F(ShareTest, FindsTheDeepestShareHoldingAPathAndItsFolders) {
     int recycle;
     int snapshot;
   } cases[] = {
-      {"/volume1/photo", "photo", 0, 0},           {"/volume1/photo/2019/x", "photo2019", 0, 0},
-      {"/volume1/photo/20190", "photo", 0, 0},     {"/volume1/photos/x", "photos", 0, 0},
-      {"/volume1/pho", nullptr, 0, 0},             {"/volume1", nullptr, 0, 0},
-      {"/volume1/photo/#recycle", "photo", 1, 0},  {"/volume1/photo/#recycle/a", "photo", 1, 0},
-      {"/volume1/photo/#snapshot/x", "photo", 0, 1}, {"/volume1/photo/#recycle-x", "photo", 0, 0},
-      {"/volume1/photo/a/#recycle", "photo", 0, 0}, {"/elsewhere/#snapshot", nullptr, 0, 0},
+      {"/volume1/photo", "photo", 0, 0},
+      {"/volume1/photo/2019/x", "photo2019", 0, 0},
+      {"/volume1/photo/20190", "photo", 0, 0},
+      {"/volume1/photos/x", "photos", 0, 0},
+      {"/volume1/pho", nullptr, 0, 0},
+      {"/volume1", nullptr, 0, 0},
+      {"/volume1/photo/#recycle", "photo", 1, 0},
+      {"/volume1/photo/#recycle/a", "photo", 1, 0},
+      {"/volume1/photo/#snapshot/x", "photo", 0, 1},
+      {"/volume1/photo/#recycle-x", "photo", 0, 0},
+      {"/volume1/photo/a/#recycle", "photo", 0, 0},
+      {"/elsewhere/#snapshot", nullptr, 0, 0},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.full);
@@ -107,7 +113,8 @@ TEST_F(ShareTest, AMissingOrInvalidConfigurationIsAFailure) {
 
 TEST_F(ShareTest, AShareOnAPlainFolderIsNotEncrypted) {
   Write("data/file", "");
-  Write("etc/samba/smb.conf", "[data]\npath = " + At("data") + "\n[gone]\npath = " + At("x") + "\n");
+  Write("etc/samba/smb.conf",
+        "[data]\npath = " + At("data") + "\n[gone]\npath = " + At("x") + "\n");
   for (const char* name : {"data", "gone"}) {
     PWEZOSHARE share = nullptr;
     ASSERT_EQ(WEZOShareGet(name, &share), 0);

@@ -15,17 +15,19 @@ TEST(TextTest, ComparesUtf8WithUnicodeCaseFolding) {
     int sign;
   } cases[] = {
       {"abc", "ABC", 0},
-      {"\xC3\x89t\xC3\xA9", "\xC3\xA9T\xC3\x89", 0},        // Été, éTÉ
-      {"Stra\xC3\x9F" "e", "STRASSE", 0},                    // Straße: full folding
-      {"\xCE\xA3\xCE\xA3", "\xCF\x83\xCF\x82", 0},           // ΣΣ, σς
+      {"\xC3\x89t\xC3\xA9", "\xC3\xA9T\xC3\x89", 0},  // Été, éTÉ
+      {"Stra\xC3\x9F"
+       "e",
+       "STRASSE", 0},                               // Straße: full folding
+      {"\xCE\xA3\xCE\xA3", "\xCF\x83\xCF\x82", 0},  // ΣΣ, σς
       {"a", "B", -1},
       {"ab", "A", 1},
-      {"z", "\xC3\xA9", -1},                                 // code point order
-      {"\xEF\xBC\xA1", "\xF0\x9F\x98\x80", -1},              // U+FF21 before U+1F600
-      {"A\xFF", "a\xFF", -1},                                // invalid: bytes, 'A' < 'a'
-      {"\xC3", "\xC3\xA9", -1},                              // truncated sequence
-      {"\xED\xA0\x80", "\xED\xA0\x80", 0},                   // encoded surrogate
-      {"\xC0\xAF", "/", 1},                                  // overlong "/" is not "/"
+      {"z", "\xC3\xA9", -1},                     // code point order
+      {"\xEF\xBC\xA1", "\xF0\x9F\x98\x80", -1},  // U+FF21 before U+1F600
+      {"A\xFF", "a\xFF", -1},                    // invalid: bytes, 'A' < 'a'
+      {"\xC3", "\xC3\xA9", -1},                  // truncated sequence
+      {"\xED\xA0\x80", "\xED\xA0\x80", 0},       // encoded surrogate
+      {"\xC0\xAF", "/", 1},                      // overlong "/" is not "/"
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(std::string(c.a) + " vs " + c.b);
