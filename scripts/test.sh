@@ -17,3 +17,4 @@ cmake --build build-sanitize -j"$jobs"
 ctest --test-dir build-sanitize -j"$jobs" --output-on-failure
 
 build/bench/fileindex_bench --benchmark_min_time=0.01 >/dev/null
+build/bench/fileindex_platform_bench --benchmark_min_time=0.01 >/dev/null
