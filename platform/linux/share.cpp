@@ -53,11 +53,14 @@ const SmbShare* ShareNamed(const SmbConf& conf, const char* name) {
 // Whether `full` is the folder `folder` at the root of the share that holds it, or lies below it.
 // Returns -1, with the last error set, when the share database cannot be read.
 int InShareFolder(const char* full, const char* folder) {
-  SmbConf conf;
-  if (full == nullptr || !WEZO::PLATFORM::LoadSmbConf(conf)) {
-    return full == nullptr ? PLATFORM_FAIL(WLIBC_ERR_BAD_PARAMETERS) : -1;
+  if (full == nullptr) {
+    return PLATFORM_FAIL(WLIBC_ERR_BAD_PARAMETERS);
   }
-  const SmbShare* share = ShareHolding(conf, full);
+  const auto conf = WEZO::PLATFORM::LoadSmbConf();
+  if (!conf) {
+    return -1;
+  }
+  const SmbShare* share = ShareHolding(*conf, full);
   if (share == nullptr) {
     return 0;
   }
@@ -91,11 +94,11 @@ int WEZOShareGet(const char* szName, PWEZOSHARE* ppShare) {
   if (szName == nullptr || ppShare == nullptr) {
     return PLATFORM_FAIL(WLIBC_ERR_BAD_PARAMETERS);
   }
-  SmbConf conf;
-  if (!WEZO::PLATFORM::LoadSmbConf(conf)) {
+  const auto conf = WEZO::PLATFORM::LoadSmbConf();
+  if (!conf) {
     return -1;
   }
-  const SmbShare* share = ShareNamed(conf, szName);
+  const SmbShare* share = ShareNamed(*conf, szName);
   if (share == nullptr) {
     return PLATFORM_FAIL(kErrNotFound);
   }
@@ -120,11 +123,11 @@ int WEZOShareNamePathGet(const char* szFullPath, char* szShareName, int cbShareN
       cbShareName <= 0 || cbSharePath <= 0) {
     return PLATFORM_FAIL(WLIBC_ERR_BAD_PARAMETERS);
   }
-  SmbConf conf;
-  if (!WEZO::PLATFORM::LoadSmbConf(conf)) {
+  const auto conf = WEZO::PLATFORM::LoadSmbConf();
+  if (!conf) {
     return -1;
   }
-  const SmbShare* share = ShareHolding(conf, szFullPath);
+  const SmbShare* share = ShareHolding(*conf, szFullPath);
   if (share == nullptr) {
     return PLATFORM_FAIL(kErrNotFound);
   }
@@ -147,11 +150,11 @@ int WLIBShareIsReadOnlyGet(const WEZOSHARE* pShare, int* pfReadOnly) {
   if (pShare == nullptr || pfReadOnly == nullptr) {
     return PLATFORM_FAIL(WLIBC_ERR_BAD_PARAMETERS);
   }
-  SmbConf conf;
-  if (!WEZO::PLATFORM::LoadSmbConf(conf)) {
+  const auto conf = WEZO::PLATFORM::LoadSmbConf();
+  if (!conf) {
     return -1;
   }
-  const SmbShare* share = ShareNamed(conf, pShare->szName);
+  const SmbShare* share = ShareNamed(*conf, pShare->szName);
   if (share == nullptr) {
     return PLATFORM_FAIL(kErrNotFound);
   }

@@ -16,11 +16,11 @@ using WEZO::PLATFORM::kErrSystem;
 extern "C" {
 
 int WEZOSMBIsEnableSpotlight(void) {
-  WEZO::PLATFORM::SmbConf conf;
-  if (!WEZO::PLATFORM::LoadSmbConf(conf)) {
+  const auto conf = WEZO::PLATFORM::LoadSmbConf();
+  if (!conf) {
     return -1;
   }
-  return conf.spotlight ? 1 : 0;
+  return conf->spotlight ? 1 : 0;
 }
 
 int WEZOSMBSetSpotlight(int fEnable) {

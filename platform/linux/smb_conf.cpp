@@ -4,6 +4,7 @@
 
 #include <cerrno>
 #include <ctime>
+#include <memory>
 #include <mutex>
 #include <optional>
 #include <utility>
@@ -22,7 +23,7 @@ struct CachedConf {
   ino_t ino;
   off_t size;
   struct timespec mtime;
-  SmbConf conf;
+  std::shared_ptr<const SmbConf> conf;  // shared with the callers, never changed
 
   bool Describes(const std::string& filePath, const struct stat& st) const {
     return path == filePath && dev == st.st_dev && ino == st.st_ino && size == st.st_size &&
@@ -245,7 +246,7 @@ std::string WithSpotlight(const std::string& text, const SmbConf& conf, bool ena
 
 std::string SmbConfPath() { return Rooted("/etc/samba/smb.conf"); }
 
-bool LoadSmbConf(SmbConf& conf) {
+std::shared_ptr<const SmbConf> LoadSmbConf() {
   // Every share lookup reads the configuration, and loading a full folder list looks up a share
   // per folder, so the parsed file is kept while the file stays the same one with the same size
   // and modification time.
@@ -256,25 +257,24 @@ bool LoadSmbConf(SmbConf& conf) {
   struct stat st {};
   if (stat(path.c_str(), &st) != 0) {
     PLATFORM_FAIL(errno == ENOENT ? kErrNotFound : kErrSystem);
-    return false;
+    return nullptr;
   }
   {
     const std::lock_guard<std::mutex> hold(mutex);
     if (cache && cache->Describes(path, st)) {
-      conf = cache->conf;
-      return true;
+      return cache->conf;
     }
   }
 
   std::string text;
   if (!FILEINDEX::ReadWholeFile(path, text)) {
     PLATFORM_FAIL(errno == ENOENT ? kErrNotFound : kErrSystem);
-    return false;
+    return nullptr;
   }
-  SmbConf parsed;
-  if (!ParseSmbConf(text, parsed)) {
+  auto parsed = std::make_shared<SmbConf>();
+  if (!ParseSmbConf(text, *parsed)) {
     PLATFORM_FAIL(kErrBadConfig);
-    return false;
+    return nullptr;
   }
   // The file's state was taken before reading it, so a change made meanwhile shows as a newer
   // time on the next call. A change made within the same clock tick as the one before does not:
@@ -283,8 +283,7 @@ bool LoadSmbConf(SmbConf& conf) {
     const std::lock_guard<std::mutex> hold(mutex);
     cache = CachedConf{path, st.st_dev, st.st_ino, st.st_size, st.st_mtim, parsed};
   }
-  conf = std::move(parsed);
-  return true;
+  return parsed;
 }
 
 }  // namespace PLATFORM

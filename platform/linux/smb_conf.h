@@ -10,6 +10,7 @@
 #define WEZO_PLATFORM_LINUX_SMB_CONF_H_
 
 #include <cstddef>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -43,9 +44,9 @@ std::string WithSpotlight(const std::string& text, const SmbConf& conf, bool ena
 // The path of the configuration file under the root prefix.
 std::string SmbConfPath();
 
-// Reads and parses the configuration file. Returns false, with the last error set, when the
-// file cannot be read or does not parse.
-bool LoadSmbConf(SmbConf& conf);
+// The parsed configuration file; null, with the last error set, when the file cannot be read or
+// does not parse. The parse is shared and kept while the file is unchanged; it is never changed.
+std::shared_ptr<const SmbConf> LoadSmbConf();
 
 }  // namespace PLATFORM
 }  // namespace WEZO
