@@ -1,0 +1,45 @@
+// The two readers of a share's event queue (fileindex/queue.h): whether a reindex of a path is
+// queued, and whether any event falls inside a folder.
+//
+// Queue files grow to millions of lines and are read on every progress report, so the readers
+// read in large blocks and parse a line only when its text can hold an answer. Their answers are
+// exactly those of parsing every line: a line that does not parse, is not an object, lacks
+// "event" or "path", has an "event" that is not convertible to an unsigned integer or a "path"
+// that is not a string counts as no event. A last line without "\n" (a writer still busy) is
+// read like any other line. Neither reader locks the file. Reentrant.
+#ifndef FILEINDEX_SRC_QUEUE_READER_H_
+#define FILEINDEX_SRC_QUEUE_READER_H_
+
+#include <cstddef>
+#include <string>
+
+namespace WEZO {
+namespace FILEINDEX {
+
+// One event line, as the readers see it.
+struct QueueEvent {
+  unsigned int event = 0;
+  std::string path;
+  std::string pathOld;  // empty unless the line carries a string "path_old"
+};
+
+// Parses the `size` bytes at `line` (without the "\n") into `out`. Returns false, with `out`
+// unspecified, for a line that counts as no event (see above).
+bool ParseQueueLine(const char* line, size_t size, QueueEvent& out);
+
+// True when the queue file `queueFile` holds a reindex event whose "path" equals `path` byte for
+// byte. False when the file is missing or holds none; a file that exists but cannot be opened is
+// logged ("utils") and answers false. Malformed lines are skipped silently.
+bool IsReindexQueued(const std::string& path, const std::string& queueFile);
+
+// True when the queue file `queueFile` holds an event inside the folder `folder` (a share path,
+// resolved with GetFullPath): its "path", or on a moved event its "path_old", is the folder's
+// full path or lies below it at a "/" boundary. Reads the whole file and logs each malformed line
+// ("status_mgr: Malformed command: <line>"). False, logged, when the folder cannot be resolved
+// or the file cannot be opened; false without a line when the file is missing.
+bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile);
+
+}  // namespace FILEINDEX
+}  // namespace WEZO
+
+#endif  // FILEINDEX_SRC_QUEUE_READER_H_
