@@ -4,6 +4,7 @@
 
 #include "fileindex/eligibility.h"
 #include "fileindex/error.h"
+#include "fileindex/status_mgr.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
 #include "log.h"
@@ -74,6 +75,10 @@ bool Folder::AddToJson(Json::Value& obj) const {
 bool Folder::GetAdditional(Json::Value& out, const std::string& name) const {
   if (name == "is_valid") {
     out = CanPathBeIndexed(m_path);
+    return true;
+  }
+  if (name == "status") {
+    out = StatusMgr::GetFolderStatus(m_path);
     return true;
   }
   FILEINDEX_LOG("Unknown additional: %s", name.c_str());

@@ -2,4 +2,7 @@
 #include "fileindex/fileindex_c.h"
 
 int fileindex_c_header_check(void);
-int fileindex_c_header_check(void) { return 0; }
+int fileindex_c_header_check(void) {
+  int (*const getters[])(const char*, char*, int) = {FILEIDXQueuePathGet, FILEIDXDBPathGet};
+  return getters[0] == getters[1];
+}

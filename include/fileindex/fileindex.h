@@ -7,12 +7,16 @@
 #define FILEINDEX_FILEINDEX_H_
 
 #include "fileindex/config.h"
+#include "fileindex/daemon.h"
 #include "fileindex/eligibility.h"
 #include "fileindex/error.h"
 #include "fileindex/folder.h"
 #include "fileindex/folders.h"
+#include "fileindex/index_mgr.h"
+#include "fileindex/queue.h"
 #include "fileindex/root.h"
 #include "fileindex/status.h"
+#include "fileindex/status_mgr.h"
 #include "fileindex/utils.h"
 
 #endif  // FILEINDEX_FILEINDEX_H_

@@ -15,7 +15,21 @@
 extern "C" {
 #endif
 
-/* The functions of this interface are declared here as they are added to the library. */
+/* Where the share named szName keeps its event queue: writes the queue file's full path
+ * ("<share path>/@eaDir/WEZO@file_index_queue") into szOutQueuePath, creating the share's
+ * metadata directory "@eaDir" when it is missing (the queue file itself is not created). The
+ * output is cut to cbOutLen bytes, terminating zero included, as snprintf cuts it.
+ * Returns the length of what was written (strlen of the output) on success. Returns -1 when
+ * szName or szOutQueuePath is null or cbOutLen is not positive (the platform's last error is then
+ * 0xD00) or when no share has that name. A metadata directory that cannot be created is logged
+ * and does not fail the call. */
+FILEINDEX_EXPORT int FILEIDXQueuePathGet(const char* szName, char* szOutQueuePath, int cbOutLen);
+
+/* Where the share named szName keeps its index database: writes the database directory's full
+ * path ("<share path>/@eaDir/WEZO@.fileindexdb") into szOutDBPath and creates the directory
+ * (mode 0777 less the process umask) when it is missing. Results, truncation and failures as
+ * FILEIDXQueuePathGet; a directory that cannot be created is logged and does not fail the call. */
+FILEINDEX_EXPORT int FILEIDXDBPathGet(const char* szName, char* szOutDBPath, int cbOutLen);
 
 #ifdef __cplusplus
 } /* extern "C" */

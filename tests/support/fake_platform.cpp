@@ -108,8 +108,11 @@ int WEZOShareGet(const char* szName, PWEZOSHARE* ppShare) {
     return fake::Fail(__LINE__);
   }
   auto it = Get().shares.find(szName);
-  if (it == Get().shares.end()) {
+  if (it == Get().shares.end() || Get().share_get_fails_after == 0) {
     return fake::Fail(__LINE__);
+  }
+  if (Get().share_get_fails_after > 0) {
+    --Get().share_get_fails_after;
   }
   auto* record = new WEZOSHARE();
   (void)std::snprintf(record->szName, sizeof record->szName, "%s", it->second.name.c_str());

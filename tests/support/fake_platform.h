@@ -64,6 +64,7 @@ struct Platform {
 
   // ---- failure injection ----
   bool share_get_fails = false;
+  int share_get_fails_after = -1;  // when >= 0, share lookups after that many successes fail
   bool share_name_path_get_fails = false;
   bool encrypted_query_fails = false;
   bool encryption_query_fails = false;

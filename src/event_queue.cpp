@@ -1,0 +1,114 @@
+// The writer of a share's event queue.
+#define FILEINDEX_LOG_UNIT "utils"
+
+#include <errno.h>
+#include <fcntl.h>
+#include <sys/file.h>
+#include <unistd.h>
+#include <wezo/platform.h>
+
+#include <cstdlib>
+#include <string>
+
+#include "fileindex/queue.h"
+#include "fileindex/status_mgr.h"
+#include "json_io.h"
+#include "log.h"
+#include "queue_reader.h"
+#include "storage.h"
+#include "unique_fd.h"
+
+namespace WEZO {
+namespace FILEINDEX {
+namespace {
+
+constexpr int kLockAttempts = 3;
+
+// The queue lies in a share that users can write to: a symbolic link planted at its name must
+// not turn the appends into writes to another file.
+UniqueFd OpenQueueForAppend(const std::string& queuePath) {
+  return UniqueFd(
+      open(queuePath.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_NOFOLLOW | O_CLOEXEC, 0644));
+}
+
+enum class AppendResult { kDone, kFailed };
+
+// Appends `line` under an exclusive lock of the queue file. Contention that outlasts the
+// attempts drops the line and still counts as done: the monitor and the daemon hold the lock
+// only briefly, and a caller that is told "failed" would flag the whole share for reindexing.
+AppendResult AppendLine(const std::string& queuePath, const std::string& line) {
+  UniqueFd fd;
+  for (int attempt = 1;; ++attempt) {
+    fd = OpenQueueForAppend(queuePath);
+    if (!fd) {
+      return AppendResult::kFailed;
+    }
+    if (flock(fd.get(), LOCK_EX | LOCK_NB) == 0) {
+      break;
+    }
+    if (errno != EINTR && errno != EWOULDBLOCK) {
+      FILEINDEX_LOG_DEBUG("flock fail, path=%s, reason=%s", queuePath.c_str(),
+                          detail::ErrnoText().c_str());
+      return AppendResult::kFailed;
+    }
+    if (attempt == kLockAttempts) {
+      FILEINDEX_LOG_DEBUG("try lock too many times, path=%s, reason=%s", queuePath.c_str(),
+                          detail::ErrnoText().c_str());
+      return AppendResult::kDone;
+    }
+    fd.Close();
+    usleep(static_cast<useconds_t>(rand() % 10) * 1000);  // NOLINT(cert-msc30-c,cert-msc50-cpp)
+  }
+
+  // One write on an O_APPEND descriptor under the lock: lines of concurrent writers never
+  // interleave.
+  const ssize_t written = write(fd.get(), line.data(), line.size());
+  if (written < static_cast<ssize_t>(line.size())) {
+    FILEINDEX_LOG_DEBUG("write fail, (%ld, %ld)", static_cast<long>(written),
+                        static_cast<long>(line.size()));
+  }
+  flock(fd.get(), LOCK_UN);
+  return AppendResult::kDone;
+}
+
+}  // namespace
+
+bool AddCustomEvent(const int& event, const std::string& path, const Json::Value& data) {
+  char shareName[WEZO_SHARE_NAME_MAX] = {};
+  char sharePath[WEZO_SHARE_PATH_MAX] = {};
+  bool failed = false;
+  if (WEZOShareNamePathGet(path.c_str(), shareName, sizeof shareName, sharePath, sizeof sharePath) <
+      0) {
+    FILEINDEX_LOG("WEZOShareNamePathGet failed, path=%s", path.c_str());
+    failed = true;
+  }
+
+  std::string queue;
+  if (!failed && !ShareQueuePath(shareName, queue)) {
+    FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", shareName);
+    failed = true;
+  }
+
+  if (!failed) {
+    // A queued reindex of the path covers every other event for it.
+    if (IsReindexQueued(path, queue) || IsReindexQueued(path, queue + ".tmp")) {
+      return true;
+    }
+    Json::Value entry(Json::objectValue);
+    entry["event"] = event;
+    entry["path"] = path;
+    entry["data"] = data;
+    if (AppendLine(queue, JsonToString(entry) + "\n") == AppendResult::kDone) {
+      return true;
+    }
+  }
+
+  // The event is lost; indexing the whole share again from scratch makes up for it.
+  if (!StatusMgr::ShareSetNeedReindex(shareName, true)) {
+    FILEINDEX_LOG("ShareSetNeedReindex failed, share=%s", shareName);
+  }
+  return false;
+}
+
+}  // namespace FILEINDEX
+}  // namespace WEZO
