@@ -3,13 +3,20 @@
 #include <dirent.h>
 #include <fcntl.h>
 #include <ftw.h>
+#include <poll.h>
 #include <sys/file.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
 
+#include <algorithm>
+#include <cerrno>
+#include <cstdint>
 #include <cstdlib>
+#include <cstring>
 #include <fstream>
 #include <regex>
 #include <sstream>
@@ -19,6 +26,7 @@
 #include "fileindex/root.h"
 #include "json_io.h"
 #include "log.h"
+#include "paths.h"
 
 namespace testsupport {
 namespace {
@@ -169,6 +177,198 @@ LockHolder::~LockHolder() {
     int status = 0;
     waitpid(m_pid, &status, 0);
   }
+}
+
+namespace {
+
+// The daemon's socket address for `path`. A path that fills sun_path to its last byte is still
+// taken, so that tests can put a daemon where the library must refuse to look.
+bool SocketAddress(const std::string& path, sockaddr_un& address) {
+  address = sockaddr_un{};
+  address.sun_family = AF_UNIX;
+  if (path.size() > sizeof(address.sun_path)) {
+    return false;
+  }
+  std::memcpy(address.sun_path, path.data(), path.size());
+  return true;
+}
+
+}  // namespace
+
+FakeDaemon::FakeDaemon(Behaviour behaviour)
+    : m_path(WEZO::FILEINDEX::DaemonSocketPath()), m_behaviour(behaviour) {
+  sockaddr_un address{};
+  if (!SocketAddress(m_path, address)) {
+    ADD_FAILURE() << "socket path too long: " << m_path;
+    return;
+  }
+  const auto* addr = reinterpret_cast<const sockaddr*>(&address);
+  const bool hold = behaviour == Behaviour::kHoldConnect;
+  unlink(m_path.c_str());
+  m_listen = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+  if (m_listen < 0 || bind(m_listen, addr, sizeof(address)) != 0 ||
+      listen(m_listen, hold ? 0 : SOMAXCONN) != 0 || pipe2(m_wake, O_CLOEXEC | O_NONBLOCK) != 0) {
+    ADD_FAILURE() << "cannot listen on " << m_path << ": " << std::strerror(errno);
+    return;
+  }
+  if (hold) {
+    // A listener with a backlog of 0 queues one connection; this one takes the place, so the
+    // next client waits in connect().
+    m_dummy = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+    if (m_dummy < 0 || connect(m_dummy, addr, sizeof(address)) != 0) {
+      ADD_FAILURE() << "cannot fill the backlog: " << std::strerror(errno);
+      return;
+    }
+    m_discardNext = true;
+  }
+  m_thread = std::thread(&FakeDaemon::Serve, this);
+}
+
+FakeDaemon::~FakeDaemon() {
+  {
+    std::lock_guard<std::mutex> lock(m_mutex);
+    m_stopping = true;
+  }
+  if (m_thread.joinable()) {
+    (void)!write(m_wake[1], "x", 1);
+    m_thread.join();
+  }
+  for (int fd : {m_listen, m_wake[0], m_wake[1], m_dummy}) {
+    if (fd >= 0) {
+      close(fd);
+    }
+  }
+  unlink(m_path.c_str());
+}
+
+void FakeDaemon::Release() {
+  {
+    std::lock_guard<std::mutex> lock(m_mutex);
+    m_behaviour = Behaviour::kRead;
+  }
+  (void)!write(m_wake[1], "x", 1);
+}
+
+void FakeDaemon::Serve() {
+  std::vector<Connection> reading;
+  std::vector<int> held;  // kStopReading's connections
+  std::vector<pollfd> fds;
+  for (;;) {
+    bool accepting = false;
+    {
+      std::lock_guard<std::mutex> lock(m_mutex);
+      if (m_stopping) {
+        break;
+      }
+      accepting = m_behaviour != Behaviour::kHoldConnect;
+    }
+    fds.assign({{m_wake[0], POLLIN, 0}, {accepting ? m_listen : -1, POLLIN, 0}});
+    for (const Connection& connection : reading) {
+      fds.push_back({connection.fd, POLLIN, 0});
+    }
+    // The timeout only guards against a lost wake-up; the pipe ends every wait that matters.
+    if (poll(fds.data(), fds.size(), 1000) < 0 && errno != EINTR) {
+      ADD_FAILURE() << "fake daemon: poll failed: " << std::strerror(errno);
+      break;
+    }
+    char drain[64];
+    while (read(m_wake[0], drain, sizeof(drain)) > 0) {
+    }
+    for (size_t i = reading.size(); i-- > 0;) {
+      if (fds[i + 2].revents == 0) {
+        continue;
+      }
+      char buffer[65536];
+      const ssize_t got = read(reading[i].fd, buffer, sizeof(buffer));
+      if (got > 0) {
+        reading[i].bytes.append(buffer, static_cast<size_t>(got));
+      } else if (got == 0 || (errno != EAGAIN && errno != EINTR)) {
+        Finish(reading[i]);
+        reading.erase(reading.begin() + static_cast<std::ptrdiff_t>(i));
+      }
+    }
+    while (accepting && AcceptOne(reading, held)) {
+    }
+  }
+  for (const Connection& connection : reading) {
+    close(connection.fd);
+  }
+  for (int fd : held) {
+    close(fd);
+  }
+}
+
+bool FakeDaemon::AcceptOne(std::vector<Connection>& reading, std::vector<int>& held) {
+  const int fd = accept4(m_listen, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
+  if (fd < 0) {
+    return false;
+  }
+  Connection connection{fd, 0, {}};
+  Behaviour behaviour = Behaviour::kRead;
+  {
+    std::lock_guard<std::mutex> lock(m_mutex);
+    if (std::exchange(m_discardNext, false)) {
+      close(fd);
+      return true;
+    }
+    connection.index = m_accepted++;
+    behaviour = m_behaviour;
+  }
+  switch (behaviour) {
+    case Behaviour::kAcceptAndClose:
+      Finish(connection);
+      break;
+    case Behaviour::kStopReading:
+      held.push_back(fd);
+      break;
+    default:
+      reading.push_back(std::move(connection));
+      break;
+  }
+  return true;
+}
+
+void FakeDaemon::Finish(Connection& connection) {
+  close(connection.fd);
+  {
+    std::lock_guard<std::mutex> lock(m_mutex);
+    m_ended.emplace_back(connection.index, std::move(connection.bytes));
+  }
+  m_changed.notify_all();
+}
+
+std::vector<std::string> FakeDaemon::Connections(size_t count, std::chrono::milliseconds timeout) {
+  std::vector<std::pair<size_t, std::string>> ended;
+  {
+    std::unique_lock<std::mutex> lock(m_mutex);
+    m_changed.wait_for(lock, timeout, [&] { return m_ended.size() >= count; });
+    ended = m_ended;
+  }
+  std::sort(ended.begin(), ended.end());
+  std::vector<std::string> out;
+  out.reserve(ended.size());
+  for (auto& entry : ended) {
+    out.push_back(std::move(entry.second));
+  }
+  return out;
+}
+
+std::vector<Json::Value> FakeDaemon::Commands(size_t count, std::chrono::milliseconds timeout) {
+  std::vector<Json::Value> out;
+  for (const std::string& frame : Connections(count, timeout)) {
+    uint32_t length = 0;
+    if (frame.size() >= sizeof(length)) {
+      std::memcpy(&length, frame.data(), sizeof(length));
+    }
+    const size_t textEnd = frame.size() - 1;
+    if (frame.size() <= sizeof(length) || length != frame.size() - sizeof(length) ||
+        frame.find('\0', sizeof(length)) != textEnd) {
+      ADD_FAILURE() << "bad frame of " << frame.size() << " bytes, length field " << length;
+      continue;
+    }
+    out.push_back(ParseJson(frame.substr(sizeof(length), textEnd - sizeof(length))));
+  }
+  return out;
 }
 
 LibraryTest::LibraryTest() : volume(sandbox.Path("/volume1")) {

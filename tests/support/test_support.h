@@ -7,8 +7,14 @@
 #include <json/value.h>
 #include <sys/types.h>
 
+#include <chrono>
+#include <condition_variable>
+#include <cstddef>
+#include <mutex>
 #include <ostream>
 #include <string>
+#include <thread>
+#include <utility>
 #include <vector>
 
 namespace Json {
@@ -78,6 +84,61 @@ class LockHolder {
   pid_t m_pid = -1;
   int m_release = -1;
   bool m_holding = false;
+};
+
+// A stand-in for the indexing daemon: a real listening Unix socket at the sandbox's daemon socket
+// path, served by a thread of the test process. Create it after the root prefix is set. It never
+// calls into the library from its thread, so it can run beside a test that captures the log.
+class FakeDaemon {
+ public:
+  enum class Behaviour {
+    kRead,            // accepts each connection and reads it to its end
+    kAcceptAndClose,  // accepts each connection and closes it at once without reading
+    kStopReading,     // accepts and never reads (the connection stays open until destruction)
+    kHoldConnect,     // accepts nobody until Release(): its backlog is kept full, so a client
+                      // blocks in connect()
+  };
+  explicit FakeDaemon(Behaviour behaviour = Behaviour::kRead);
+  ~FakeDaemon();  // stops the thread, closes everything, removes the socket file
+  FakeDaemon(const FakeDaemon&) = delete;
+  FakeDaemon& operator=(const FakeDaemon&) = delete;
+
+  // For kHoldConnect: from now on behave as kRead (accept the queued connections and read them).
+  void Release();
+  // The bytes received on each connection that has ended, in order of acceptance (length field
+  // included; empty for a connection closed without reading). Waits until at least `count`
+  // connections have ended or `timeout` passes; returns what it has.
+  std::vector<std::string> Connections(size_t count,
+                                       std::chrono::milliseconds timeout = std::chrono::seconds(5));
+  // The same, each decoded: fails the test on a bad frame (a length field that is not the rest's
+  // size, no single terminating zero) and parses the JSON text.
+  std::vector<Json::Value> Commands(size_t count,
+                                    std::chrono::milliseconds timeout = std::chrono::seconds(5));
+
+ private:
+  struct Connection {
+    int fd;
+    size_t index;  // order of acceptance
+    std::string bytes;
+  };
+
+  void Serve();
+  bool AcceptOne(std::vector<Connection>& reading, std::vector<int>& held);
+  void Finish(Connection& connection);
+
+  std::string m_path;
+  int m_listen = -1;
+  int m_wake[2] = {-1, -1};
+  int m_dummy = -1;  // kHoldConnect's own connection that fills the backlog
+  std::thread m_thread;
+
+  std::mutex m_mutex;
+  std::condition_variable m_changed;
+  Behaviour m_behaviour;
+  bool m_discardNext = false;  // the next accepted connection is m_dummy's
+  bool m_stopping = false;
+  size_t m_accepted = 0;
+  std::vector<std::pair<size_t, std::string>> m_ended;
 };
 
 // The fixture every library test derives from: its own sandbox root, a fresh fake platform with
