@@ -376,36 +376,50 @@ bool RunHoldsReindex(const char* begin, const char* end, const std::string& path
   }
 }
 
-// StringStartWith(value + "/", prefix) for the `size` bytes at `value`, without building the
-// string; like it, compares as C strings.
-bool StartsWithSlashed(const char* value, size_t size, const std::string& prefix) {
-  if (prefix.size() > size + 1) {
-    return false;
-  }
-  for (size_t i = 0; i < prefix.size(); ++i) {
-    const char c = i < size ? value[i] : '/';
-    if (c != prefix[i]) {
+// Whether a path lies in a folder as StringStartWith(path + "/", full + "/") says, for a path
+// given as bytes and without building the string.
+class FolderPrefix {
+ public:
+  explicit FolderPrefix(const std::string& full)
+      : m_prefix(full + "/"), m_plain(full.find('\0') == std::string::npos) {}
+
+  bool Holds(const char* path, size_t size) const {
+    if (m_prefix.size() > size + 1) {
       return false;
     }
-    if (c == '\0') {
-      return true;
+    if (m_plain) {
+      // Without a NUL in the prefix, comparing as C strings is comparing bytes; when the path is
+      // one byte shorter than the prefix, the slash after it meets the prefix's last "/".
+      return std::memcmp(path, m_prefix.data(), std::min(m_prefix.size(), size)) == 0;
     }
+    for (size_t i = 0; i < m_prefix.size(); ++i) {
+      const char c = i < size ? path[i] : '/';
+      if (c != m_prefix[i]) {
+        return false;
+      }
+      if (c == '\0') {
+        return true;
+      }
+    }
+    return true;
   }
-  return true;
-}
 
-bool InFolder(unsigned int event, const char* path, size_t pathSize, const char* pathOld,
-              size_t pathOldSize, const std::string& prefix) {
-  return StartsWithSlashed(path, pathSize, prefix) ||
-         (event == static_cast<unsigned int>(kEventMoved) &&
-          StartsWithSlashed(pathOld, pathOldSize, prefix));
-}
+  bool HoldsEvent(unsigned int event, const char* path, size_t pathSize, const char* pathOld,
+                  size_t pathOldSize) const {
+    return Holds(path, pathSize) ||
+           (event == static_cast<unsigned int>(kEventMoved) && Holds(pathOld, pathOldSize));
+  }
+
+ private:
+  std::string m_prefix;
+  bool m_plain;
+};
 
 int LogWidth(size_t size) { return static_cast<int>(std::min<size_t>(size, INT_MAX)); }
 
 // Handles every line in [begin, end): logs the malformed ones and, until one is found, looks for
-// an event inside the folder whose full path followed by "/" is `prefix`.
-void ScanRunForFolder(const char* begin, const char* end, const std::string& prefix, bool& found) {
+// an event inside `folder`.
+void ScanRunForFolder(const char* begin, const char* end, const FolderPrefix& folder, bool& found) {
   for (const char* line = begin; line != end;) {
     const char* lineEnd = FindByte(line, end, '\n');
     const auto size = static_cast<size_t>(lineEnd - line);
@@ -413,12 +427,12 @@ void ScanRunForFolder(const char* begin, const char* end, const std::string& pre
     QueueEvent parsed;
     switch (ReadLine(line, size, scanned, parsed)) {
       case Line::kScanned:
-        found = found || InFolder(scanned.event, scanned.path, scanned.pathSize, scanned.pathOld,
-                                  scanned.pathOldSize, prefix);
+        found = found || folder.HoldsEvent(scanned.event, scanned.path, scanned.pathSize,
+                                           scanned.pathOld, scanned.pathOldSize);
         break;
       case Line::kParsed:
-        found = found || InFolder(parsed.event, parsed.path.data(), parsed.path.size(),
-                                  parsed.pathOld.data(), parsed.pathOld.size(), prefix);
+        found = found || folder.HoldsEvent(parsed.event, parsed.path.data(), parsed.path.size(),
+                                           parsed.pathOld.data(), parsed.pathOld.size());
         break;
       case Line::kMalformed:
         detail::WriteLog(false, kFolderUnit, __LINE__, "Malformed command: %.*s", LogWidth(size),
@@ -509,7 +523,7 @@ bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile
     return false;
   }
   // Every malformed line is logged, so the whole file is read even after a match.
-  const std::string prefix = full + "/";
+  const FolderPrefix prefix(full);
   bool found = false;
   LineRuns runs(fd.get(), blockSize);
   const char* begin = nullptr;

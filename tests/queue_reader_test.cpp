@@ -21,6 +21,7 @@ namespace {
 
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
+using namespace std::string_literals;
 
 // {"event":<code>,"path":"<path>"<rest>}
 std::string Ev(const std::string& code, const std::string& path, const std::string& rest = "") {
@@ -219,6 +220,7 @@ std::string MixedQueue(const std::string& volume, std::mt19937& rng, int count) 
                         "/photo/caf\xC3\xA9", "/photo/caf\xC3\xA9/x"}) {
     paths.push_back(volume + p);
   }
+  paths.push_back(volume + std::string("/photo/a\0b/x", 12));
   // Mostly what the writers use, then what the parser accepts or refuses in odd ways.
   const std::vector<std::string> codes = {
       "2",    "2",   "8",  "8",          "256",        "256",       "131072", "65536", "2",
@@ -316,9 +318,9 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
         malformed.push_back("status_mgr:N Malformed command: " + line.substr(0, line.find('\0')));
       }
     }
-    for (const std::string relative :
-         {"/photo/a", "/photo/a/", "/photo/a/x.jpg", "/photo/a/b/c", "/photo/ab", "/photo",
-          "/photo/caf\xC3\xA9", "/video/a", "/video/a/b", "/photo/a\x01\xFF"}) {
+    for (const std::string& relative :
+         {"/photo/a"s, "/photo/a/"s, "/photo/a/x.jpg"s, "/photo/a/b/c"s, "/photo/ab"s, "/photo"s,
+          "/photo/caf\xC3\xA9"s, "/video/a"s, "/video/a/b"s, "/photo/a\x01\xFF"s, "/photo/a\0c"s}) {
       const std::string path = volume + relative;
       bool reindex = false;
       bool inFolder = false;
