@@ -2,11 +2,11 @@
 // queued, and whether any event falls inside a folder.
 //
 // Queue files grow to millions of lines and are read on every progress report, so the readers
-// read in large blocks and parse a line only when its text can hold an answer. Their answers are
-// exactly those of parsing every line: a line that does not parse, is not an object, lacks
-// "event" or "path", has an "event" that is not convertible to an unsigned integer or a "path"
-// that is not a string counts as no event. A last line without "\n" (a writer still busy) is
-// read like any other line. Neither reader locks the file. Reentrant.
+// read in large blocks and leave to the JSON parser only the lines that a quick look at their
+// text cannot settle. Their answers are exactly those of parsing every line: a line that does not
+// parse, is not an object, lacks "event" or "path", has an "event" that is not convertible to an
+// unsigned integer or a "path" that is not a string counts as no event. A last line without "\n"
+// (a writer still busy) is read like any other line. Neither reader locks the file. Reentrant.
 #ifndef FILEINDEX_SRC_QUEUE_READER_H_
 #define FILEINDEX_SRC_QUEUE_READER_H_
 
@@ -39,6 +39,30 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile);
 // or the file cannot be opened; false without a line when the file is missing.
 bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile);
 
+namespace detail {
+
+// What a quick scan found in an event line: the spans point into the scanned line.
+struct ScannedEvent {
+  unsigned int event = 0;
+  const char* path = nullptr;
+  size_t pathSize = 0;
+  const char* pathOld = nullptr;  // nullptr unless "path_old" is a string
+  size_t pathOldSize = 0;
+};
+
+// Looks at the `size` bytes at `line` without a JSON parse. True only for a line that
+// ParseQueueLine surely takes as an event, with `out` holding what it would give. False means
+// "unsure" and says nothing: only ParseQueueLine can tell. The scan gives up on every line with a
+// backslash, on numbers other than plain decimals, on comments, on deep nesting and on objects
+// of many members.
+bool ScanQueueLine(const char* line, size_t size, ScannedEvent& out);
+
+// The readers with the size of their read blocks chosen by the caller (the public ones read
+// 1 MiB at a time), so that tests can put block boundaries inside lines.
+bool IsReindexQueued(const std::string& path, const std::string& queueFile, size_t blockSize);
+bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile, size_t blockSize);
+
+}  // namespace detail
 }  // namespace FILEINDEX
 }  // namespace WEZO
 

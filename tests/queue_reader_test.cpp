@@ -1,0 +1,351 @@
+#include "queue_reader.h"
+
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "fileindex/utils.h"
+#include "test_support.h"
+
+namespace WEZO {
+namespace FILEINDEX {
+namespace {
+
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using namespace std::string_literals;
+
+// {"event":<code>,"path":"<path>"<rest>}
+std::string Ev(const std::string& code, const std::string& path, const std::string& rest = "") {
+  return R"({"event":)" + code + R"(,"path":")" + path + '"' + rest + "}";
+}
+
+std::string EscapeSlashes(const std::string& path) {
+  std::string out;
+  for (const char c : path) {
+    out += c == '/' ? std::string("\\/") : std::string(1, c);
+  }
+  return out;
+}
+
+// "<event> <path> <path_old>" as the parser, or the quick scan, reads the line; "none" for no
+// event, "unsure" when the scan gives up.
+std::string Parsed(const std::string& line) {
+  QueueEvent e;
+  return ParseQueueLine(line.data(), line.size(), e)
+             ? std::to_string(e.event) + " " + e.path + " " + e.pathOld
+             : "none";
+}
+std::string Scanned(const std::string& line) {
+  detail::ScannedEvent e;
+  return detail::ScanQueueLine(line.data(), line.size(), e)
+             ? std::to_string(e.event) + " " + std::string(e.path, e.pathSize) + " " +
+                   (e.pathOld == nullptr ? "" : std::string(e.pathOld, e.pathOldSize))
+             : "unsure";
+}
+
+// While alive, every open() of this process fails (EMFILE) and lstat() still works: the tests
+// run as root, for whom no mode makes a file unreadable.
+class OpenFails {
+ public:
+  OpenFails() {
+    getrlimit(RLIMIT_NOFILE, &m_saved);
+    const int lowest = open("/dev/null", O_RDONLY | O_CLOEXEC);
+    close(lowest);
+    rlimit tight = m_saved;
+    tight.rlim_cur = static_cast<rlim_t>(lowest);
+    setrlimit(RLIMIT_NOFILE, &tight);
+  }
+  ~OpenFails() { setrlimit(RLIMIT_NOFILE, &m_saved); }
+  OpenFails(const OpenFails&) = delete;
+  OpenFails& operator=(const OpenFails&) = delete;
+
+ private:
+  rlimit m_saved{};
+};
+
+class QueueReaderTest : public testsupport::LibraryTest {
+ protected:
+  const std::string& Queue(const std::string& text) {
+    testsupport::WriteFile(queue, text);
+    return queue;
+  }
+
+  std::string queue = sandbox.Path("/queue");
+};
+
+TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
+  struct Case {
+    std::string line;
+    const char* event;
+    bool quick;  // what the writers produce must not need the parser
+  } cases[] = {
+      {R"({"event":2,"path":"/p"})", "2 /p ", true},
+      {R"( {"path_old":"/o", "path":"/p","event":256 } )", "256 /p /o", true},
+      {R"({"event":256,"path":"/p","path_old":7})", "256 /p ", true},
+      {R"({"event":2,"path":"/p","data":{"a":[1,-2.5,"x",true,false,null,{}],"b":[]}})", "2 /p ",
+       true},
+      {R"({"event":4294967295,"path":"/p"})", "4294967295 /p ", true},
+      {R"({"event":+1,"path":"/p"})", "1 /p ", false},
+      {R"({"event":1.5,"path":"/p"})", "1 /p ", false},
+      {R"({"event":true,"path":"/p"})", "1 /p ", false},
+      {std::string("{\"event\":2,\"path\":\"/p\"}\0 x", 26), "2 /p ", false},
+      {R"({"event":2,"path":"/caf\u00e9\/x"})", "2 /caf\xC3\xA9/x ", false},
+      {R"({"event":4294967296,"path":"/p"})", "none", false},
+      {R"({"event":2,"path":3})", "none", false},
+      {R"({"event":2})", "none", false},
+      {R"([{"event":2,"path":"/p"}])", "none", false},
+      {R"({"event":2,"path":"/p","data":)" + std::string(2000, '[') + "]}", "none", false},
+      {"", "none", false},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.line);
+    EXPECT_EQ(Parsed(c.line), c.event);
+    const std::string scanned = Scanned(c.line);
+    EXPECT_TRUE(scanned == c.event || (!c.quick && scanned == "unsure")) << scanned;
+  }
+}
+
+TEST_F(QueueReaderTest, ReindexIsFoundOnlyForTheSamePathBytes) {
+  const std::string p = volume + "/photo/a";
+  const std::string cafe = volume + "/photo/caf\xC3\xA9";
+  const struct {
+    const char* name;
+    std::string path;
+    std::string text;
+    bool expected;
+  } cases[] = {
+      {"exact", p, Ev("65536", p) + "\n", true},
+      {"after other lines", p, Ev("2", p) + "\nnot json\n\n" + Ev("65536", p) + "\n", true},
+      {"trailing slash in the line", p, Ev("65536", p + "/") + "\n", false},
+      {"trailing slash in the query", p + "/", Ev("65536", p) + "\n", false},
+      {"another event", p, Ev("131072", p) + "\n", false},
+      {"event as a real number", p, Ev("65536.0", p) + "\n", true},
+      {"partial last line", p, Ev("2", p) + "\n" + Ev("65536", p), true},
+      {"escaped slashes", p, Ev("65536", EscapeSlashes(p)) + "\n", true},
+      {"escaped non-ASCII", cafe, Ev("65536", volume + "/photo/caf\\u00e9") + "\n", true},
+      {"raw non-ASCII", cafe, Ev("65536", cafe) + "\n", true},
+      {"decomposed accent", cafe, Ev("65536", volume + "/photo/cafe\xCC\x81") + "\n", false},
+      {"needle in data only", p,
+       Ev("65536", volume + "/photo/b", R"(,"data":{"path":")" + p + R"("})") + "\n" +
+           Ev("131072", p, R"(,"data":[")" + p + R"("])") + "\n",
+       false},
+      {"malformed line with the needle", p, Ev("65536", p, ",") + "\n", false},
+      {"empty file", p, "", false},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    EXPECT_EQ(IsReindexQueued(c.path, Queue(c.text)), c.expected);
+  }
+  EXPECT_THAT(log.Lines(), IsEmpty());
+}
+
+TEST_F(QueueReaderTest, FolderEventIsTheFolderOrBelowItOrMovedFromThere) {
+  const std::string full = volume + "/photo/a";
+  const std::string elsewhere = volume + "/video/x";
+  const struct {
+    const char* name;
+    std::string line;
+    bool expected;
+  } cases[] = {
+      {"the folder", Ev("2", full), true},
+      {"the folder with a slash", Ev("2", full + "/"), true},
+      {"below", Ev("8", full + "/x/y.jpg"), true},
+      {"escaped below", Ev("8", EscapeSlashes(full + "/x")), true},
+      {"sibling", Ev("2", volume + "/photo/ab/x"), false},
+      {"parent", Ev("2", volume + "/photo"), false},
+      {"moved from below", Ev("256", elsewhere, R"(,"path_old":")" + full + R"(/x")"), true},
+      {"old path on another event", Ev("2", elsewhere, R"(,"path_old":")" + full + R"(")"), false},
+      {"old path not a string", Ev("256", elsewhere, R"(,"path_old":[")" + full + R"("])"), false},
+      {"event as a real number", Ev("2.5", full), true},
+      {"folder in data only", Ev("131072", elsewhere, R"(,"data":{"path":")" + full + R"("})"),
+       false},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.name);
+    EXPECT_EQ(QueueHasFolderEvent("/photo/a", Queue(c.line + "\n")), c.expected);
+  }
+  EXPECT_THAT(log.Lines(), IsEmpty());
+}
+
+TEST_F(QueueReaderTest, FolderTestLogsEachMalformedLineAndReadsOnAfterAMatch) {
+  const std::string text = "not json\n" + Ev("2", volume + "/photo/a/x") + "\n{\"event\":2\n\n" +
+                           R"({"event":2,/*quirk*/"path":"/v"})" + "\n{\"event\":2,\"pa";
+  EXPECT_TRUE(QueueHasFolderEvent("/photo/a", Queue(text)));
+  EXPECT_THAT(log.Lines(), ElementsAre("status_mgr:N Malformed command: not json",
+                                       "status_mgr:N Malformed command: {\"event\":2",
+                                       "status_mgr:N Malformed command: ",
+                                       "status_mgr:N Malformed command: {\"event\":2,\"pa"));
+}
+
+TEST_F(QueueReaderTest, QueueThatCannotBeReadAnswersFalse) {
+  const std::string p = volume + "/photo/a";
+  ASSERT_EQ(mkdir(sandbox.Path("/dir").c_str(), 0755), 0);
+  for (const std::string& none : {sandbox.Path("/missing"), sandbox.Path("/dir")}) {
+    EXPECT_FALSE(IsReindexQueued(p, none));
+    EXPECT_FALSE(QueueHasFolderEvent("/photo/a", none));
+  }
+  EXPECT_THAT(log.Lines(), IsEmpty());
+
+  Queue(Ev("65536", p) + "\n");
+  EXPECT_FALSE(QueueHasFolderEvent("/nosuch/a", queue));
+  bool answers[2] = {true, true};
+  {
+    const OpenFails fails;
+    answers[0] = IsReindexQueued(p, queue);
+    answers[1] = QueueHasFolderEvent("/photo/a", queue);
+  }
+  EXPECT_THAT(answers, ElementsAre(false, false));
+  const std::string reason = "Failed to open queue=" + queue + ", reason=Too many open files";
+  EXPECT_THAT(log.Lines(), ElementsAre("status_mgr:N Cannot get full path: /nosuch/a",
+                                       "utils:N " + reason, "status_mgr:N " + reason));
+}
+
+// `count` lines of every kind the readers meet, valid or not, the last one without "\n".
+std::string MixedQueue(const std::string& volume, std::mt19937& rng, int count) {
+  const auto pick = [&rng](const std::vector<std::string>& from) -> const std::string& {
+    return from[rng() % from.size()];
+  };
+  std::vector<std::string> paths = {"/elsewhere", ""};
+  for (const char* p : {"/photo/a", "/photo/a/", "/photo/a/x.jpg", "/photo/a/b/c", "/photo/ab",
+                        "/photo/ab/x", "/photo", "/video/a", "/video/a/b", "/photo/a\x01\xFF/x",
+                        "/photo/caf\xC3\xA9", "/photo/caf\xC3\xA9/x"}) {
+    paths.push_back(volume + p);
+  }
+  paths.push_back(volume + std::string("/photo/a\0b/x", 12));
+  // Mostly what the writers use, then what the parser accepts or refuses in odd ways.
+  const std::vector<std::string> codes = {
+      "2",    "2",   "8",  "8",          "256",        "256",       "131072", "65536", "2",
+      "8",    "256", "1",  "4",          "65536.0",    "01",        "+1",     "-1",    "null",
+      "true", "1e2", "-0", "4294967296", "4294967295", "\"65536\"", "[256]",  "256.9"};
+  const std::vector<std::string> loose = {
+      "not json", "",           "{}",       "[]",
+      "null",     R"({"":1,})", "\t",       "\xEF\xBB\xBF{}",
+      "{",        R"("x")",     "\x01\x02", R"({"event":2,"path":"/x"}/**/)"};
+  const auto render = [&](const std::string& path) {
+    std::string out = rng() % 6 == 0 ? EscapeSlashes(path) : path;
+    const size_t at = out.find("caf\xC3\xA9");
+    return at == std::string::npos || rng() % 2 == 0 ? out : out.replace(at, 5, "caf\\u00e9");
+  };
+  const auto data = [&]() -> std::string {
+    const std::string& p = pick(paths);
+    return pick({"null", "{}", R"({"path":")" + p + R"("})", '"' + p + '"',
+                 R"([1,-2.25,{"path":")" + p + R"(","n":[true,false,null,{}]},[]])",
+                 R"({"a":{"b":{"c":[[["deep"]]]}},"x":12345678901234567890})",
+                 R"({"k":"\")" + p + R"(\""})"});
+  };
+
+  std::string text;
+  for (int i = 0; i < count; ++i) {
+    std::string line;
+    if (rng() % 12 == 0) {
+      line = pick(loose);
+    } else {
+      const std::string& code = pick(codes);
+      std::vector<std::string> members = {R"("event":)" + code,
+                                          R"("path":")" + render(pick(paths)) + '"'};
+      if (code == "256" || rng() % 8 == 0) {
+        members.push_back(R"("path_old":")" + render(pick(paths)) + '"');
+      }
+      if (rng() % 3 == 0) {
+        members.push_back(R"("data":)" + data());
+      }
+      std::shuffle(members.begin(), members.end(), rng);
+      line = "{";
+      for (size_t m = 0; m < members.size(); ++m) {
+        line += (m == 0 ? "" : rng() % 4 == 0 ? " , " : ",") + members[m];
+      }
+      line += "}";
+      switch (rng() % 30) {
+        case 0:
+          line.resize(rng() % line.size());
+          break;
+        case 1:
+          line += pick({" ", " x", ",", "}", std::string("\0tail", 5), "/*c*/", "\r"});
+          break;
+        case 2:
+          line.insert(1, pick({"/*c*/", " ", "\t", R"("event":3,)", R"("path":"/d",)", ","}));
+          break;
+        case 3:
+          line.insert(line.size() - 1, pick({",", R"(,"data":1,"data":2)", R"(,"":1,)", " ", "\f",
+                                             R"(,"data":tru)", R"(,"data":[1,])", R"(,"data":1.)",
+                                             R"(,"data":-)", R"(,"data":{"a":1,"a":2})"}));
+          break;
+        case 4:
+          line.insert(0, "\xEF\xBB\xBF");
+          break;
+        case 5:
+          line.insert(line.size() / 2,
+                      pick({"\xFF", "\x01", std::string(1, '\0'), "\\", "\"", "}"}));
+          break;
+        default:
+          break;
+      }
+    }
+    text += line + (i + 1 < count ? "\n" : "");
+  }
+  return text;
+}
+
+TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
+  std::mt19937 rng(1234567);  // NOLINT(cert-msc32-c,cert-msc51-cpp): the same queues every run
+  int answers[2] = {0, 0};
+  for (int round = 0; round < 40; ++round) {
+    const std::string text = MixedQueue(volume, rng, 100);
+    Queue(text);
+    std::vector<QueueEvent> events;
+    std::vector<std::string> malformed;
+    for (size_t start = 0; start < text.size();) {
+      const size_t end = std::min(text.find('\n', start), text.size());
+      const std::string line = text.substr(start, end - start);
+      start = end + 1;
+      // The quick scan may give up on any line, but never answers otherwise than the parser.
+      const std::string scanned = Scanned(line);
+      EXPECT_TRUE(scanned == "unsure" || scanned == Parsed(line)) << line;
+      QueueEvent event;
+      if (ParseQueueLine(line.data(), line.size(), event)) {
+        events.push_back(event);
+      } else {
+        // The log line ends where the line has a NUL byte.
+        malformed.push_back("status_mgr:N Malformed command: " + line.substr(0, line.find('\0')));
+      }
+    }
+    for (const std::string& relative :
+         {"/photo/a"s, "/photo/a/"s, "/photo/a/x.jpg"s, "/photo/a/b/c"s, "/photo/ab"s, "/photo"s,
+          "/photo/caf\xC3\xA9"s, "/video/a"s, "/video/a/b"s, "/photo/a\x01\xFF"s, "/photo/a\0c"s}) {
+      const std::string path = volume + relative;
+      bool reindex = false;
+      bool inFolder = false;
+      for (const QueueEvent& event : events) {
+        reindex = reindex || (event.event == 65536 && event.path == path);
+        inFolder = inFolder || StringStartWith(event.path + "/", path + "/") ||
+                   (event.event == 256 && StringStartWith(event.pathOld + "/", path + "/"));
+      }
+      ++answers[reindex];
+      ++answers[inFolder];
+      for (const size_t blockSize : {size_t{1} << 20, size_t{61}, size_t{1}}) {
+        SCOPED_TRACE(std::to_string(round) + " " + relative + " in blocks of " +
+                     std::to_string(blockSize));
+        EXPECT_EQ(detail::IsReindexQueued(path, queue, blockSize), reindex);
+        log.Clear();
+        EXPECT_EQ(detail::QueueHasFolderEvent(relative, queue, blockSize), inFolder);
+        EXPECT_EQ(log.Lines(), malformed);
+      }
+    }
+  }
+  // Both answers come up often, or the comparison would prove little.
+  EXPECT_GT(answers[0], 200);
+  EXPECT_GT(answers[1], 200);
+}
+
+}  // namespace
+}  // namespace FILEINDEX
+}  // namespace WEZO
