@@ -125,7 +125,7 @@ TEST_F(EventQueueTest, AQueueKeptLockedByAnotherProcessDropsTheEventAndSucceeds)
 }
 
 TEST_F(EventQueueTest, AnEventThatCannotBeQueuedFlagsItsShareForAFullReindex) {
-  const std::string target = volume + "/video/victim";
+  const std::string target = volume + "/photo/victim";
   WriteFile(target, "keep");
   struct Case {
     const char* name;
