@@ -1,11 +1,11 @@
 // The writer of a share's event queue.
 #define FILEINDEX_LOG_UNIT "utils"
 
-#include <errno.h>
 #include <fcntl.h>
 #include <sys/file.h>
 #include <unistd.h>
 #include <wezo/platform.h>
+#include <cerrno>
 
 #include <cstdlib>
 #include <string>

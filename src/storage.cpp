@@ -2,9 +2,9 @@
 // share's hidden metadata directory.
 #define FILEINDEX_LOG_UNIT "utils"
 
-#include <errno.h>
 #include <sys/stat.h>
 #include <wezo/platform.h>
+#include <cerrno>
 
 #include <cstdio>
 #include <cstring>
@@ -52,14 +52,14 @@ int StoragePathGet(Item item, const char* name, char* out, int outLen) {
   const std::string sharePath = SharePathOf(*share);
 
   char metadataDir[4096];
-  std::snprintf(metadataDir, sizeof metadataDir, "%s/%s", sharePath.c_str(), kMetadataDir);
+  (void)std::snprintf(metadataDir, sizeof metadataDir, "%s/%s", sharePath.c_str(), kMetadataDir);
   if (WEZOEAMKDir(0, metadataDir) < 0) {
     // The caller still gets the location: the daemon or a later call may yet create it.
     FILEINDEX_LOG("WEZOEAMKDir failed, path=%s, code=%d", metadataDir, WLIBCErrGet());
   }
 
-  std::snprintf(out, static_cast<size_t>(outLen), "%s/%s/%s", sharePath.c_str(), kMetadataDir,
-                item == Item::kQueue ? kQueueName : kDatabaseName);
+  (void)std::snprintf(out, static_cast<size_t>(outLen), "%s/%s/%s", sharePath.c_str(), kMetadataDir,
+                      item == Item::kQueue ? kQueueName : kDatabaseName);
   if (item == Item::kDatabase && mkdir(out, 0777) != 0 && errno != EEXIST) {
     FILEINDEX_LOG("mkdir failed, path=%s, reason=%s", out, detail::ErrnoText().c_str());
   }

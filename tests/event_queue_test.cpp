@@ -37,7 +37,7 @@ class EventQueueTest : public testsupport::LibraryTest {
            "\"}\n";
   }
 
-  Json::Value StatusFile() const { return ParseJson(ReadFile(StatusConfPath())); }
+  static Json::Value StatusFile() { return ParseJson(ReadFile(StatusConfPath())); }
 
   std::string folder;
   std::string queue;

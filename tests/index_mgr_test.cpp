@@ -62,10 +62,12 @@ TEST_F(MonitorRegistrationTest, NothingReachesTheMonitorWhenAFolderOrTheQueueCan
       {"the share is gone once its queue is found",
        [](fake::Platform& p) { p.share_get_fails_after = 1; },
        {"index_mgr:N GetFullPath failed, path=/photo/a"}},
-      {"unknown share", [](fake::Platform& p) { p.shares.erase("photo"); },
+      {"unknown share",
+       [](fake::Platform& p) { p.shares.erase("photo"); },
        {"utils:N WEZOShareGet failed, name=photo, code=3585",
         "index_mgr:N FILEIDXQueuePathGet failed, share=photo"}},
-      {"monitor refuses", [](fake::Platform& p) { p.monitor_upsert_fails = true; },
+      {"monitor refuses",
+       [](fake::Platform& p) { p.monitor_upsert_fails = true; },
        {"index_mgr:N MonitorQueue::Add failed"}},
   };
   for (const Case& c : cases) {

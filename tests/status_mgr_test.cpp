@@ -32,7 +32,7 @@ using testsupport::WriteFile;
 
 class StatusMgrTest : public testsupport::LibraryTest {
  protected:
-  Json::Value StatusFile() const { return ParseJson(ReadFile(StatusConfPath())); }
+  static Json::Value StatusFile() { return ParseJson(ReadFile(StatusConfPath())); }
 
   // True while some process holds the status lock.
   static bool StatusLockHeld() {
@@ -92,8 +92,7 @@ TEST_F(StatusMgrTest, TheDaemonIsToldAfterTheSaveWhileTheLockIsStillHeld) {
   // The caller blocks in connect until the daemon accepts; by then the file must say paused and
   // the lock must still be held.
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(5);
-  while (ReadFile(StatusConfPath()) == "<missing>" &&
-         std::chrono::steady_clock::now() < deadline) {
+  while (ReadFile(StatusConfPath()) == "<missing>" && std::chrono::steady_clock::now() < deadline) {
     std::this_thread::sleep_for(std::chrono::milliseconds(1));
   }
   EXPECT_EQ(StatusFile(), ParseJson(R"({"resume_time":0})"));
@@ -129,9 +128,10 @@ TEST_F(StatusMgrTest, FlagsPersistAndTheAdministratorsHearOfTheFirstNoSpaceOnly)
   ASSERT_TRUE(StatusMgr::ShareRevive("video")) << "a share that never ran out is revived too";
   EXPECT_FALSE(StatusMgr::ShareIsNoSpace("photo"));
   EXPECT_TRUE(StatusMgr::ShareIsNeedReindex("photo")) << "reviving leaves the reindex pending";
-  EXPECT_THAT(daemon.Commands(2),
-              ElementsAre(ParseJson(R"({"type":"revive_share_worker","data":{"share_name":"photo"}})"),
-                          ParseJson(R"({"type":"revive_share_worker","data":{"share_name":"video"}})")));
+  EXPECT_THAT(
+      daemon.Commands(2),
+      ElementsAre(ParseJson(R"({"type":"revive_share_worker","data":{"share_name":"photo"}})"),
+                  ParseJson(R"({"type":"revive_share_worker","data":{"share_name":"video"}})")));
 
   ASSERT_TRUE(StatusMgr::ShareSetNoSpace("photo", true));
   EXPECT_EQ(fake::Get().CallsTo("WLIBCExecv").size(), 2U) << "a new transition, a new notice";
@@ -163,8 +163,9 @@ class ProgressTest : public StatusMgrTest {
     WriteFile(FolderConfPath(), R"({"/photo/a":{"name":"a","photo":true}})");
   }
 
-  void SetPause(const std::string& resumeTime) {
-    WriteFile(StatusConfPath(), resumeTime.empty() ? "{}" : R"({"resume_time":)" + resumeTime + "}");
+  static void SetPause(const std::string& resumeTime) {
+    WriteFile(StatusConfPath(),
+              resumeTime.empty() ? "{}" : R"({"resume_time":)" + resumeTime + "}");
   }
 
   static std::string Event(const std::string& path) {

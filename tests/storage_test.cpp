@@ -32,7 +32,8 @@ TEST_F(StorageTest, RefusesBadArgumentsInOrderWithThePlatformError) {
     int size;
     const char* line;
   } cases[] = {
-      {FILEIDXQueuePathGet, nullptr, nullptr, 0, "utils:N Invaild Argument (__null != szName)=[0]\n"},
+      {FILEIDXQueuePathGet, nullptr, nullptr, 0,
+       "utils:N Invaild Argument (__null != szName)=[0]\n"},
       {FILEIDXQueuePathGet, "photo", nullptr, 0,
        "utils:N Invaild Argument (__null != szOutQueuePath)=[0]\n"},
       {FILEIDXDBPathGet, "photo", nullptr, 64,
@@ -90,10 +91,10 @@ TEST_F(StorageTest, DirectoriesThatCannotBeCreatedAreLoggedAndThePathStillReturn
   char buffer[4096];
   const std::string db = volume + "/photo/@eaDir/WEZO@.fileindexdb";
   EXPECT_EQ(FILEIDXDBPathGet("photo", buffer, sizeof buffer), static_cast<int>(db.size()));
-  EXPECT_THAT(log.Lines(),
-              ElementsAre("utils:N WEZOEAMKDir failed, path=" + volume + "/photo/@eaDir, code=3585",
-                          "utils:N mkdir failed, path=" + db +
-                              ", reason=No such file or directory"));
+  EXPECT_THAT(
+      log.Lines(),
+      ElementsAre("utils:N WEZOEAMKDir failed, path=" + volume + "/photo/@eaDir, code=3585",
+                  "utils:N mkdir failed, path=" + db + ", reason=No such file or directory"));
 }
 
 }  // namespace
