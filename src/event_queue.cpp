@@ -31,17 +31,16 @@ UniqueFd OpenQueueForAppend(const std::string& queuePath) {
       open(queuePath.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_NOFOLLOW | O_CLOEXEC, 0644));
 }
 
-enum class AppendResult { kDone, kFailed };
-
-// Appends `line` under an exclusive lock of the queue file. Contention that outlasts the
-// attempts drops the line and still counts as done: the monitor and the daemon hold the lock
-// only briefly, and a caller that is told "failed" would flag the whole share for reindexing.
-AppendResult AppendLine(const std::string& queuePath, const std::string& line) {
+// Appends `line` under an exclusive lock of the queue file; false when the queue cannot be opened
+// or locked. Contention that outlasts the attempts drops the line and still counts as appended:
+// the monitor and the daemon hold the lock only briefly, and a caller that is told otherwise
+// flags the whole share for reindexing.
+bool AppendLine(const std::string& queuePath, const std::string& line) {
   UniqueFd fd;
   for (int attempt = 1;; ++attempt) {
     fd = OpenQueueForAppend(queuePath);
     if (!fd) {
-      return AppendResult::kFailed;
+      return false;
     }
     if (flock(fd.get(), LOCK_EX | LOCK_NB) == 0) {
       break;
@@ -49,12 +48,12 @@ AppendResult AppendLine(const std::string& queuePath, const std::string& line) {
     if (errno != EINTR && errno != EWOULDBLOCK) {
       FILEINDEX_LOG_DEBUG("flock fail, path=%s, reason=%s", queuePath.c_str(),
                           detail::ErrnoText().c_str());
-      return AppendResult::kFailed;
+      return false;
     }
     if (attempt == kLockAttempts) {
       FILEINDEX_LOG_DEBUG("try lock too many times, path=%s, reason=%s", queuePath.c_str(),
                           detail::ErrnoText().c_str());
-      return AppendResult::kDone;
+      return true;
     }
     fd.Close();
     usleep(static_cast<useconds_t>(rand() % 10) * 1000);  // NOLINT(cert-msc30-c,cert-msc50-cpp)
@@ -68,7 +67,26 @@ AppendResult AppendLine(const std::string& queuePath, const std::string& line) {
                         static_cast<long>(line.size()));
   }
   flock(fd.get(), LOCK_UN);
-  return AppendResult::kDone;
+  return true;
+}
+
+// Appends the event to the share's queue; false, logged, when it cannot be queued.
+bool AppendEvent(const std::string& share, int event, const std::string& path,
+                const Json::Value& data) {
+  std::string queue;
+  if (!ShareQueuePath(share, queue)) {
+    FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", share.c_str());
+    return false;
+  }
+  // A queued reindex of the path covers every other event for it.
+  if (IsReindexQueued(path, queue) || IsReindexQueued(path, queue + ".tmp")) {
+    return true;
+  }
+  Json::Value entry(Json::objectValue);
+  entry["event"] = event;
+  entry["path"] = path;
+  entry["data"] = data;
+  return AppendLine(queue, JsonToString(entry) + "\n");
 }
 
 }  // namespace
@@ -76,31 +94,11 @@ AppendResult AppendLine(const std::string& queuePath, const std::string& line) {
 bool AddCustomEvent(const int& event, const std::string& path, const Json::Value& data) {
   char shareName[WEZO_SHARE_NAME_MAX] = {};
   char sharePath[WEZO_SHARE_PATH_MAX] = {};
-  bool failed = false;
   if (WEZOShareNamePathGet(path.c_str(), shareName, sizeof shareName, sharePath, sizeof sharePath) <
       0) {
     FILEINDEX_LOG("WEZOShareNamePathGet failed, path=%s", path.c_str());
-    failed = true;
-  }
-
-  std::string queue;
-  if (!failed && !ShareQueuePath(shareName, queue)) {
-    FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", shareName);
-    failed = true;
-  }
-
-  if (!failed) {
-    // A queued reindex of the path covers every other event for it.
-    if (IsReindexQueued(path, queue) || IsReindexQueued(path, queue + ".tmp")) {
-      return true;
-    }
-    Json::Value entry(Json::objectValue);
-    entry["event"] = event;
-    entry["path"] = path;
-    entry["data"] = data;
-    if (AppendLine(queue, JsonToString(entry) + "\n") == AppendResult::kDone) {
-      return true;
-    }
+  } else if (AppendEvent(shareName, event, path, data)) {
+    return true;
   }
 
   // The event is lost; indexing the whole share again from scratch makes up for it.
