@@ -1,6 +1,7 @@
 #include "json_io.h"
 
 #include <json/reader.h>
+#include <json/value.h>
 #include <json/writer.h>
 
 #include <memory>
@@ -49,7 +50,12 @@ JsonSaveResult JsonToFile(const Json::Value& value, const std::string& path, mod
 
 bool JsonFromString(Json::Value& value, const char* text, size_t size) {
   Json::Value parsed;
-  if (!Reader().parse(text, text + size, &parsed, nullptr)) {
+  try {
+    if (!Reader().parse(text, text + size, &parsed, nullptr)) {
+      return false;
+    }
+  } catch (const Json::Exception&) {
+    // Nesting deeper than the reader's limit throws instead of failing the parse.
     return false;
   }
   value.swap(parsed);

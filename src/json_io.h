@@ -33,7 +33,8 @@ using JsonSaveResult = ReplaceResult;
 JsonSaveResult JsonToFile(const Json::Value& value, const std::string& path, mode_t mode);
 
 // Parses `text` (the `size` bytes at `text`) into `value`. Returns false, leaving `value` as it
-// was, when it is not exactly one JSON value, optionally surrounded by white space.
+// was, when it is not exactly one JSON value, optionally surrounded by white space, or nests
+// deeper than 1000 levels. Never throws.
 bool JsonFromString(Json::Value& value, const char* text, size_t size);
 inline bool JsonFromString(Json::Value& value, const std::string& text) {
   return JsonFromString(value, text.data(), text.size());

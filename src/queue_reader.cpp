@@ -447,12 +447,7 @@ void ScanRunForFolder(const char* begin, const char* end, const FolderPrefix& fo
 
 bool ParseQueueLine(const char* line, size_t size, QueueEvent& out) {
   Json::Value root;
-  try {
-    if (!JsonFromString(root, line, size)) {
-      return false;
-    }
-  } catch (const Json::Exception&) {
-    // Nesting deeper than the parser allows throws instead of failing the parse.
+  if (!JsonFromString(root, line, size)) {
     return false;
   }
   if (!root.isObject()) {
