@@ -37,8 +37,6 @@ class EventQueueTest : public testsupport::LibraryTest {
            "\"}\n";
   }
 
-  static Json::Value StatusFile() { return ParseJson(ReadFile(StatusConfPath())); }
-
   std::string folder;
   std::string queue;
 };

@@ -32,8 +32,6 @@ using testsupport::WriteFile;
 
 class StatusMgrTest : public testsupport::LibraryTest {
  protected:
-  static Json::Value StatusFile() { return ParseJson(ReadFile(StatusConfPath())); }
-
   // True while some process holds the status lock.
   static bool StatusLockHeld() {
     const int fd = open(StatusLockPath().c_str(), O_RDONLY | O_CLOEXEC);

@@ -25,11 +25,6 @@ class StatusTest : public testsupport::LibraryTest {
     testsupport::WriteFile(StatusConfPath(), text);
     ASSERT_TRUE(status.Load());
   }
-  Json::Value SavedFile() {
-    Json::Value saved;
-    EXPECT_TRUE(JsonFromString(saved, testsupport::ReadFile(StatusConfPath())));
-    return saved;
-  }
 };
 
 TEST_F(StatusTest, PauseStateReadsMinusOneWhenAbsentAndRefusesWhatIsNotAnInteger) {
@@ -65,10 +60,10 @@ TEST_F(StatusTest, PauseStateReadsMinusOneWhenAbsentAndRefusesWhatIsNotAnInteger
   Status status;
   status.Pause(0);
   ASSERT_TRUE(status.Save());
-  EXPECT_EQ(SavedFile(), testsupport::ParseJson(R"({"resume_time":0})"));
+  EXPECT_EQ(StatusFile(), testsupport::ParseJson(R"({"resume_time":0})"));
   status.Resume();
   ASSERT_TRUE(status.Save());
-  EXPECT_EQ(SavedFile(), testsupport::ParseJson(R"({"resume_time":-1})"));
+  EXPECT_EQ(StatusFile(), testsupport::ParseJson(R"({"resume_time":-1})"));
 }
 
 TEST_F(StatusTest, NoSpaceNotifiesOncePerTransitionWithTheExactCommandLine) {
@@ -108,7 +103,7 @@ TEST_F(StatusTest, ShareFlagsAreAddedAndRemovedByPresence) {
   status.ShareSetNeedReindex("photo", false);
   status.ShareSetNoSpace("photo", true);
   ASSERT_TRUE(status.Save());
-  EXPECT_EQ(SavedFile(), testsupport::ParseJson(R"({"need_reindex":{},"no_space":{"photo":true},
+  EXPECT_EQ(StatusFile(), testsupport::ParseJson(R"({"need_reindex":{},"no_space":{"photo":true},
                                                     "marker":true})"));
 
   status.ShareSetNeedReindex("photo", true);
@@ -135,7 +130,7 @@ TEST_F(StatusTest, MarkersReadAsBooleansWithoutThrowing) {
   EXPECT_FALSE(odd.ShareIsNoSpace("photo"));
   odd.SetUpdated("x");
   ASSERT_TRUE(odd.Save());
-  EXPECT_EQ(SavedFile(), testsupport::ParseJson(R"({"x":true})"));
+  EXPECT_EQ(StatusFile(), testsupport::ParseJson(R"({"x":true})"));
 }
 
 }  // namespace

@@ -381,4 +381,8 @@ LibraryTest::LibraryTest() : volume(sandbox.Path("/volume1")) {
 
 LibraryTest::~LibraryTest() = default;
 
+Json::Value LibraryTest::StatusFile() {
+  return ParseJson(ReadFile(WEZO::FILEINDEX::StatusConfPath()));
+}
+
 }  // namespace testsupport

@@ -149,6 +149,9 @@ class LibraryTest : public ::testing::Test {
   LibraryTest();
   ~LibraryTest() override;
 
+  // The sandbox's status.conf, parsed. Fails the test when it is missing or not JSON.
+  static Json::Value StatusFile();
+
   Sandbox sandbox;
   LogCapture log;
   std::string volume;  // the sandbox's /volume1
