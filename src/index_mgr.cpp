@@ -7,10 +7,20 @@
 #include <wezo/wezotifyd.h>
 
 #include <exception>
+#include <map>
 #include <memory>
+#include <set>
+#include <string>
+#include <vector>
 
+#include "fileindex/daemon.h"
+#include "fileindex/error.h"
+#include "fileindex/fileindex_c.h"
 #include "fileindex/folders.h"
+#include "fileindex/queue.h"
+#include "fileindex/status_mgr.h"
 #include "fileindex/utils.h"
+#include "json_io.h"
 #include "log.h"
 #include "storage.h"
 
@@ -23,12 +33,477 @@ constexpr char kMonitorClient[] = "fileindex";
 // and 0x0020).
 constexpr int kMonitorMask = 0xFFCE;
 constexpr char kMetadataDir[] = "@eaDir";
+constexpr char kIndexService[] = "fileindexd";
+constexpr char kSmbService[] = "samba";
+constexpr int kServiceFlags = 1;
+constexpr int kLocationSize = 4096;
+
+// Releases the folder list's lock on the way out of a scope, whichever way that is: Config's
+// destructor leaves the lock alone, and an exception must not leave it held.
+class UnlockOnExit {
+ public:
+  explicit UnlockOnExit(Config& config) : m_config(config) {}
+  ~UnlockOnExit() { m_config.Unlock(); }
+  UnlockOnExit(const UnlockOnExit&) = delete;
+  UnlockOnExit& operator=(const UnlockOnExit&) = delete;
+
+ private:
+  Config& m_config;
+};
+
+void RefuseRequest(int line, const Json::Value& request) {
+  detail::WriteLog(false, FILEINDEX_LOG_UNIT, line, "Bad param: %s", JsonToString(request).c_str());
+  ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
+}
+
+// Runs an operation on the request `request`. jsoncpp throws when a value of one type is read as
+// another (an element that is an array where an object is expected, a "path" that is an object);
+// such a request is refused like any other malformed one instead of the exception leaving the
+// library. Everything the operation holds is released by the unwinding before the refusal.
+template <typename Operation>
+bool RefuseOnJsonError(const Json::Value& request, Operation operation) {
+  try {
+    return operation();
+  } catch (const Json::Exception&) {
+    RefuseRequest(__LINE__, request);
+    return false;
+  }
+}
+
+// Spotlight is switched on when it is known to be off; the SMB service reads the setting only
+// when it starts. Failures are logged and otherwise ignored: searching over SMB is a convenience
+// that must not stop indexing.
+void EnableSpotlight() {
+  if (WEZOSMBIsEnableSpotlight() != 0) {
+    return;
+  }
+  if (WEZOSMBSetSpotlight(1) < 0) {
+    FILEINDEX_LOG_PLATFORM_FAILURE("WEZOSMBSetSpotlight");
+  } else if (WLIBServiceRestart(kSmbService) < 0) {
+    FILEINDEX_LOG_PLATFORM_FAILURE("WLIBServiceRestart");
+  }
+}
+
+// The last indexed folder is gone: the daemon is stopped and Spotlight switched off unless it is
+// known to be off already. Failures are logged and otherwise ignored.
+void StopIndexing() {
+  if (WLIBServiceStop(kIndexService, kServiceFlags) < 0) {
+    FILEINDEX_LOG_PLATFORM_FAILURE("WLIBServiceStop");
+  }
+  if (WEZOSMBIsEnableSpotlight() == 0) {
+    return;
+  }
+  if (WEZOSMBSetSpotlight(0) < 0) {
+    FILEINDEX_LOG_PLATFORM_FAILURE("WEZOSMBSetSpotlight");
+  } else if (WLIBServiceRestart(kSmbService) < 0) {
+    FILEINDEX_LOG_PLATFORM_FAILURE("WLIBServiceRestart");
+  }
+}
+
+bool TellDaemonOfFolder(const std::string& type, const std::string& path) {
+  Json::Value command(Json::objectValue);
+  command["folder_path"] = path;
+  if (!SendCammandToDaemon(type, command)) {
+    FILEINDEX_LOG("SendCammandToDaemon failed");
+    return false;
+  }
+  return true;
+}
+
+Json::Value ShareCommand(const std::string& share) {
+  Json::Value data(Json::objectValue);
+  data["share_name"] = share;
+  return data;
+}
+
+// Removes `path` with the system's rm; a path that is missing or stays is not looked at.
+void RemoveTree(const std::string& path) {
+  (void)WLIBCExec("/bin/rm", "-rf", path.c_str(), nullptr, nullptr);
+}
+
+bool UpsertFolders(const Json::Value& request) {
+  if (!request.isArray()) {
+    RefuseRequest(__LINE__, request);
+    return false;
+  }
+  Folders list;
+  const UnlockOnExit unlock(list);
+  std::vector<Folder> current;
+  if (!list.Lock(true) || !list.Load() || !list.List(current)) {
+    return false;
+  }
+
+  std::vector<std::string> paths;
+  std::map<std::string, Json::Value> changed;  // a later element replaces an earlier report
+  std::set<std::string> shares;
+  for (const Json::Value& element : request) {
+    const std::string path = element.get("path", "").asString();
+    Json::Value report;
+    if (!list.Upsert(report, element)) {
+      FILEINDEX_LOG("Upsert failed, folder=%s", JsonToString(element).c_str());
+      return false;
+    }
+    changed[path] = report;
+    std::string share;
+    if (!GetShareNameByPath(share, path)) {
+      FILEINDEX_LOG("GetShareNameByPath failed, path=%s", path.c_str());
+      return false;
+    }
+    shares.insert(share);
+    paths.push_back(path);
+  }
+  if (!list.Save()) {
+    return false;
+  }
+
+  for (const std::string& share : shares) {
+    if (!IndexMgr::UpsertWEZotifydCfg(share)) {
+      FILEINDEX_LOG("UpsertWEZtifydCfg failed, share=%s", share.c_str());
+      return false;
+    }
+  }
+  // Started on every call: starting a running service is harmless, and it may have stopped.
+  if (WLIBServiceStart(kIndexService, kServiceFlags) < 0) {
+    FILEINDEX_LOG_PLATFORM_FAILURE("WLIBServiceStart");
+    return false;
+  }
+  EnableSpotlight();
+  for (const std::string& path : paths) {
+    if (!TellDaemonOfFolder("upsert_folder_setting", path)) {
+      return false;
+    }
+  }
+  for (const auto& [path, report] : changed) {
+    if (!IndexMgr::Update(path, report)) {
+      return false;
+    }
+  }
+  return true;
+}
+
+bool DeleteFolders(const Json::Value& request) {
+  bool wellFormed = request.isArray();
+  for (Json::ArrayIndex i = 0; wellFormed && i < request.size(); ++i) {
+    wellFormed = request[i].isString();
+  }
+  if (!wellFormed) {
+    RefuseRequest(__LINE__, request);
+    return false;
+  }
+  Folders list;
+  const UnlockOnExit unlock(list);
+  if (!list.Lock(true) || !list.Load()) {
+    return false;
+  }
+
+  Json::Value lastReport;  // the report of the last path only
+  std::set<std::string> shares;
+  for (const Json::Value& element : request) {
+    const std::string path = element.asString();
+    lastReport = Json::Value();
+    if (!list.Delete(lastReport, path)) {
+      FILEINDEX_LOG("Delete failed, path=%s", path.c_str());
+      return false;
+    }
+    std::string share;
+    if (!GetShareNameByPath(share, path)) {
+      FILEINDEX_LOG("GetShareNameByPath failed, path=%s", path.c_str());
+      return false;
+    }
+    shares.insert(share);
+  }
+  if (!list.Save()) {
+    return false;
+  }
+
+  std::vector<Folder> remaining;
+  list.List(remaining);
+  if (remaining.empty()) {
+    StopIndexing();
+  } else {
+    for (const Json::Value& element : request) {
+      if (!TellDaemonOfFolder("delete_folder_setting", element.asString())) {
+        return false;
+      }
+    }
+    // Only the last path is queued: the daemon re-reads the settings of the others through their
+    // commands.
+    for (const std::string& path : lastReport.getMemberNames()) {
+      if (!IndexMgr::Update(path, lastReport[path])) {
+        FILEINDEX_LOG("Update failed");
+        return false;
+      }
+    }
+  }
+
+  for (const std::string& share : shares) {
+    if (IndexMgr::IsShareIndexed(share)) {
+      // The monitor goes on watching only the share's remaining folders.
+      if (!IndexMgr::UpsertWEZotifydCfg(share)) {
+        FILEINDEX_LOG("UpsertWEZotifydCfg failed, share=%s", share.c_str());
+        return false;
+      }
+      continue;
+    }
+    if (!IndexMgr::CleanShareIndexData(share)) {
+      FILEINDEX_LOG("CleanShareIndexData failed, share=%s", share.c_str());
+      return false;
+    }
+    if (!IndexMgr::DeleteWEZotifydCfg(share)) {
+      FILEINDEX_LOG("DeleteWEZtifydCfg failed, share=%s", share.c_str());
+      return false;
+    }
+  }
+  return true;
+}
+
+bool ReindexPaths(const Json::Value& request) {
+  if (!request.isArray()) {
+    FILEINDEX_LOG("Malformed jsArrPath: %s", JsonToString(request).c_str());
+    ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
+    return false;
+  }
+  // Every element is checked before anything is queued.
+  std::set<std::string> noSpace;
+  for (const Json::Value& element : request) {
+    if (!element.isString()) {
+      FILEINDEX_LOG("Malformed jsArrPath: %s", JsonToString(element).c_str());
+      ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
+      return false;
+    }
+    std::string share;
+    if (!GetShareNameByPath(share, element.asString())) {
+      FILEINDEX_LOG("Failed to get share name from path: %s", element.asCString());
+      return false;
+    }
+    if (!IndexMgr::IsShareIndexed(share)) {
+      return false;
+    }
+    if (StatusMgr::ShareIsNoSpace(share)) {
+      noSpace.insert(share);
+    }
+  }
+  // A share out of room gets its worker back so that the reindex can run; if that fails the
+  // events are queued all the same and wait for the share.
+  for (const std::string& share : noSpace) {
+    if (!StatusMgr::ShareRevive(share)) {
+      FILEINDEX_LOG("ShareRevice failed, share=%s", share.c_str());
+    }
+  }
+  for (const Json::Value& element : request) {
+    const std::string path = element.asString();
+    std::string fullPath;
+    if (!GetFullPath(fullPath, path)) {
+      FILEINDEX_LOG("GetFullPath failed, path=%s", path.c_str());
+      ErrorHandler::SetError(FILEINDEX_ERR_PATH);
+      return false;
+    }
+    if (!AddCustomEvent(kEventReindex, fullPath, Json::Value())) {
+      FILEINDEX_LOG("AddCustomEvent failed, path=%s", path.c_str());
+      return false;
+    }
+  }
+  return true;
+}
 
 }  // namespace
 
 bool IndexMgr::List(std::vector<Folder>& folders) {
   Folders list;
   return list.Load() && list.List(folders);
+}
+
+bool IndexMgr::List(Json::Value& result, unsigned long offset, unsigned long limit,
+                    const std::string& sortBy, const std::string& sortDirection,
+                    const Json::Value& additional) {
+  return RefuseOnJsonError(additional, [&] {
+    Folders list;
+    return list.Load() && list.List(result, offset, limit, sortBy, sortDirection, additional);
+  });
+}
+
+bool IndexMgr::Get(Json::Value& result, const std::string& path) {
+  Folders list;
+  const UnlockOnExit unlock(list);
+  return list.Lock(true) && list.Load() && list.Get(result, path);
+}
+
+bool IndexMgr::IsPathIndexed(const std::string& path, const std::vector<Folder>& folders) {
+  const std::string target = path + "/";
+  for (const Folder& folder : folders) {
+    if (StringStartWith(target, folder.GetPath() + "/")) {
+      return true;
+    }
+  }
+  return false;
+}
+
+bool IndexMgr::IsFullPathIndexed(const std::string& fullPath, const std::vector<Folder>& folders) {
+  const std::string target = fullPath + "/";
+  for (const Folder& folder : folders) {
+    if (StringStartWith(target, folder.GetFullPath() + "/")) {
+      return true;
+    }
+  }
+  return false;
+}
+
+bool IndexMgr::IsPathContainIndexed(const std::string& path, const std::vector<Folder>& folders) {
+  const std::string ancestor = path + "/";
+  for (const Folder& folder : folders) {
+    if (StringStartWith(folder.GetPath() + "/", ancestor)) {
+      return true;
+    }
+  }
+  return false;
+}
+
+bool IndexMgr::IsPathIndexed(const std::string& path) {
+  std::vector<Folder> folders;
+  return List(folders) && IsPathIndexed(path, folders);
+}
+
+bool IndexMgr::IsFullPathIndexed(const std::string& fullPath) {
+  std::vector<Folder> folders;
+  return List(folders) && IsFullPathIndexed(fullPath, folders);
+}
+
+bool IndexMgr::IsPathContainIndexed(const std::string& path) {
+  std::vector<Folder> folders;
+  return List(folders) && IsPathContainIndexed(path, folders);
+}
+
+bool IndexMgr::IsShareIndexed(const std::string& share) {
+  std::vector<Folder> folders;
+  if (!List(folders)) {
+    return false;
+  }
+  for (const Folder& folder : folders) {
+    std::string name;
+    if (!GetShareNameByPath(name, folder.GetPath())) {
+      FILEINDEX_LOG("Failed to get share name from path: %s", folder.GetPath().c_str());
+      continue;
+    }
+    if (name == share) {
+      return true;
+    }
+  }
+  return false;
+}
+
+bool IndexMgr::Upsert(const Json::Value& folders) {
+  return RefuseOnJsonError(folders, [&] { return UpsertFolders(folders); });
+}
+
+bool IndexMgr::Set(const Json::Value& folders) { return Upsert(folders); }
+
+bool IndexMgr::Add(const Json::Value& folders) { return Upsert(folders); }
+
+bool IndexMgr::Delete(const Json::Value& paths) {
+  return RefuseOnJsonError(paths, [&] { return DeleteFolders(paths); });
+}
+
+bool IndexMgr::Reindex(const Json::Value& paths) {
+  return RefuseOnJsonError(paths, [&] { return ReindexPaths(paths); });
+}
+
+bool IndexMgr::Update(const std::string& path, const Json::Value& data) {
+  std::string fullPath;
+  if (!GetFullPath(fullPath, path)) {
+    FILEINDEX_LOG("GetFullPath failed, path=%s", path.c_str());
+    ErrorHandler::SetError(FILEINDEX_ERR_PATH);
+    return false;
+  }
+  if (!AddCustomEvent(kEventUpdate, fullPath, data)) {
+    FILEINDEX_LOG("AddCustomEvent failed");
+    return false;
+  }
+  return true;
+}
+
+bool IndexMgr::ShareRemove(const std::string& share) {
+  Folders list;
+  const UnlockOnExit unlock(list);
+  std::vector<Folder> folders;
+  if (!list.Lock(true) || !list.Load() || !list.List(folders, share)) {
+    return false;
+  }
+  Json::Value report;
+  for (const Folder& folder : folders) {
+    if (!list.Delete(report, folder.GetPath())) {
+      return false;
+    }
+  }
+  if (!list.Save()) {
+    return false;
+  }
+  std::vector<Folder> remaining;
+  list.List(remaining);
+  if (remaining.empty()) {
+    StopIndexing();
+  }
+  return true;
+}
+
+bool IndexMgr::ShareRename(const std::string& oldShare, const std::string& newShare) {
+  Folders list;
+  const UnlockOnExit unlock(list);
+  std::vector<Folder> folders;
+  if (!list.Lock(true) || !list.Load() || !list.List(folders, oldShare)) {
+    return false;
+  }
+  Json::Value report;
+  for (Folder& folder : folders) {
+    if (!list.Delete(report, folder.GetPath())) {
+      return false;
+    }
+    // The name and the settings travel with the record; the index data lies inside the share
+    // and moves with it.
+    folder.SetPath(ReplaceShareName(folder.GetPath(), newShare));
+    if (!list.Upsert(report, folder.asJson())) {
+      return false;
+    }
+  }
+  return list.Save();
+}
+
+bool IndexMgr::SharePause(const std::string& share) {
+  // The worker stops first, so that nothing of the share is indexed once the monitor stops
+  // reporting its changes.
+  if (!SendCammandToDaemon("delete_share_worker", ShareCommand(share))) {
+    return false;
+  }
+  if (!DeleteWEZotifydCfg(share)) {
+    FILEINDEX_LOG("DeleteWEZotifydCfg failed, share=%s", share.c_str());
+    return false;
+  }
+  return true;
+}
+
+bool IndexMgr::ShareResume(const std::string& share) {
+  // The monitor first, so that no change made while the worker starts is missed.
+  if (!UpsertWEZotifydCfg(share)) {
+    FILEINDEX_LOG("UpsertWEZotifydCfg failed, share=%s", share.c_str());
+    return false;
+  }
+  return SendCammandToDaemon("revive_share_worker", ShareCommand(share));
+}
+
+bool IndexMgr::CleanShareIndexData(const std::string& share) {
+  char location[kLocationSize] = {};
+  if (FILEIDXQueuePathGet(share.c_str(), location, kLocationSize) < 0) {
+    FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", share.c_str());
+    return false;
+  }
+  const std::string queue = location;
+  RemoveTree(queue);
+  RemoveTree(queue + ".tmp");
+  if (FILEIDXDBPathGet(share.c_str(), location, kLocationSize) < 0) {
+    FILEINDEX_LOG("FILEIDXDBPathGet failed, share=%s", share.c_str());
+    return false;
+  }
+  RemoveTree(location);
+  return true;
 }
 
 bool IndexMgr::UpsertWEZotifydCfg(const std::string& share) {

@@ -1,6 +1,7 @@
 #include "log.h"
 
 #include <syslog.h>
+#include <wezo/platform.h>
 
 #include <cerrno>
 #include <cstdarg>
@@ -61,6 +62,12 @@ void WriteLog(bool debugOnly, const char* unit, int line, const char* format, ..
   const std::string text = std::string(unit) + ":" + std::to_string(line) + " " + message;
   g_sink(LOG_ERR, text.c_str());
   errno = savedErrno;
+}
+
+void WritePlatformFailure(const char* unit, int line, const char* what) {
+  const char* file = WLIBCErrorGetFile();
+  WriteLog(false, unit, line, "%s failed: err=[0x%04X %s:%d]", what,
+           static_cast<unsigned>(WLIBCErrGet()), file != nullptr ? file : "", WLIBCErrorGetLine());
 }
 
 }  // namespace detail

@@ -31,6 +31,10 @@ std::string ErrnoText();
 void WriteLog(bool debugOnly, const char* unit, int line, const char* format, ...)
     __attribute__((format(gnu_printf, 4, 5)));
 
+// Writes "<unit>:<line> <what> failed: err=[0x<code> <file>:<line>]" with the platform's last
+// error: its code in four hex digits and the platform source place that set it.
+void WritePlatformFailure(const char* unit, int line, const char* what);
+
 }  // namespace detail
 }  // namespace FILEINDEX
 }  // namespace WEZO
@@ -39,5 +43,8 @@ void WriteLog(bool debugOnly, const char* unit, int line, const char* format, ..
   ::WEZO::FILEINDEX::detail::WriteLog(false, FILEINDEX_LOG_UNIT, __LINE__, __VA_ARGS__)
 #define FILEINDEX_LOG_DEBUG(...) \
   ::WEZO::FILEINDEX::detail::WriteLog(true, FILEINDEX_LOG_UNIT, __LINE__, __VA_ARGS__)
+
+#define FILEINDEX_LOG_PLATFORM_FAILURE(what) \
+  ::WEZO::FILEINDEX::detail::WritePlatformFailure(FILEINDEX_LOG_UNIT, __LINE__, what)
 
 #endif  // FILEINDEX_SRC_LOG_H_

@@ -5,7 +5,9 @@
 #include <filesystem>
 #include <string>
 
+#include "c_queries_check.h"
 #include "fake_platform.h"
+#include "fileindex/error.h"
 #include "fileindex/index_mgr.h"
 #include "paths.h"
 #include "test_support.h"
@@ -17,6 +19,88 @@ namespace {
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
 using testsupport::ParseJson;
+
+class QueryTest : public testsupport::LibraryTest {
+ protected:
+  QueryTest() {
+    testsupport::WriteFile(FolderConfPath(), R"({"/photo":{},"/video/clips":{"video":true}})");
+  }
+};
+
+TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
+  struct Case {
+    const char* path;
+    bool indexed;   // IsPathIndexed, and IsFullPathIndexed of the path on the volume
+    bool contains;  // IsPathContainIndexed
+  } cases[] = {
+      {"/photo", true, true},
+      {"/photo/2016/a.jpg", true, false},
+      {"/photos", false, false},
+      {"/photo/", true, false},
+      {"/Photo", false, false},
+      {"/video", false, true},
+      {"/video/clips", true, true},
+      {"/video/clips/x", true, false},
+      {"/video/clip", false, false},
+      {"/", false, false},
+      {"", false, true},
+  };
+  std::vector<Folder> folders;
+  ASSERT_TRUE(IndexMgr::List(folders));
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.path);
+    EXPECT_EQ(IndexMgr::IsPathIndexed(c.path), c.indexed);
+    EXPECT_EQ(IndexMgr::IsPathIndexed(c.path, folders), c.indexed);
+    EXPECT_EQ(IndexMgr::IsFullPathIndexed(volume + c.path), c.indexed && *c.path != '\0');
+    EXPECT_EQ(IndexMgr::IsPathContainIndexed(c.path), c.contains);
+    EXPECT_EQ(IndexMgr::IsPathContainIndexed(c.path, folders), c.contains);
+  }
+  EXPECT_FALSE(IndexMgr::IsFullPathIndexed("/photo")) << "a share path is not a full path";
+  EXPECT_TRUE(IndexMgr::IsShareIndexed("video"));
+  for (const char* share : {"vid", "/video", "", "Video"}) {
+    EXPECT_FALSE(IndexMgr::IsShareIndexed(share)) << share;
+  }
+  EXPECT_EQ(CheckCQueries(volume.c_str()), 0) << "the C interface answers the same";
+  EXPECT_THAT(log.Lines(), IsEmpty());
+  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_NONE) << "the queries set no code";
+}
+
+TEST_F(QueryTest, AListThatCannotBeReadAnswersNoToEveryQuestion) {
+  for (const char* text : {"{}", "[1]", "{"}) {
+    SCOPED_TRACE(text);
+    testsupport::WriteFile(FolderConfPath(), text);
+    std::vector<Folder> folders;
+    EXPECT_EQ(IndexMgr::List(folders), std::string(text) == "{}");
+    EXPECT_FALSE(IndexMgr::IsPathIndexed("/photo"));
+    EXPECT_FALSE(IndexMgr::IsFullPathIndexed(volume + "/photo"));
+    EXPECT_FALSE(IndexMgr::IsPathContainIndexed(""));
+    EXPECT_FALSE(IndexMgr::IsShareIndexed("photo"));
+  }
+}
+
+TEST_F(QueryTest, AStoredPathWithoutAShareIsLoggedAndSkipped) {
+  testsupport::WriteFile(FolderConfPath(), R"({"":{},"/video/clips":{}})");
+  log.Clear();
+  EXPECT_TRUE(IndexMgr::IsShareIndexed("video"));
+  EXPECT_FALSE(IndexMgr::IsShareIndexed("photo"));
+  EXPECT_THAT(log.Lines(),
+              ::testing::Contains("index_mgr:N Failed to get share name from path: ").Times(2));
+}
+
+TEST_F(QueryTest, ListPagesAndGetReadsOneFolder) {
+  Json::Value page;
+  ASSERT_TRUE(IndexMgr::List(page, 1, 5, "name", "ASC", ParseJson(R"(["is_valid"])")));
+  EXPECT_EQ(page["total"].asInt(), 2);
+  ASSERT_EQ(page["folder"].size(), 1U);
+  EXPECT_EQ(page["folder"][0]["path"], "/video/clips");
+  EXPECT_TRUE(page["folder"][0]["additional"].isMember("is_valid"));
+
+  Json::Value folder;
+  ASSERT_TRUE(IndexMgr::Get(folder, "/video/clips"));
+  EXPECT_EQ(folder["video"], true);
+  EXPECT_FALSE(IndexMgr::Get(folder, "/video"));
+  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_NO_SUCH_FOLDER);
+}
 
 class MonitorRegistrationTest : public testsupport::LibraryTest {
  protected:

@@ -31,6 +31,20 @@ FILEINDEX_EXPORT int FILEIDXQueuePathGet(const char* szName, char* szOutQueuePat
  * FILEIDXQueuePathGet; a directory that cannot be created is logged and does not fail the call. */
 FILEINDEX_EXPORT int FILEIDXDBPathGet(const char* szName, char* szOutDBPath, int cbOutLen);
 
+/* The questions whether something is indexed. Each reads the folder list afresh and answers 1 or
+ * 0, never anything else; a folder list that cannot be read, and a null argument, give 0. Paths
+ * are compared byte for byte with "/" as the boundary: "/photo/2019" lies in the indexed folder
+ * "/photo", "/photos" and "/photo/" do not. None of them logs or changes the last error code. */
+
+/* 1 when the full path fullPath ("/volume1/photo/2019") is an indexed folder or lies in one. */
+FILEINDEX_EXPORT int FILEIDXIsFullPathIndexed(const char* fullPath);
+
+/* 1 when the share path path ("/photo/2019") is an indexed folder or lies in one. */
+FILEINDEX_EXPORT int FILEIDXIsPathIndexed(const char* path);
+
+/* 1 when at least one indexed folder lies in the share named shareName ("photo"). */
+FILEINDEX_EXPORT int FILEIDXIsShareIndexed(const char* shareName);
+
 #ifdef __cplusplus
 } /* extern "C" */
 #endif

@@ -67,6 +67,16 @@ FILEINDEX_EXPORT std::string ReplaceShareName(const std::string& path,
 // true when it ran and succeeded. Neither logs nor sets a code.
 FILEINDEX_EXPORT bool NotifyNoSpace();
 
+// The upgrade step of release hxo60 beta 2, run once by the upgrade procedure: brings what derives
+// from the folder list into line with it. With no indexed folder, the service fileindexd is
+// stopped and nothing else is touched. Otherwise the service is started, Spotlight over SMB
+// switched on (the SMB service is not restarted), every share with indexed folders registered
+// again with the file-change monitor, and every indexed folder queued for a full reindex
+// (IndexMgr::Reindex). Reads the folder list without its lock; writes no configuration file.
+// Running it again repeats the same steps. False at the first failure, logged, with the code of
+// the failing step; what was done before it stays done.
+FILEINDEX_EXPORT bool Updater_hxo60_beta2();  // NOLINT(readability-identifier-naming)
+
 }  // namespace FILEINDEX
 }  // namespace WEZO
 
