@@ -265,6 +265,63 @@ TEST_F(IndexOpsTest, AnotherWriterHoldingTheListLockMakesChangesFailWithNothingT
   EXPECT_TRUE(IndexMgr::IsPathIndexed("/photo/a")) << "the queries read without the lock";
 }
 
+TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {
+  FakeDaemon daemon;
+  WriteFile(FolderConfPath(), R"({"/photo/a":{"photo":true}})");
+  const std::string before = ReadFile(FolderConfPath());
+  // Each shape is malformed for every operation below; several make jsoncpp throw when a value
+  // is read as a type it does not have.
+  const char* shapes[] = {
+      "{}",
+      R"({"path":"/photo/b"})",
+      R"("/photo/a")",
+      "1",
+      "null",
+      "true",
+      "[1]",
+      "[null]",
+      "[true]",
+      "[[1]]",
+      "[{}]",
+      R"([{"path":{}}])",
+      R"([{"path":1}])",
+      R"([{"path":["/photo/b"]}])",
+      R"([{"path":"/photo/b"},"/photo/a"])",
+      R"(["/photo/a",{"path":"/photo/b"}])",
+      R"([{"path":"/photo/b"},[1]])",
+  };
+  const std::pair<const char*, bool (*)(const Json::Value&)> operations[] = {
+      {"Upsert", &IndexMgr::Upsert}, {"Set", &IndexMgr::Set},         {"Add", &IndexMgr::Add},
+      {"Delete", &IndexMgr::Delete}, {"Reindex", &IndexMgr::Reindex},
+  };
+  for (const auto& [name, operation] : operations) {
+    for (const char* shape : shapes) {
+      SCOPED_TRACE(std::string(name) + " " + shape);
+      ErrorHandler::SetError(FILEINDEX_ERR_NONE);
+      log.Clear();
+      bool result = true;
+      EXPECT_NO_THROW(result = operation(ParseJson(shape)));
+      EXPECT_FALSE(result);
+      EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_BAD_PARAM);
+      EXPECT_THAT(log.Lines(), ::testing::Contains(::testing::AnyOf(
+                                   ::testing::HasSubstr("Bad param: "),
+                                   ::testing::HasSubstr("Malformed jsArrPath: "))));
+      EXPECT_EQ(ReadFile(FolderConfPath()), before);
+    }
+  }
+  EXPECT_THAT(Effects(), IsEmpty());
+  EXPECT_THAT(Events("photo"), IsEmpty());
+  EXPECT_THAT(daemon.Connections(1, std::chrono::milliseconds(200)), IsEmpty());
+  Json::Value folder;
+  EXPECT_TRUE(IndexMgr::Get(folder, "/photo/a")) << "no refusal left the lock held";
+
+  for (const char* additional : {R"("is_valid")", "[1]", "[[1]]", R"({"a":1})"}) {
+    Json::Value page;
+    EXPECT_NO_THROW(EXPECT_TRUE(IndexMgr::List(page, 0, 10, "", "", ParseJson(additional))));
+    EXPECT_EQ(page["folder"][0]["path"], "/photo/a") << additional;
+  }
+}
+
 TEST_F(IndexOpsTest, DeletingTheLastFolderStopsTheServiceAndCleansTheShare) {
   struct Case {
     const char* name;
