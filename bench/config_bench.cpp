@@ -1,6 +1,7 @@
 // Costs of the configuration file cycle on a full folder list (1000 folders): load, save, and
 // one lock-unlock cycle; then the folder list's own work on it: loading into records (one share
-// lookup per folder), a sorted page, and a change of one folder with its change report. Runs in a
+// lookup per folder), a sorted page, a change of one folder with its change report, and the
+// questions whether a path or a share is indexed, each reading the list afresh. Runs in a
 // temporary root of its own, over the fake platform.
 //
 //   build/bench/fileindex_bench [--benchmark_filter=...]
@@ -14,7 +15,9 @@
 
 #include "fake_platform.h"
 #include "fileindex/config.h"
+#include "fileindex/fileindex_c.h"
 #include "fileindex/folders.h"
+#include "fileindex/index_mgr.h"
 #include "fileindex/root.h"
 #include "paths.h"
 
@@ -133,5 +136,24 @@ void BM_UpsertIntoFullList(benchmark::State& state) {
   }
 }
 BENCHMARK(BM_UpsertIntoFullList);
+
+// The question file services ask most, through the C interface: the whole folder list is read
+// for every call. The path lies in the last folder, so every folder is compared.
+void BM_CIsPathIndexedOnFullList(benchmark::State& state) {
+  Root root(1000);
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(FILEIDXIsPathIndexed("/photo/100999/a/b.jpg"));
+  }
+}
+BENCHMARK(BM_CIsPathIndexedOnFullList);
+
+// A share with no indexed folder: every folder's share name is taken and compared.
+void BM_IsShareIndexedOnFullList(benchmark::State& state) {
+  Root root(1000);
+  for (auto _ : state) {
+    benchmark::DoNotOptimize(WEZO::FILEINDEX::IndexMgr::IsShareIndexed("video"));
+  }
+}
+BENCHMARK(BM_IsShareIndexedOnFullList);
 
 }  // namespace
