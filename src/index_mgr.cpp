@@ -6,6 +6,7 @@
 #include <wezo/platform.h>
 #include <wezo/wezotifyd.h>
 
+#include <algorithm>
 #include <exception>
 #include <map>
 #include <memory>
@@ -121,6 +122,28 @@ void RemoveTree(const std::string& path) {
   (void)WLIBCExec("/bin/rm", "-rf", path.c_str(), nullptr, nullptr);
 }
 
+// After folders of the share `share` left the list: the monitor goes on watching the share's
+// remaining folders, or, with none left, the share's index data is removed and the monitor
+// forgets the share.
+bool FollowRemovedFolders(const std::string& share) {
+  if (IndexMgr::IsShareIndexed(share)) {
+    if (!IndexMgr::UpsertWEZotifydCfg(share)) {
+      FILEINDEX_LOG("UpsertWEZotifydCfg failed, share=%s", share.c_str());
+      return false;
+    }
+    return true;
+  }
+  if (!IndexMgr::CleanShareIndexData(share)) {
+    FILEINDEX_LOG("CleanShareIndexData failed, share=%s", share.c_str());
+    return false;
+  }
+  if (!IndexMgr::DeleteWEZotifydCfg(share)) {
+    FILEINDEX_LOG("DeleteWEZtifydCfg failed, share=%s", share.c_str());
+    return false;
+  }
+  return true;
+}
+
 bool UpsertFolders(const Json::Value& request) {
   if (!request.isArray()) {
     RefuseRequest(__LINE__, request);
@@ -173,20 +196,15 @@ bool UpsertFolders(const Json::Value& request) {
       return false;
     }
   }
-  for (const auto& [path, report] : changed) {
-    if (!IndexMgr::Update(path, report)) {
-      return false;
-    }
-  }
-  return true;
+  return std::all_of(changed.begin(), changed.end(), [](const auto& pathAndReport) {
+    return IndexMgr::Update(pathAndReport.first, pathAndReport.second);
+  });
 }
 
 bool DeleteFolders(const Json::Value& request) {
-  bool wellFormed = request.isArray();
-  for (Json::ArrayIndex i = 0; wellFormed && i < request.size(); ++i) {
-    wellFormed = request[i].isString();
-  }
-  if (!wellFormed) {
+  if (!request.isArray() ||
+      !std::all_of(request.begin(), request.end(),
+                   [](const Json::Value& element) { return element.isString(); })) {
     RefuseRequest(__LINE__, request);
     return false;
   }
@@ -236,25 +254,7 @@ bool DeleteFolders(const Json::Value& request) {
     }
   }
 
-  for (const std::string& share : shares) {
-    if (IndexMgr::IsShareIndexed(share)) {
-      // The monitor goes on watching only the share's remaining folders.
-      if (!IndexMgr::UpsertWEZotifydCfg(share)) {
-        FILEINDEX_LOG("UpsertWEZotifydCfg failed, share=%s", share.c_str());
-        return false;
-      }
-      continue;
-    }
-    if (!IndexMgr::CleanShareIndexData(share)) {
-      FILEINDEX_LOG("CleanShareIndexData failed, share=%s", share.c_str());
-      return false;
-    }
-    if (!IndexMgr::DeleteWEZotifydCfg(share)) {
-      FILEINDEX_LOG("DeleteWEZtifydCfg failed, share=%s", share.c_str());
-      return false;
-    }
-  }
-  return true;
+  return std::all_of(shares.begin(), shares.end(), FollowRemovedFolders);
 }
 
 bool ReindexPaths(const Json::Value& request) {
@@ -330,32 +330,23 @@ bool IndexMgr::Get(Json::Value& result, const std::string& path) {
 
 bool IndexMgr::IsPathIndexed(const std::string& path, const std::vector<Folder>& folders) {
   const std::string target = path + "/";
-  for (const Folder& folder : folders) {
-    if (StringStartWith(target, folder.GetPath() + "/")) {
-      return true;
-    }
-  }
-  return false;
+  return std::any_of(folders.begin(), folders.end(), [&](const Folder& folder) {
+    return StringStartWith(target, folder.GetPath() + "/");
+  });
 }
 
 bool IndexMgr::IsFullPathIndexed(const std::string& fullPath, const std::vector<Folder>& folders) {
   const std::string target = fullPath + "/";
-  for (const Folder& folder : folders) {
-    if (StringStartWith(target, folder.GetFullPath() + "/")) {
-      return true;
-    }
-  }
-  return false;
+  return std::any_of(folders.begin(), folders.end(), [&](const Folder& folder) {
+    return StringStartWith(target, folder.GetFullPath() + "/");
+  });
 }
 
 bool IndexMgr::IsPathContainIndexed(const std::string& path, const std::vector<Folder>& folders) {
   const std::string ancestor = path + "/";
-  for (const Folder& folder : folders) {
-    if (StringStartWith(folder.GetPath() + "/", ancestor)) {
-      return true;
-    }
-  }
-  return false;
+  return std::any_of(folders.begin(), folders.end(), [&](const Folder& folder) {
+    return StringStartWith(folder.GetPath() + "/", ancestor);
+  });
 }
 
 bool IndexMgr::IsPathIndexed(const std::string& path) {
