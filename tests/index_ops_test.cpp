@@ -11,6 +11,7 @@
 #include <optional>
 #include <sstream>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "fake_platform.h"
@@ -235,6 +236,39 @@ TEST_F(IndexOpsTest, UpsertFailuresAfterTheSaveKeepTheListAndSkipTheRest) {
     for (size_t i = 0; i < lines.size(); ++i) {
       EXPECT_THAT(lines[i], StartsWith(c.lines[i]));
     }
+  }
+}
+
+TEST_F(IndexOpsTest, TheDaemonIsToldOfASavedListWhileTheLockIsStillHeld) {
+  WriteFile(FolderConfPath(), R"({"/video/v":{}})");
+  struct Step {
+    std::function<bool()> operation;
+    std::vector<std::string> saved;
+  } steps[] = {
+      {[] { return IndexMgr::Upsert(ParseJson(R"([{"path":"/photo/a"}])")); },
+       {"/photo/a", "/video/v"}},
+      {[] { return IndexMgr::Delete(ParseJson(R"(["/photo/a"])")); }, {"/video/v"}},
+  };
+  for (const Step& step : steps) {
+    FakeDaemon daemon(FakeDaemon::Behaviour::kHoldConnect);
+    bool result = false;
+    std::thread caller([&] { result = step.operation(); });
+    // The caller blocks in connect until the daemon accepts: by then the list must be saved and
+    // its lock still held.
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(5);
+    while (FolderConf().getMemberNames() != step.saved &&
+           std::chrono::steady_clock::now() < deadline) {
+      std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    }
+    EXPECT_EQ(FolderConf().getMemberNames(), step.saved);
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    Json::Value folder;
+    EXPECT_FALSE(IndexMgr::Get(folder, "/video/v")) << "the lock is held";
+    daemon.Release();
+    caller.join();
+    EXPECT_TRUE(result);
+    EXPECT_EQ(daemon.Commands(1).size(), 1U);
+    EXPECT_TRUE(IndexMgr::Get(folder, "/video/v"));
   }
 }
 
