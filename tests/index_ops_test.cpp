@@ -16,6 +16,8 @@
 
 #include "fake_platform.h"
 #include "fileindex/error.h"
+#include "fileindex/folder.h"
+#include "fileindex/folders.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/status_mgr.h"
 #include "fileindex/utils.h"
@@ -348,6 +350,25 @@ TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {
   EXPECT_THAT(daemon.Connections(1, std::chrono::milliseconds(200)), IsEmpty());
   Json::Value folder;
   EXPECT_TRUE(IndexMgr::Get(folder, "/photo/a")) << "no refusal left the lock held";
+
+  // The configuration classes take the same shapes, and the elements inside them, without
+  // throwing.
+  for (const char* shape : shapes) {
+    const Json::Value request = ParseJson(shape);
+    for (const Json::Value& value : {request, request.isArray() ? request[0] : request}) {
+      Folders list;
+      Folder folder;
+      Json::Value out = value;
+      EXPECT_NO_THROW({
+        list.Upsert(out, value);
+        folder.Load("/photo/a", value);
+        folder.Reload("/photo/a", value);
+        folder.AddToJson(out);
+        folder.GetAdditional(out, value);
+        folder.asJson(value);
+      }) << shape;
+    }
+  }
 
   for (const char* additional : {R"("is_valid")", "[1]", "[[1]]", R"({"a":1})"}) {
     Json::Value page;
