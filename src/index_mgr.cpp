@@ -101,6 +101,12 @@ void StopIndexing() {
   }
 }
 
+bool HoldsNoFolder(const Folders& list) {
+  std::vector<Folder> folders;
+  list.List(folders);
+  return folders.empty();
+}
+
 bool TellDaemonOfFolder(const std::string& type, const std::string& path) {
   Json::Value command(Json::objectValue);
   command["folder_path"] = path;
@@ -234,9 +240,7 @@ bool DeleteFolders(const Json::Value& request) {
     return false;
   }
 
-  std::vector<Folder> remaining;
-  list.List(remaining);
-  if (remaining.empty()) {
+  if (HoldsNoFolder(list)) {
     StopIndexing();
   } else {
     for (const Json::Value& element : request) {
@@ -428,9 +432,7 @@ bool IndexMgr::ShareRemove(const std::string& share) {
   if (!list.Save()) {
     return false;
   }
-  std::vector<Folder> remaining;
-  list.List(remaining);
-  if (remaining.empty()) {
+  if (HoldsNoFolder(list)) {
     StopIndexing();
   }
   return true;
