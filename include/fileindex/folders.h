@@ -69,11 +69,12 @@ class FILEINDEX_EXPORT Folders : public Config {
   bool Get(Json::Value& out, const std::string& path) const;
 
   // Adds the folder that `request` describes ("path", a share path, and the fields that
-  // Folder::Load reads), or changes the folder already at that path with the fields the request
-  // carries. On success `result` becomes the change report: {"document", "audio", "video",
-  // "photo"}, each true when the setting that applies at the folder's location differs from the
-  // one that applied before. Returns false with FILEINDEX_ERR_BAD_PARAM (logged) when the request
-  // has no string "path", the path is not a clean absolute share path (empty, "." or ".."
+  // Folder::Load reads), or replaces the settings of the folder already at that path with the
+  // request's: a field the request lacks returns to its default (empty name, kind not indexed),
+  // as Folder::Reload does. On success `result` becomes the change report: {"document", "audio",
+  // "video", "photo"}, each true when the setting that applies at the folder's location differs
+  // from the one that applied before. Returns false with FILEINDEX_ERR_BAD_PARAM (logged) when the
+  // request has no string "path", the path is not a clean absolute share path (empty, "." or ".."
   // components, a trailing slash) or its share is unknown; with FILEINDEX_ERR_EXCEED_MAX_FOLDER
   // (logged) when a new folder would make more than kMaxFolders. After a false result the list in
   // memory may hold the refused folder: do not save it.

@@ -68,7 +68,8 @@ class FILEINDEX_EXPORT IndexMgr {
 
   // Adds folders to the list or changes their settings. `folders` is an array of folder
   // descriptions, each {"path": <share path>, "name": ..., "document": ..., "audio": ...,
-  // "video": ..., "photo": ...} as Folders::Upsert takes it. In order: the list is saved; each
+  // "video": ..., "photo": ...} as Folders::Upsert takes it (a listed folder takes the element's
+  // settings, with the ones it lacks at their defaults). In order: the list is saved; each
   // share concerned is registered again with the monitor (ascending by name); the service
   // fileindexd is started; Spotlight over SMB is switched on, and the SMB service restarted,
   // when it was off (a failure there is only logged); the daemon gets one "upsert_folder_setting"
