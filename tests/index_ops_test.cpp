@@ -100,7 +100,7 @@ class IndexOpsTest : public testsupport::LibraryTest {
   // Each frame the daemon received as "<type> <data>".
   static std::vector<std::string> Frames(FakeDaemon& daemon, size_t expected) {
     std::vector<std::string> frames;
-    for (const Json::Value& command : daemon.Commands(expected, std::chrono::milliseconds(500))) {
+    for (const Json::Value& command : daemon.Commands(expected)) {
       frames.push_back(command["type"].asString() + " " + JsonToString(command["data"]));
     }
     return frames;
