@@ -157,8 +157,7 @@ bool UpsertFolders(const Json::Value& request) {
   }
   Folders list;
   const UnlockOnExit unlock(list);
-  std::vector<Folder> current;
-  if (!list.Lock(true) || !list.Load() || !list.List(current)) {
+  if (!list.Lock(true) || !list.Load()) {
     return false;
   }
 
@@ -248,8 +247,8 @@ bool DeleteFolders(const Json::Value& request) {
         return false;
       }
     }
-    // Only the last path is queued: the daemon re-reads the settings of the others through their
-    // commands.
+    // Only the setting now in force at the last path is queued as an update; the earlier paths
+    // of the batch have had their commands.
     for (const std::string& path : lastReport.getMemberNames()) {
       if (!IndexMgr::Update(path, lastReport[path])) {
         FILEINDEX_LOG("Update failed");
