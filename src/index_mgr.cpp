@@ -150,6 +150,17 @@ bool FollowRemovedFolders(const std::string& share) {
   return true;
 }
 
+// Adds the share of the share path `path` to `shares`.
+bool AddShareOf(const std::string& path, std::set<std::string>& shares) {
+  std::string share;
+  if (!GetShareNameByPath(share, path)) {
+    FILEINDEX_LOG("GetShareNameByPath failed, path=%s", path.c_str());
+    return false;
+  }
+  shares.insert(share);
+  return true;
+}
+
 bool UpsertFolders(const Json::Value& request) {
   if (!request.isArray()) {
     RefuseRequest(__LINE__, request);
@@ -172,12 +183,9 @@ bool UpsertFolders(const Json::Value& request) {
       return false;
     }
     changed[path] = report;
-    std::string share;
-    if (!GetShareNameByPath(share, path)) {
-      FILEINDEX_LOG("GetShareNameByPath failed, path=%s", path.c_str());
+    if (!AddShareOf(path, shares)) {
       return false;
     }
-    shares.insert(share);
     paths.push_back(path);
   }
   if (!list.Save()) {
@@ -228,12 +236,9 @@ bool DeleteFolders(const Json::Value& request) {
       FILEINDEX_LOG("Delete failed, path=%s", path.c_str());
       return false;
     }
-    std::string share;
-    if (!GetShareNameByPath(share, path)) {
-      FILEINDEX_LOG("GetShareNameByPath failed, path=%s", path.c_str());
+    if (!AddShareOf(path, shares)) {
       return false;
     }
-    shares.insert(share);
   }
   if (!list.Save()) {
     return false;
