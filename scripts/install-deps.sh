@@ -13,6 +13,7 @@ packages=(
   libgmock-dev
   libbenchmark-dev
   libicu-dev
+  libcli11-dev
   # testparm, to check the Samba configuration the platform writes; brings no daemon with it
   samba-common-bin
 )
