@@ -1,0 +1,342 @@
+#!/usr/bin/env bash
+# The sandbox appliance demo: builds the admin tool and the stand-in indexing daemon, sets up a
+# throw-away appliance in a temporary root (shares in smb.conf, stand-ins for the service manager,
+# the notification tool and the daemon) and walks through the library's operations with
+# fileindexctl. Each step shows the tool's output and what changed around it, and checks it:
+# anything that misbehaves stops the demo with a message and a non-zero exit status.
+set -Eeuo pipefail
+export LC_ALL=C # byte order for sorted listings
+cd "$(dirname "$0")/.."
+
+./scripts/install-deps.sh
+cmake -S . -B build >/dev/null
+cmake --build build -j"$(nproc)" --target fileindexctl fileindexd-standin
+ctl_bin=$PWD/build/bin/fileindexctl
+daemon_bin=$PWD/build/bin/fileindexd-standin
+
+# ---------------------------------------------------------------------------------------------
+# Helpers
+
+step_no=0
+step_title="setup"
+daemon_pid=""
+root=""
+
+fail() {
+  printf '\ndemo FAILED in step %s (%s): %s\n' "$step_no" "$step_title" "$*" >&2
+  exit 1
+}
+# A failure inside $(...) is reported once, by the command that used it.
+trap '[ "$BASH_SUBSHELL" -gt 0 ] || fail "command failed (exit $?) at line $LINENO: $BASH_COMMAND"' ERR
+
+cleanup() {
+  if [ -n "$daemon_pid" ]; then
+    kill -TERM "$daemon_pid" 2>/dev/null || true
+    wait "$daemon_pid" 2>/dev/null || true
+  fi
+  if [ -n "$root" ]; then
+    rm -rf "$root"
+  fi
+}
+trap cleanup EXIT
+trap 'exit 130' INT TERM
+
+# Text with the sandbox root written as $ROOT, so that lines stay short.
+short() { sed "s|$root|\$ROOT|g"; }
+indent() { short | sed 's/^/    /'; }
+
+# Lines of FILE after the first N (FILE may be missing).
+lines_after() { if [ -f "$1" ]; then tail -n +"$(($2 + 1))" "$1"; fi; }
+count_lines() { if [ -f "$1" ]; then wc -l <"$1"; else echo 0; fi; }
+
+step() {
+  step_no=$((step_no + 1))
+  step_title=$1
+  printf '\n=== %s. %s ===\n' "$step_no" "$1"
+}
+
+# Runs fileindexctl with the sandbox root, showing the command and its output.
+ctl() {
+  local shown="" arg out
+  for arg in "$@"; do
+    if [[ $arg =~ ^[][A-Za-z0-9_./@:=,+-]+$ ]]; then shown+=" $arg"; else shown+=" '$arg'"; fi
+  done
+  printf '$ fileindexctl%s\n' "$shown" | short
+  out=$("$ctl_bin" --root "$root" "$@" 2>&1) || fail "fileindexctl $* exited with $?: $out"
+  if [ -n "$out" ]; then printf '%s\n' "$out" | indent; fi
+  last_output=$out
+}
+
+# expect_output ARGS... -- TEXT...: runs fileindexctl ARGS and checks that its output holds each
+# TEXT.
+expect_output() {
+  local args=() text
+  while [ "$#" -gt 0 ] && [ "$1" != "--" ]; do args+=("$1"); shift; done
+  [ "$#" -gt 0 ] || fail "expect_output without --"
+  shift
+  ctl "${args[@]}"
+  for text in "$@"; do
+    grep -qF -- "$text" <<<"$last_output" ||
+      fail "fileindexctl ${args[*]}: expected \"$text\" in its output"
+  done
+}
+
+expect_contains() {
+  [ -f "$1" ] || fail "expected $1 to exist"
+  grep -qF -- "$2" "$1" || fail "expected \"$2\" in $1, which holds: $(short <"$1")"
+}
+
+expect_lacks() {
+  if [ -f "$1" ] && grep -qF -- "$2" "$1"; then fail "did not expect \"$2\" in $1"; fi
+}
+
+expect_file() { [ -e "$1" ] || fail "expected $(short <<<"$1") to exist"; }
+expect_no_file() { [ ! -e "$1" ] || fail "expected $(short <<<"$1") to be gone"; }
+
+# The daemon prints asynchronously: waits up to five seconds for TEXT among its lines since the
+# step began.
+expect_daemon() {
+  local tries got
+  for ((tries = 0; ; tries++)); do
+    got=$(lines_after "$daemon_log" "$seen_daemon")
+    if grep -qF -- "$1" <<<"$got"; then return 0; fi
+    [ "$tries" -lt 50 ] || fail "the daemon did not receive \"$1\"; it got: $(short <<<"$got")"
+    sleep 0.1
+  done
+}
+
+# The registration file of a share's queue: its path with every byte but A-Za-z0-9._- as %XX.
+registry_file() {
+  local queue=$1 out="" c i
+  for ((i = 0; i < ${#queue}; i++)); do
+    c=${queue:i:1}
+    case $c in
+      [A-Za-z0-9._-]) out+=$c ;;
+      *) out+=$(printf '%%%02X' "'$c") ;;
+    esac
+  done
+  printf '%s/%s.json' "$registry" "$out"
+}
+queue_of() { printf '%s/volume1/%s/@eaDir/WEZO@file_index_queue' "$root" "$1"; }
+
+# Queue lines {"data":D,"event":E,"path":"P"} as "update|reindex P D".
+queue_events() {
+  sed -E -e 's/^\{"data":(.*),"event":([0-9]+),"path":"([^"]*)"\}$/\2 \3 \1/' \
+    -e 's/^131072 /update  /' -e 's/^65536 /reindex /' -e 's/ null$//'
+}
+# The registered queues, one per line: the registry's file names decoded.
+registrations() {
+  local file name
+  for file in "$registry"/*.json; do
+    [ -f "$file" ] || continue
+    name=${file##*/}
+    name=${name%.json}
+    printf '%b\n' "${name//%/\\x}"
+  done
+}
+spotlight() { grep -E '^\s*spotlight' "$root/etc/samba/smb.conf" | tr -d '\t'; }
+units() {
+  local file
+  for file in "$demo"/units/*; do
+    if [ -f "$file" ]; then printf '%s=%s\n' "${file##*/}" "$(cat "$file")"; fi
+  done | paste -sd ' '
+}
+
+# Shows what changed since the last call: commands the daemon received, service-manager and
+# notification calls, new queue lines, the Spotlight setting, unit states, monitor registrations.
+seen_daemon=0 seen_services=0 seen_notify=0 seen_spotlight="" seen_units="" seen_registry=""
+declare -A seen_queue=()
+changes() {
+  local queue now
+  {
+    lines_after "$daemon_log" "$seen_daemon" | sed 's/^fileindexd: /daemon    /'
+    lines_after "$demo/services.log" "$seen_services" | sed 's/^/service   /'
+    lines_after "$demo/notify.log" "$seen_notify" | cut -c1-80 | sed 's/^/notify    /'
+    for queue in "$root"/volume1/*/@eaDir/WEZO@file_index_queue "${!seen_queue[@]}"; do
+      if [ -f "$queue" ]; then
+        lines_after "$queue" "${seen_queue[$queue]:-0}" | queue_events | sed 's/^/queue     /'
+        seen_queue[$queue]=$(count_lines "$queue")
+      elif [ -n "${seen_queue[$queue]:-}" ]; then
+        echo "queue     removed $queue"
+        unset "seen_queue[$queue]"
+      fi
+    done
+    now=$(spotlight)
+    [ "$now" = "$seen_spotlight" ] || echo "smb.conf  $now"
+    seen_spotlight=$now
+    now=$(units)
+    [ "$now" = "$seen_units" ] || echo "units     $now"
+    seen_units=$now
+    now=$(registrations)
+    comm -13 <(echo "$seen_registry") <(echo "$now") | sed '/^$/d; s/^/monitor + /'
+    comm -23 <(echo "$seen_registry") <(echo "$now") | sed '/^$/d; s/^/monitor - /'
+    seen_registry=$now
+  } >"$demo/changes"
+  seen_daemon=$(count_lines "$daemon_log")
+  seen_services=$(count_lines "$demo/services.log")
+  seen_notify=$(count_lines "$demo/notify.log")
+  echo "  what changed:"
+  if [ -s "$demo/changes" ]; then indent <"$demo/changes"; else echo "    (nothing)"; fi
+}
+
+# ---------------------------------------------------------------------------------------------
+# The sandbox appliance
+
+root=$(realpath "$(mktemp -d)")
+demo=$root/demo
+daemon_log=$demo/daemon.log
+registry=$root/var/lib/wezotifyd/fileindex
+printf '\nSandbox appliance in ROOT=%s\n' "$root"
+
+mkdir -p "$root"/{tmp,var/run,var/lib/wezotifyd,usr/wezo/etc/fileindex,usr/wezo/bin,usr/bin}
+mkdir -p "$root"/etc/samba "$demo"/units
+mkdir -p "$root"/volume1/{photo/2019,photo/2020,video/movies,video/series,music/live}
+mkdir -p "$root"/volume1/{archive/2018,surveillance/cam1}
+ln -s 2019 "$root/volume1/photo/latest"
+
+{
+  printf '[global]\n\tworkgroup = DEMO\n\tspotlight = no\n'
+  for share in photo video music archive surveillance; do
+    read_only=no
+    if [ "$share" = archive ]; then read_only=yes; fi
+    printf '\n[%s]\n\tpath = %s/volume1/%s\n\tread only = %s\n' "$share" "$root" "$share" "$read_only"
+  done
+} >"$root/etc/samba/smb.conf"
+# A parse is kept only for a file older than two seconds; an older file lets the demo use it.
+touch -d '-5 seconds' "$root/etc/samba/smb.conf"
+
+cat >"$root/usr/bin/systemctl" <<EOF
+#!/bin/sh
+# Stand-in service manager: records the call and keeps each unit's state in a file.
+echo "systemctl \$*" >>"$demo/services.log"
+case "\$1" in
+  start | restart) echo active >"$demo/units/\$2" ;;
+  stop) echo inactive >"$demo/units/\$2" ;;
+esac
+exit 0
+EOF
+cat >"$root/usr/wezo/bin/wezohxonotify" <<EOF
+#!/bin/sh
+# Stand-in notification tool: records its arguments as one line.
+echo "\$*" >>"$demo/notify.log"
+EOF
+chmod +x "$root/usr/bin/systemctl" "$root/usr/wezo/bin/wezohxonotify"
+
+"$daemon_bin" --socket "$root/var/run/fileindexd.sock" --log "$daemon_log" &
+daemon_pid=$!
+expect_daemon "listening on"
+changes >/dev/null  # what the walkthrough shows is measured from here
+echo "Shares photo, video, music, archive (read-only) and surveillance; daemon pid $daemon_pid."
+
+# ---------------------------------------------------------------------------------------------
+# The walkthrough
+
+step "Add folders in two shares: the service starts, Spotlight comes on, the daemon hears"
+ctl add /photo/2019 --name "Holidays 2019" --photo
+ctl add --request '[{"path": "/video/movies", "name": "Movies", "video": true}]'
+expect_daemon 'upsert_folder_setting {"folder_path":"/photo/2019"}'
+expect_daemon 'upsert_folder_setting {"folder_path":"/video/movies"}'
+changes
+expect_contains "$demo/services.log" "systemctl start fileindexd.service"
+expect_contains "$demo/services.log" "systemctl restart smbd.service"
+expect_contains "$demo/units/fileindexd.service" active
+expect_contains "$root/etc/samba/smb.conf" "spotlight = yes"
+for share in photo video; do
+  expect_file "$(registry_file "$(queue_of "$share")")"
+done
+expect_contains "$(queue_of photo)" "\"event\":131072,\"path\":\"$root/volume1/photo/2019\""
+expect_contains "$(queue_of video)" "\"event\":131072,\"path\":\"$root/volume1/video/movies\""
+
+step "List the indexed folders with their status and validity"
+expect_output list --additional status --additional is_valid -- \
+  /photo/2019 /video/movies "2 of 2 folder(s)"
+printf '$ fileindexctl --json list | grep total\n'
+json=$("$ctl_bin" --root "$root" --json list)
+grep -Eo '"total" *: *2' <<<"$json" | indent || fail "the JSON listing does not hold \"total\":2"
+
+step "Ask the C interface whether paths are indexed; explain what may be indexed"
+expect_output is-indexed path /photo/2019/a.jpg -- "= 1"
+expect_output is-indexed path /photos -- "= 0"
+expect_output is-indexed full-path "$root/volume1/video/movies/x" -- "= 1"
+expect_output is-indexed share music -- "= 0"
+expect_output explain /photo/2020 -- "may be indexed: yes" "in an indexed folder: no"
+expect_output explain /archive/2018 -- "may be indexed: no"
+expect_output explain /surveillance/cam1 -- "may be indexed: no"
+expect_output explain /photo/latest -- "may be indexed: no"
+expect_output explain /photo/missing -- "may be indexed: no"
+expect_output storage photo -- "queue: $(queue_of photo)" \
+  "database: $root/volume1/photo/@eaDir/WEZO@.fileindexdb"
+
+step "Reindex a whole share"
+expect_output reindex /photo -- "/photo"
+changes
+expect_contains "$(queue_of photo)" "{\"data\":null,\"event\":65536,\"path\":\"$root/volume1/photo\"}"
+
+step "Pause indexing for two hours, then resume"
+ctl pause 2
+expect_daemon 'pause {"resume_time":'
+expect_output status -- "indexing: paused" "paused: until 20"
+ctl resume
+expect_daemon 'resume {}'
+expect_output status -- "paused: no"
+changes
+
+step "A share runs out of room: the administrators are told once; reviving clears it"
+ctl share no-space photo on
+ctl share no-space photo on
+expect_output share no-space photo -- "no-space: yes"
+expect_output status /photo/2019 -- "/photo/2019: err_no_space"
+[ "$(count_lines "$demo/notify.log")" -eq 1 ] ||
+  fail "expected one notification, got $(count_lines "$demo/notify.log")"
+ctl share revive photo
+expect_daemon 'revive_share_worker {"share_name":"photo"}'
+expect_output share no-space photo -- "no-space: no"
+changes
+expect_contains "$demo/notify.log" "fileindex:notify_no_space"
+
+step "Rename the share video to films"
+echo "(as the appliance does: the folder and the smb.conf section first)"
+mv "$root/volume1/video" "$root/volume1/films"
+sed -i -e 's/^\[video\]$/[films]/' -e "s|$root/volume1/video\$|$root/volume1/films|" \
+  "$root/etc/samba/smb.conf"
+touch -d '-5 seconds' "$root/etc/samba/smb.conf"
+seen_queue[$(queue_of films)]=${seen_queue[$(queue_of video)]}  # the queue moved with its share
+unset "seen_queue[$(queue_of video)]"
+ctl share rename video films
+expect_output list -- /films/movies "2 of 2 folder(s)"
+expect_output is-indexed share films -- "= 1"
+changes
+echo "  monitor registrations now:"
+registrations | indent
+
+step "Remove the folders: after the last one the service stops and Spotlight goes off"
+ctl remove /films/movies
+expect_daemon 'delete_folder_setting {"folder_path":"/films/movies"}'
+expect_lacks "$demo/services.log" "systemctl stop fileindexd.service"
+ctl remove /photo/2019
+expect_output list -- "0 of 0 folder(s)"
+changes
+expect_contains "$demo/services.log" "systemctl stop fileindexd.service"
+expect_contains "$demo/units/fileindexd.service" inactive
+expect_contains "$root/etc/samba/smb.conf" "spotlight = no"
+expect_no_file "$(registry_file "$(queue_of photo)")"
+expect_no_file "$(queue_of photo)"
+
+step "Add folders again, then run the upgrade step"
+ctl add --request '[{"path": "/photo/2020", "photo": true}, {"path": "/music/live", "audio": true}]'
+changes
+echo "(as on a system upgraded from a release without them: no registrations, service stopped)"
+rm -f "$registry"/*.json
+echo inactive >"$demo/units/fileindexd.service"
+changes
+expect_output migrate -- "migration done"
+changes
+expect_contains "$demo/units/fileindexd.service" active
+for share in photo music; do
+  expect_file "$(registry_file "$(queue_of "$share")")"
+done
+expect_contains "$(queue_of photo)" "\"event\":65536,\"path\":\"$root/volume1/photo/2020\""
+expect_contains "$(queue_of music)" "\"event\":65536,\"path\":\"$root/volume1/music/live\""
+expect_contains "$root/etc/samba/smb.conf" "spotlight = yes"
+
+printf '\ndemo passed\n'
