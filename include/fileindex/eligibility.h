@@ -34,7 +34,8 @@ FILEINDEX_EXPORT bool IsSkipIndex(const std::string& fullPath);
 // True when the folder at `fullPath` may be added to the folder list: not in a recycle bin or
 // snapshot, on a known local file system, in a share that may be indexed, not a mount point
 // (unless the share is set up for encryption), and `fullPath` is exactly what it resolves to
-// (no symbolic link, trailing slash, "." or ".." component; the folder exists). Sets no code.
+// (no symbolic link, trailing slash, "." or ".." component; the folder exists). Sets
+// FILEINDEX_ERR_PATH only when no share holds `fullPath` (GetShareNamePathByFullPath).
 FILEINDEX_EXPORT bool CanFullPathBeIndexed(const std::string& fullPath);
 
 // CanFullPathBeIndexed for the share path `path`. Returns false with FILEINDEX_ERR_PATH (logged)
