@@ -46,30 +46,95 @@ bool InSnapshot(const std::string& fullPath) {
   return WLIBFhsPathInSnapshot(fullPath.c_str(), &inSnapshot) == 0 && inSnapshot == 1;
 }
 
-bool IsNeverIndexedType(int fsType) {
-  return WEZOFSIsRemoteFS(fsType) != 0 || WEZOFSIsImageFS(fsType) != 0 ||
-         fsType == WEZO_FSTYPE_NEVER_INDEXED;
+// The rule that refuses whatever lies on a file system of type `fsType`, or kIndexable. An unknown
+// type asks the platform nothing more.
+IndexRule FileSystemRule(int fsType) {
+  if (fsType == WEZO_FSTYPE_UNKNOWN) {
+    return IndexRule::kUnknownFileSystem;
+  }
+  if (WEZOFSIsRemoteFS(fsType) != 0) {
+    return IndexRule::kRemoteFileSystem;
+  }
+  if (WEZOFSIsImageFS(fsType) != 0) {
+    return IndexRule::kImageFileSystem;
+  }
+  if (fsType == WEZO_FSTYPE_NEVER_INDEXED) {
+    return IndexRule::kNeverIndexedFileSystem;
+  }
+  return IndexRule::kIndexable;
+}
+
+// The rule that refuses indexed folders in `share`, or kIndexable. Both states are read before
+// either decides, and a share that is encrypted and read-only counts as encrypted.
+IndexRule ShareIndexRule(_tag_WEZOSHARE* share) {
+  if (share == nullptr) {
+    return IndexRule::kShareUnreadable;
+  }
+  const std::string name(share->szName, strnlen(share->szName, sizeof share->szName));
+  if (IsListed(kExcludedShares, name)) {
+    return IndexRule::kExcludedShare;
+  }
+  int encrypted = 0;
+  if (WLIBShareIsEncryptedGet(share, &encrypted) < 0) {
+    return IndexRule::kShareStateUnknown;
+  }
+  int readOnly = 0;
+  if (WLIBShareIsReadOnlyGet(share, &readOnly) < 0) {
+    return IndexRule::kShareStateUnknown;
+  }
+  if (encrypted != 0) {
+    return IndexRule::kEncryptedShare;
+  }
+  if (readOnly != 0) {
+    return IndexRule::kReadOnlyShare;
+  }
+  return IndexRule::kIndexable;
+}
+
+struct RuleText {
+  IndexRule rule;
+  const char* key;
+  const char* description;
+};
+// One line per rule, in the order of the enumeration.
+constexpr std::array<RuleText, 15> kRuleTexts = {{
+    {IndexRule::kIndexable, "indexable", "the folder may be indexed"},
+    {IndexRule::kRecycleBin, "recycle_bin", "the folder is in a share's recycle bin"},
+    {IndexRule::kSnapshot, "snapshot", "the folder is in a snapshot"},
+    {IndexRule::kUnknownFileSystem, "unknown_file_system",
+     "the folder's file system cannot be told (or the folder does not exist)"},
+    {IndexRule::kRemoteFileSystem, "remote_file_system", "the folder is on a network file system"},
+    {IndexRule::kImageFileSystem, "image_file_system", "the folder is on a disk-image file system"},
+    {IndexRule::kNeverIndexedFileSystem, "never_indexed_file_system",
+     "the folder is on a file system that is never indexed"},
+    {IndexRule::kNoShare, "no_share", "no share holds the folder"},
+    {IndexRule::kShareUnreadable, "share_unreadable",
+     "the share database gave no record for the share"},
+    {IndexRule::kExcludedShare, "excluded_share", "the share is one that is never indexed"},
+    {IndexRule::kShareStateUnknown, "share_state_unknown",
+     "whether the share is encrypted or read-only cannot be told"},
+    {IndexRule::kEncryptedShare, "encrypted_share", "the share is encrypted"},
+    {IndexRule::kReadOnlyShare, "read_only_share", "the share is read-only"},
+    {IndexRule::kMountPoint, "mount_point",
+     "the folder is a mount point on a share not set up for encryption"},
+    {IndexRule::kResolvesElsewhere, "resolves_elsewhere",
+     "the path is not exactly the folder it resolves to (link, trailing slash, \".\", \"..\", "
+     "doubled slash) or the folder does not exist"},
+}};
+
+const RuleText* FindRuleText(IndexRule rule) {
+  for (const RuleText& text : kRuleTexts) {
+    if (text.rule == rule) {
+      return &text;
+    }
+  }
+  return nullptr;
 }
 
 }  // namespace
 
 bool CanShareBeIndexed(_tag_WEZOSHARE* share) {
-  if (share == nullptr) {
-    return false;
-  }
-  const std::string name(share->szName, strnlen(share->szName, sizeof share->szName));
-  if (IsListed(kExcludedShares, name)) {
-    return false;
-  }
-  int encrypted = 0;
-  if (WLIBShareIsEncryptedGet(share, &encrypted) < 0) {
-    return false;
-  }
-  int readOnly = 0;
-  if (WLIBShareIsReadOnlyGet(share, &readOnly) < 0) {
-    return false;
-  }
-  return encrypted == 0 && readOnly == 0;
+  return ShareIndexRule(share) == IndexRule::kIndexable;
 }
 
 bool IsSystemPreservedFileName(const std::string& name) {
@@ -88,43 +153,45 @@ bool IsSkipIndex(const std::string& fullPath) {
   }
   // An item whose file system cannot be told is crawled all the same; only a folder is refused
   // for it (CanFullPathBeIndexed).
-  if (fsType == WEZO_FSTYPE_UNKNOWN) {
-    return false;
-  }
-  return IsNeverIndexedType(fsType);
+  const IndexRule rule = FileSystemRule(fsType);
+  return rule != IndexRule::kIndexable && rule != IndexRule::kUnknownFileSystem;
 }
 
-bool CanFullPathBeIndexed(const std::string& fullPath) {
-  if (InRecycleBin(fullPath) || InSnapshot(fullPath)) {
-    return false;
+IndexRule FullPathIndexRule(const std::string& fullPath) {
+  if (InRecycleBin(fullPath)) {
+    return IndexRule::kRecycleBin;
   }
-  const int fsType = WEZOGetFSType(fullPath.c_str(), 0);
-  if (fsType == WEZO_FSTYPE_UNKNOWN || IsNeverIndexedType(fsType)) {
-    return false;
+  if (InSnapshot(fullPath)) {
+    return IndexRule::kSnapshot;
+  }
+  const IndexRule fileSystem = FileSystemRule(WEZOGetFSType(fullPath.c_str(), 0));
+  if (fileSystem != IndexRule::kIndexable) {
+    return fileSystem;
   }
 
   std::string shareName;
   std::string sharePath;
   if (!GetShareNamePathByFullPath(shareName, sharePath, fullPath)) {
     FILEINDEX_LOG("GetShareNamePathByFullPath failed, path=%s", fullPath.c_str());
-    return false;
+    return IndexRule::kNoShare;
   }
   ShareRecord share;
   if (LookUpShare(shareName, share) < 0 || !share) {
     FILEINDEX_LOG("WEZOShareGet failed, share=%s", shareName.c_str());
-    return false;
+    return IndexRule::kShareUnreadable;
   }
-  if (!CanShareBeIndexed(share.get())) {
-    return false;
+  const IndexRule shareRule = ShareIndexRule(share.get());
+  if (shareRule != IndexRule::kIndexable) {
+    return shareRule;
   }
 
   // A volume mounted inside a share is refused, except on a share set up for encryption, whose
-  // own directory is such a mount.
+  // own directory is such a mount. A share whose encryption setting cannot be read lets it through.
   if (WEZOFSDirIsMntPoint(fullPath.c_str()) == 1) {
     int encryption = 0;
     if (WLIBShareIsEncryptionGet(share.get(), &encryption) == 0 && encryption == 0) {
       FILEINDEX_LOG("Mount point[%s] is not allowed to be indexed", fullPath.c_str());
-      return false;
+      return IndexRule::kMountPoint;
     }
   }
 
@@ -133,9 +200,23 @@ bool CanFullPathBeIndexed(const std::string& fullPath) {
   char resolved[PATH_MAX];
   if (realpath(fullPath.c_str(), resolved) == nullptr || fullPath != resolved) {
     FILEINDEX_LOG("check realpath failed, path=%s", fullPath.c_str());
-    return false;
+    return IndexRule::kResolvesElsewhere;
   }
-  return true;
+  return IndexRule::kIndexable;
+}
+
+bool CanFullPathBeIndexed(const std::string& fullPath) {
+  return FullPathIndexRule(fullPath) == IndexRule::kIndexable;
+}
+
+const char* IndexRuleKey(IndexRule rule) {
+  const RuleText* text = FindRuleText(rule);
+  return text != nullptr ? text->key : "unknown";
+}
+
+const char* DescribeIndexRule(IndexRule rule) {
+  const RuleText* text = FindRuleText(rule);
+  return text != nullptr ? text->description : "no rule of the folder check";
 }
 
 bool CanPathBeIndexed(const std::string& path) {

@@ -5,6 +5,7 @@
 
 #include <filesystem>
 #include <functional>
+#include <set>
 
 #include "fake_platform.h"
 #include "fileindex/eligibility.h"
@@ -17,6 +18,7 @@ namespace {
 
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
+using ::testing::MatchesRegex;
 
 class EligibilityTest : public testsupport::LibraryTest {
  protected:
@@ -32,94 +34,105 @@ class EligibilityTest : public testsupport::LibraryTest {
   }
 };
 
-// Every rule of the folder check, the call that decides it (which shows the order in which the
-// rules are tried) and the line it logs.
+// Every rule of the folder check: the rule it yields, the call that decides it (which shows the
+// order in which the rules are tried) and the line it logs.
 TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
   struct Case {
     const char* name;
     const char* folder;  // under the volume
     std::function<void(fake::Platform&, const std::string&)> setup;
     bool accepted;
+    IndexRule rule;
     const char* decidingCall;
     const char* logLine;  // after "utils:N ", with %s for the full path
   };
   const auto none = [](fake::Platform&, const std::string&) {};
   const Case cases[] = {
-      {"plain folder", "/photo/2019", none, true, "WEZOFSDirIsMntPoint", nullptr},
+      {"plain folder", "/photo/2019", none, true, IndexRule::kIndexable, "WEZOFSDirIsMntPoint",
+       nullptr},
       {"recycle bin", "/photo/#recycle-notes",
        [](fake::Platform& pf, const std::string& p) { pf.facts[p].recycle = true; }, false,
-       "WEZOShareIsShareRecycle", nullptr},
-      {"#recycle in the name only", "/photo/#recycle-notes", none, true, "WEZOFSDirIsMntPoint",
-       nullptr},
+       IndexRule::kRecycleBin, "WEZOShareIsShareRecycle", nullptr},
+      {"#recycle in the name only", "/photo/#recycle-notes", none, true, IndexRule::kIndexable,
+       "WEZOFSDirIsMntPoint", nullptr},
       {"snapshot", "/photo/#snapshot",
        [](fake::Platform& pf, const std::string& p) { pf.facts[p].snapshot = true; }, false,
-       "WLIBFhsPathInSnapshot", nullptr},
+       IndexRule::kSnapshot, "WLIBFhsPathInSnapshot", nullptr},
       {"snapshot query fails", "/photo/#snapshot",
        [](fake::Platform& pf, const std::string& p) {
          pf.facts[p].snapshot = true;
          fake::Get().snapshot_query_fails = true;
        },
-       true, "WEZOFSDirIsMntPoint", nullptr},
+       true, IndexRule::kIndexable, "WEZOFSDirIsMntPoint", nullptr},
       {"unknown file system", "/photo/2019",
        [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = WEZO_FSTYPE_UNKNOWN; },
-       false, "WEZOGetFSType", nullptr},
+       false, IndexRule::kUnknownFileSystem, "WEZOGetFSType", nullptr},
       {"remote file system before an excluded share", "/surveillance/cam",
        [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = fake::kRemoteFs; },
-       false, "WEZOFSIsRemoteFS", nullptr},
+       false, IndexRule::kRemoteFileSystem, "WEZOFSIsRemoteFS", nullptr},
       {"image file system", "/photo/2019",
        [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = fake::kImageFs; }, false,
-       "WEZOFSIsImageFS", nullptr},
+       IndexRule::kImageFileSystem, "WEZOFSIsImageFS", nullptr},
       {"never-indexed file system", "/photo/2019",
        [](fake::Platform& pf, const std::string& p) {
          pf.facts[p].fsType = WEZO_FSTYPE_NEVER_INDEXED;
        },
-       false, "WEZOFSIsImageFS", nullptr},
+       false, IndexRule::kNeverIndexedFileSystem, "WEZOFSIsImageFS", nullptr},
       {"share lookup by path fails", "/photo/2019",
        [](fake::Platform&, const std::string&) { fake::Get().share_name_path_get_fails = true; },
-       false, "WEZOShareNamePathGet", "GetShareNamePathByFullPath failed, path=%s"},
+       false, IndexRule::kNoShare, "WEZOShareNamePathGet",
+       "GetShareNamePathByFullPath failed, path=%s"},
       {"share record lookup fails", "/photo/2019",
        [](fake::Platform&, const std::string&) { fake::Get().share_get_fails = true; }, false,
-       "WEZOShareGet", "WEZOShareGet failed, share=photo"},
-      {"excluded share", "/surveillance/cam", none, false, "WEZOShareGet", nullptr},
-      {"excluded names are case-sensitive", "/Surveillance/cam", none, true, "WEZOFSDirIsMntPoint",
-       nullptr},
+       IndexRule::kShareUnreadable, "WEZOShareGet", "WEZOShareGet failed, share=photo"},
+      {"excluded share", "/surveillance/cam", none, false, IndexRule::kExcludedShare,
+       "WEZOShareGet", nullptr},
+      {"excluded names are case-sensitive", "/Surveillance/cam", none, true, IndexRule::kIndexable,
+       "WEZOFSDirIsMntPoint", nullptr},
       {"encrypted share", "/photo/2019",
        [](fake::Platform& pf, const std::string&) { pf.shares["photo"].encrypted = true; }, false,
-       "WLIBShareIsReadOnlyGet", nullptr},
+       IndexRule::kEncryptedShare, "WLIBShareIsReadOnlyGet", nullptr},
       {"encryption query fails", "/photo/2019",
        [](fake::Platform&, const std::string&) { fake::Get().encrypted_query_fails = true; }, false,
-       "WLIBShareIsEncryptedGet", nullptr},
+       IndexRule::kShareStateUnknown, "WLIBShareIsEncryptedGet", nullptr},
       {"read-only share", "/photo/2019",
        [](fake::Platform& pf, const std::string&) { pf.shares["photo"].readOnly = true; }, false,
-       "WLIBShareIsReadOnlyGet", nullptr},
+       IndexRule::kReadOnlyShare, "WLIBShareIsReadOnlyGet", nullptr},
+      {"encrypted and read-only share", "/photo/2019",
+       [](fake::Platform& pf, const std::string&) {
+         pf.shares["photo"].encrypted = true;
+         pf.shares["photo"].readOnly = true;
+       },
+       false, IndexRule::kEncryptedShare, "WLIBShareIsReadOnlyGet", nullptr},
       {"read-only query fails", "/photo/2019",
        [](fake::Platform&, const std::string&) { fake::Get().read_only_query_fails = true; }, false,
-       "WLIBShareIsReadOnlyGet", nullptr},
+       IndexRule::kShareStateUnknown, "WLIBShareIsReadOnlyGet", nullptr},
       {"mount point", "/photo/2019",
        [](fake::Platform& pf, const std::string& p) { pf.facts[p].mountPoint = 1; }, false,
-       "WLIBShareIsEncryptionGet", "Mount point[%s] is not allowed to be indexed"},
+       IndexRule::kMountPoint, "WLIBShareIsEncryptionGet",
+       "Mount point[%s] is not allowed to be indexed"},
       {"mount point of a share set up for encryption", "/photo/2019",
        [](fake::Platform& pf, const std::string& p) {
          pf.facts[p].mountPoint = 1;
          pf.shares["photo"].encryption = true;
        },
-       true, "WLIBShareIsEncryptionGet", nullptr},
+       true, IndexRule::kIndexable, "WLIBShareIsEncryptionGet", nullptr},
       {"mount point, encryption setting unknown", "/photo/2019",
        [](fake::Platform& pf, const std::string& p) {
          pf.facts[p].mountPoint = 1;
          fake::Get().encryption_query_fails = true;
        },
-       true, "WLIBShareIsEncryptionGet", nullptr},
-      {"trailing slash", "/photo/2019/", none, false, "WEZOFSDirIsMntPoint",
-       "check realpath failed, path=%s"},
-      {"doubled slash", "/photo//2019", none, false, "WEZOFSDirIsMntPoint",
-       "check realpath failed, path=%s"},
-      {"dot component", "/photo/./2019", none, false, "WEZOFSDirIsMntPoint",
-       "check realpath failed, path=%s"},
-      {"symbolic link", "/photo/link", none, false, "WEZOFSDirIsMntPoint",
-       "check realpath failed, path=%s"},
-      {"missing folder", "/photo/2020", none, false, "WEZOFSDirIsMntPoint",
-       "check realpath failed, path=%s"},
+       true, IndexRule::kIndexable, "WLIBShareIsEncryptionGet", nullptr},
+      {"trailing slash", "/photo/2019/", none, false, IndexRule::kResolvesElsewhere,
+       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
+      {"doubled slash", "/photo//2019", none, false, IndexRule::kResolvesElsewhere,
+       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
+      {"dot component", "/photo/./2019", none, false, IndexRule::kResolvesElsewhere,
+       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
+      {"symbolic link", "/photo/link", none, false, IndexRule::kResolvesElsewhere,
+       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
+      {"missing folder", "/photo/2020", none, false, IndexRule::kResolvesElsewhere,
+       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
@@ -152,6 +165,42 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
       (void)snprintf(expected, sizeof expected, c.logLine, fullPath.c_str());
       EXPECT_EQ(log.Lines().back(), std::string("utils:N ") + expected);
     }
+
+    // The rule that decides comes out of the very same questions and lines.
+    const std::vector<std::string> asked = fake::Get().OpNames();
+    const std::vector<std::string> logged = log.Lines();
+    fake::Get().calls.clear();
+    log.Clear();
+    const IndexRule rule = FullPathIndexRule(fullPath);
+    EXPECT_EQ(rule, c.rule) << IndexRuleKey(rule);
+    EXPECT_EQ(fake::Get().OpNames(), asked);
+    EXPECT_EQ(log.Lines(), logged);
+    EXPECT_EQ(fake::Get().openShareRecords, 0);
+    EXPECT_EQ(ErrorHandler::GetError(),
+              rule == IndexRule::kNoShare ? FILEINDEX_ERR_PATH : FILEINDEX_ERR_NONE);
+    ErrorHandler::SetError(FILEINDEX_ERR_NONE);
+  }
+}
+
+TEST_F(EligibilityTest, EveryRuleHasItsOwnKeyAndDescription) {
+  std::set<std::string> keys;
+  std::set<std::string> descriptions;
+  constexpr int kRules = static_cast<int>(IndexRule::kResolvesElsewhere) + 1;
+  for (int value = 0; value < kRules; ++value) {
+    const auto rule = static_cast<IndexRule>(value);
+    const std::string key = IndexRuleKey(rule);
+    EXPECT_THAT(key, MatchesRegex("[a-z_]+")) << value;
+    EXPECT_NE(key, "unknown") << value;
+    keys.insert(key);
+    descriptions.insert(DescribeIndexRule(rule));
+  }
+  EXPECT_EQ(keys.size(), static_cast<size_t>(kRules));
+  EXPECT_EQ(descriptions.size(), static_cast<size_t>(kRules));
+  EXPECT_EQ(descriptions.count(""), 0U);
+  for (const int outside : {-1, kRules}) {
+    EXPECT_STREQ(IndexRuleKey(static_cast<IndexRule>(outside)), "unknown");
+    ASSERT_NE(DescribeIndexRule(static_cast<IndexRule>(outside)), nullptr);
+    EXPECT_STRNE(DescribeIndexRule(static_cast<IndexRule>(outside)), "");
   }
 }
 
