@@ -1,0 +1,361 @@
+// The admin tool run as a program, end to end, over the shipped library and its Linux platform in
+// a sandbox root of its own: a volume with two shares described in the sandbox's smb.conf, the
+// stand-in daemon on the socket, and stand-ins for the service manager and the notification tool.
+// The tool's JSON is compared with what the library answers in this process for the same root.
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <json/reader.h>
+#include <json/value.h>
+#include <signal.h>
+#include <spawn.h>
+#include <sys/file.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <climits>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <sstream>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "fileindex/fileindex.h"
+
+extern char** environ;
+
+namespace Json {
+inline void PrintTo(const Value& value, std::ostream* os) { *os << value.toStyledString(); }
+}  // namespace Json
+
+namespace fi = WEZO::FILEINDEX;
+namespace fs = std::filesystem;
+
+namespace {
+
+struct Result {
+  int status = -1;
+  std::string out;
+  std::string err;
+};
+
+std::string Slurp(const std::string& path) {
+  std::ostringstream text;
+  text << std::ifstream(path, std::ios::binary).rdbuf();
+  return text.str();
+}
+
+Json::Value Parse(const std::string& text) {
+  Json::CharReaderBuilder builder;
+  std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
+  Json::Value value;
+  std::string errors;
+  EXPECT_TRUE(reader->parse(text.data(), text.data() + text.size(), &value, &errors))
+      << errors << " in: " << text;
+  return value;
+}
+
+// `value` as it reads back from text: the tool's JSON is text, and a number read back is signed
+// where the library may have stored it unsigned.
+Json::Value ReadBack(const Json::Value& value) { return Parse(value.toStyledString()); }
+
+class FileindexctlTest : public ::testing::Test {
+ protected:
+  void SetUp() override {
+    const char* tmp = std::getenv("TMPDIR");
+    std::string dir = std::string(tmp != nullptr && tmp[0] == '/' ? tmp : "/tmp") + "/ctl.XXXXXX";
+    ASSERT_NE(mkdtemp(dir.data()), nullptr);
+    m_root = fs::canonical(dir).string();
+    for (const char* folder : {"tmp", "var/run", "usr/wezo/etc/fileindex", "volume1/photo/2019",
+                               "volume1/video/movies"}) {
+      fs::create_directories(At(folder));
+    }
+    Write("etc/samba/smb.conf",
+          "[global]\n\tspotlight = no\n[photo]\n\tpath = " + At("volume1/photo") +
+              "\n\tread only = no\n[video]\n\tpath = " + At("volume1/video") +
+              "\n\tread only = no\n");
+    Write("usr/bin/systemctl", "#!/bin/sh\necho \"$@\" >> " + At("services.log") + "\n", 0755);
+    Write("usr/wezo/bin/wezohxonotify", "#!/bin/sh\necho \"$@\" >> " + At("notify.log") + "\n",
+          0755);
+    ASSERT_TRUE(fi::SetRootPrefix(m_root));
+    StartDaemon();
+  }
+
+  void TearDown() override {
+    if (m_daemon > 0) {
+      kill(m_daemon, SIGTERM);
+      waitpid(m_daemon, nullptr, 0);
+    }
+    fi::SetRootPrefix("");
+    std::error_code ec;
+    fs::remove_all(m_root, ec);
+  }
+
+  std::string At(const std::string& relative) const { return m_root + "/" + relative; }
+
+  void Write(const std::string& relative, const std::string& text, mode_t mode = 0644) const {
+    fs::create_directories(fs::path(At(relative)).parent_path());
+    std::ofstream(At(relative), std::ios::binary | std::ios::trunc) << text;
+    ASSERT_EQ(chmod(At(relative).c_str(), mode), 0);
+  }
+
+  void StartDaemon() {
+    const std::string socket = At("var/run/fileindexd.sock");
+    const std::string log = At("daemon.log");
+    std::vector<std::string> args = {FILEINDEXD_STANDIN, "--socket", socket, "--log", log};
+    std::vector<char*> argv;
+    for (std::string& arg : args) {
+      argv.push_back(arg.data());
+    }
+    argv.push_back(nullptr);
+    ASSERT_EQ(posix_spawn(&m_daemon, argv[0], nullptr, nullptr, argv.data(), environ), 0);
+    for (int i = 0; i < 500 && !fs::exists(socket); ++i) {
+      std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    ASSERT_TRUE(fs::exists(socket)) << "the stand-in daemon did not start";
+  }
+
+  // Runs the tool with `--root <sandbox>` and `args`, collecting its output and exit status.
+  Result Run(const std::vector<std::string>& args, bool rooted = true) const {
+    std::vector<std::string> all = {FILEINDEXCTL};
+    if (rooted) {
+      all.insert(all.end(), {"--root", m_root});
+    }
+    all.insert(all.end(), args.begin(), args.end());
+    std::vector<char*> argv;
+    for (std::string& arg : all) {
+      argv.push_back(arg.data());
+    }
+    argv.push_back(nullptr);
+
+    const std::string outPath = At("tool.out");
+    const std::string errPath = At("tool.err");
+    posix_spawn_file_actions_t actions;
+    posix_spawn_file_actions_init(&actions);
+    posix_spawn_file_actions_addopen(&actions, 1, outPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
+                                     0644);
+    posix_spawn_file_actions_addopen(&actions, 2, errPath.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
+                                     0644);
+    Result result;
+    pid_t pid = -1;
+    const int spawned = posix_spawn(&pid, argv[0], &actions, nullptr, argv.data(), environ);
+    posix_spawn_file_actions_destroy(&actions);
+    EXPECT_EQ(spawned, 0);
+    int wstatus = 0;
+    if (spawned == 0 && waitpid(pid, &wstatus, 0) == pid && WIFEXITED(wstatus)) {
+      result.status = WEXITSTATUS(wstatus);
+    }
+    result.out = Slurp(outPath);
+    result.err = Slurp(errPath);
+    return result;
+  }
+
+  // The tool's --json output of `args`, which must succeed.
+  Json::Value RunJson(std::vector<std::string> args) const {
+    args.insert(args.begin(), "--json");
+    const Result result = Run(args);
+    EXPECT_EQ(result.status, 0) << result.err;
+    return Parse(result.out);
+  }
+
+  void AddFolders() const {
+    const Result added = Run({"add", "--request",
+                              R"([{"path": "/photo/2019", "name": "Summer", "photo": true},
+                 {"path": "/video/movies", "video": true, "document": true}])"});
+    ASSERT_EQ(added.status, 0) << added.err;
+  }
+
+  std::string m_root;
+  pid_t m_daemon = -1;
+};
+
+TEST_F(FileindexctlTest, ExitStatusTellsSuccessFailureAndUsage) {
+  AddFolders();
+  struct Case {
+    std::vector<std::string> args;
+    int status;
+    std::string err;  // expected in stderr
+  };
+  const std::vector<Case> cases = {
+      {{"list"}, 0, ""},
+      {{"get", "/photo/2019"}, 0, ""},
+      {{"share", "no-space", "photo"}, 0, ""},
+      // The library refuses: its code and the code's meaning.
+      {{"get", "/photo/none"}, 1, "get /photo/none failed: error 4 (no such indexed folder)"},
+      {{"add", "--request", "{}"}, 1, "add failed: error 1 (bad parameter)"},
+      {{"add", "/photo/../etc", "--photo"}, 1, "add failed: error 1 (bad parameter)"},
+      {{"reindex", "/music"},
+       1,
+       "reindex failed: error 0 (a path lies in a share without indexed folders)"},
+      {{"storage", "music"}, 1, "storage music failed: error 0 (no share named music)"},
+      {{"pause", "99999999"}, 1, "pause failed: error 1 (bad parameter)"},
+      // Usage errors never reach the library.
+      {{}, 2, "A subcommand is required"},
+      {{"frobnicate"}, 2, "A subcommand is required"},
+      {{"list", "--sort-by", "size"}, 2, "--sort-by"},
+      {{"list", "--additional", "status,colour"}, 2, "--additional"},
+      {{"pause", "two"}, 2, "HOURS"},
+      {{"add"}, 2, "give a share path or --request"},
+      {{"add", "--request", "[{"}, 2, "--request: not JSON"},
+      {{"add", "/photo/x", "--request", "[]"}, 2, "excludes"},
+      {{"add", "--photo"}, 2, "requires PATH"},
+      {{"update", "/photo/2019", "--data", "nope"}, 2, "--data: not JSON"},
+      {{"share", "rename", "photo"}, 2, "NEW is required"},
+      {{"share", "no-space", "photo", "maybe"}, 2, "VALUE"},
+      {{"is-indexed"}, 2, "A subcommand is required"},
+  };
+  for (const Case& c : cases) {
+    std::string line;
+    for (const std::string& arg : c.args) {
+      line += " " + arg;
+    }
+    const Result result = Run(c.args);
+    EXPECT_EQ(result.status, c.status) << line << "\n" << result.err;
+    EXPECT_NE(result.err.find(c.err), std::string::npos) << line << "\nstderr: " << result.err;
+    if (c.status == 0) {
+      EXPECT_EQ(result.err, "") << line;
+    }
+  }
+  const Result relative = Run({"--root", "relative/dir", "list"}, false);
+  EXPECT_EQ(relative.status, 2);
+  EXPECT_NE(relative.err.find("--root must be an absolute path"), std::string::npos);
+
+  // Usage errors changed nothing.
+  EXPECT_EQ(RunJson({"list"})["total"], 2);
+}
+
+TEST_F(FileindexctlTest, HelpOnEveryLevel) {
+  for (const std::vector<std::string>& args : {std::vector<std::string>{"--help"},
+                                               {"share", "--help"},
+                                               {"share", "rename", "--help"},
+                                               {"is-indexed", "full-path", "--help"},
+                                               {"list", "-h"}}) {
+    const Result result = Run(args);
+    EXPECT_EQ(result.status, 0) << args[0];
+    EXPECT_NE(result.out.find("Usage:"), std::string::npos) << result.out;
+  }
+  EXPECT_NE(Run({"share", "rename", "--help"}).out.find("OLD"), std::string::npos);
+}
+
+TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResult) {
+  AddFolders();
+  Json::Value additional(Json::arrayValue);
+  additional.append("status");
+  additional.append("is_valid");
+  struct Case {
+    std::vector<std::string> args;
+    unsigned long offset, limit;
+    const char* sortBy;
+    const char* direction;
+  };
+  for (const Case& c : {
+           Case{{"list"}, 0, ULONG_MAX, "path", "ASC"},
+           Case{{"list", "--sort-by", "name", "--desc", "--limit", "1"}, 0, 1, "name", "DESC"},
+           Case{{"list", "--offset", "1", "--sort-by", "video"}, 1, ULONG_MAX, "video", "ASC"},
+       }) {
+    std::vector<std::string> args = c.args;
+    args.insert(args.end(), {"--additional", "status,is_valid"});
+    Json::Value expected;
+    ASSERT_TRUE(fi::IndexMgr::List(expected, c.offset, c.limit, c.sortBy, c.direction, additional));
+    EXPECT_EQ(RunJson(args), ReadBack(expected)) << args[1];
+  }
+
+  Json::Value folder;
+  ASSERT_TRUE(fi::IndexMgr::Get(folder, "/video/movies"));
+  EXPECT_EQ(RunJson({"get", "/video/movies"}), ReadBack(folder));
+
+  // --json may follow the subcommand as well.
+  EXPECT_EQ(Parse(Run({"get", "/video/movies", "--json"}).out), ReadBack(folder));
+
+  ASSERT_EQ(Run({"pause", "2"}).status, 0);
+  std::string status;
+  long long resumeTime = 0;
+  ASSERT_TRUE(fi::StatusMgr::GetStatus(status));
+  ASSERT_TRUE(fi::StatusMgr::GetPauseInfo(resumeTime));
+  const Json::Value shown = RunJson({"status", "/photo/2019"});
+  EXPECT_EQ(shown["status"], "paused");
+  EXPECT_EQ(shown["status"], status);
+  EXPECT_EQ(shown["resume_time"].asInt64(), resumeTime);
+  EXPECT_EQ(shown["folders"]["/photo/2019"], fi::StatusMgr::GetFolderStatus("/photo/2019"));
+
+  const Result failed = Run({"--json", "get", "/photo/none"});
+  EXPECT_EQ(failed.status, 1);
+  EXPECT_EQ(Parse(failed.out)["error"]["code"], fi::FILEINDEX_ERR_NO_SUCH_FOLDER);
+}
+
+TEST_F(FileindexctlTest, OperationsReachTheDaemonServicesAndFiles) {
+  AddFolders();
+  EXPECT_EQ(Run({"list", "--additional", "status", "-a", "is_valid"}).out,
+            "PATH           NAME    KINDS           STATUS      VALID\n"
+            "/photo/2019    Summer  photo           processing  yes\n"
+            "/video/movies          document,video  processing  yes\n"
+            "2 of 2 folder(s)\n");
+  EXPECT_EQ(Run({"is-indexed", "path", "/photo/2019/a.jpg"}).out,
+            "FILEIDXIsPathIndexed(\"/photo/2019/a.jpg\") = 1  (indexed)\n");
+  EXPECT_EQ(Run({"is-indexed", "full-path", At("volume1/photo/2020")}).out,
+            "FILEIDXIsFullPathIndexed(\"" + At("volume1/photo/2020") + "\") = 0  (not indexed)\n");
+  EXPECT_EQ(RunJson({"is-indexed", "share", "video"})["indexed"], true);
+
+  EXPECT_EQ(Run({"share", "no-space", "photo", "on"}).status, 0);
+  EXPECT_EQ(Run({"share", "no-space", "photo", "on"}).status, 0);
+  EXPECT_EQ(RunJson({"share", "no-space", "photo"})["no_space"], true);
+  EXPECT_EQ(Slurp(At("notify.log")).size(), Slurp(At("notify.log")).find('\n') + 1)
+      << "the notification runs once per transition";
+
+  ASSERT_EQ(Run({"remove", "/photo/2019", "/video/movies"}).status, 0);
+  EXPECT_EQ(Slurp(At("services.log")),
+            "start fileindexd.service\nrestart smbd.service\n"
+            "stop fileindexd.service\nrestart smbd.service\n");
+  EXPECT_NE(Slurp(At("etc/samba/smb.conf")).find("spotlight = no"), std::string::npos);
+  const std::string daemon = Slurp(At("daemon.log"));
+  EXPECT_NE(daemon.find("upsert_folder_setting"), std::string::npos) << daemon;
+}
+
+TEST_F(FileindexctlTest, ABusyFolderListFailsWithTheLockCode) {
+  const int fd =
+      open(At("tmp/fileidx_cfg_folder.lock").c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644);
+  ASSERT_GE(fd, 0);
+  ASSERT_EQ(flock(fd, LOCK_EX), 0);
+  const Result result = Run({"add", "/photo/2019", "--photo"});
+  close(fd);
+  EXPECT_EQ(result.status, 1);
+  EXPECT_NE(result.err.find("error 9"), std::string::npos) << result.err;
+  EXPECT_FALSE(fs::exists(At("usr/wezo/etc/fileindex/folder.conf")));
+}
+
+TEST_F(FileindexctlTest, ExplainNamesTheDecidingRule) {
+  AddFolders();
+  fs::create_directory_symlink(At("volume1/photo/2019"), At("volume1/photo/link"));
+  struct Case {
+    std::vector<std::string> args;
+    const char* rule;
+    const char* folder;
+  };
+  for (const Case& c : {
+           Case{{"/photo/2019/trip"}, "unknown_file_system", "/photo/2019"},
+           Case{{"/photo/2019"}, "indexable", "/photo/2019"},
+           Case{{At("volume1/video/movies"), "--full-path"}, "indexable", "/video/movies"},
+           Case{{At("volume1/photo")}, "indexable", ""},
+           Case{{"/photo/link"}, "resolves_elsewhere", ""},
+           Case{{"/photo/2019/"}, "resolves_elsewhere", "/photo/2019"},
+           Case{{"/music/x"}, "unknown_file_system", ""},
+       }) {
+    std::vector<std::string> args = {"explain"};
+    args.insert(args.end(), c.args.begin(), c.args.end());
+    const Json::Value shown = RunJson(args);
+    EXPECT_EQ(shown["rule"], c.rule) << c.args[0];
+    EXPECT_EQ(shown["folder"], c.folder) << c.args[0];
+    EXPECT_EQ(shown["rule"],
+              fi::IndexRuleKey(fi::FullPathIndexRule(shown["full_path"].asString())));
+  }
+  EXPECT_EQ(Run({"explain", "/photo/link"}).out,
+            "path: /photo/link\nfull path: " + At("volume1/photo/link") + "\nmay be indexed: no, " +
+                fi::DescribeIndexRule(fi::IndexRule::kResolvesElsewhere) +
+                "\nin an indexed folder: no\n");
+}
+
+}  // namespace
