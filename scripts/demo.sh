@@ -105,6 +105,14 @@ expect_daemon() {
   done
 }
 
+# explain PATH RULE: shows what the tool says of PATH and checks the key of the deciding rule.
+explain() {
+  local json
+  ctl explain "$1"
+  json=$("$ctl_bin" --root "$root" --json explain "$1")
+  grep -Eq "\"rule\" *: *\"$2\"" <<<"$json" || fail "explain $1: expected the rule $2 in $json"
+}
+
 # The registration file of a share's queue: its path with every byte but A-Za-z0-9._- as %XX.
 registry_file() {
   local queue=$1 out="" c i
@@ -259,11 +267,10 @@ expect_output is-indexed path /photo/2019/a.jpg -- "= 1"
 expect_output is-indexed path /photos -- "= 0"
 expect_output is-indexed full-path "$root/volume1/video/movies/x" -- "= 1"
 expect_output is-indexed share music -- "= 0"
-expect_output explain /photo/2020 -- "may be indexed: yes" "in an indexed folder: no"
-expect_output explain /archive/2018 -- "may be indexed: no"
-expect_output explain /surveillance/cam1 -- "may be indexed: no"
-expect_output explain /photo/latest -- "may be indexed: no"
-expect_output explain /photo/missing -- "may be indexed: no"
+explain /photo/2019 indexable
+explain /archive/2018 read_only_share
+explain /surveillance/cam1 excluded_share
+explain /photo/latest resolves_elsewhere
 expect_output storage photo -- "queue: $(queue_of photo)" \
   "database: $root/volume1/photo/@eaDir/WEZO@.fileindexdb"
 
@@ -274,8 +281,9 @@ expect_contains "$(queue_of photo)" "{\"data\":null,\"event\":65536,\"path\":\"$
 
 step "Pause indexing for two hours, then resume"
 ctl pause 2
-expect_daemon 'pause {"resume_time":'
 expect_output status -- "indexing: paused" "paused: until 20"
+resume_time=$(grep -Eo '\([0-9]+\)' <<<"$last_output" | tr -d '()')
+expect_daemon "pause {\"resume_time\":$resume_time}"
 ctl resume
 expect_daemon 'resume {}'
 expect_output status -- "paused: no"
@@ -291,6 +299,7 @@ expect_output status /photo/2019 -- "/photo/2019: err_no_space"
 ctl share revive photo
 expect_daemon 'revive_share_worker {"share_name":"photo"}'
 expect_output share no-space photo -- "no-space: no"
+expect_output status /photo/2019 -- "/photo/2019: processing"
 changes
 expect_contains "$demo/notify.log" "fileindex:notify_no_space"
 
