@@ -334,7 +334,7 @@ expect_no_file "$(queue_of photo)"
 step "Add folders again, then run the upgrade step"
 ctl add --request '[{"path": "/photo/2020", "photo": true}, {"path": "/music/live", "audio": true}]'
 changes
-echo "(as on a system upgraded from a release without them: no registrations, service stopped)"
+echo "(now as on a system just upgraded: no monitor registrations yet, the service stopped)"
 rm -f "$registry"/*.json
 echo inactive >"$demo/units/fileindexd.service"
 changes
