@@ -6,7 +6,6 @@
 #include <gtest/gtest.h>
 #include <json/reader.h>
 #include <json/value.h>
-#include <signal.h>
 #include <spawn.h>
 #include <sys/file.h>
 #include <sys/stat.h>
@@ -14,6 +13,7 @@
 #include <unistd.h>
 
 #include <chrono>
+#include <csignal>
 #include <climits>
 #include <cstdlib>
 #include <filesystem>
@@ -25,8 +25,6 @@
 #include <vector>
 
 #include "fileindex/fileindex.h"
-
-extern char** environ;
 
 namespace Json {
 inline void PrintTo(const Value& value, std::ostream* os) { *os << value.toStyledString(); }
@@ -47,6 +45,17 @@ std::string Slurp(const std::string& path) {
   std::ostringstream text;
   text << std::ifstream(path, std::ios::binary).rdbuf();
   return text.str();
+}
+
+// The argv of `args`, which must outlive it.
+std::vector<char*> Argv(std::vector<std::string>& args) {
+  std::vector<char*> argv;
+  argv.reserve(args.size() + 1);
+  for (std::string& arg : args) {
+    argv.push_back(arg.data());
+  }
+  argv.push_back(nullptr);
+  return argv;
 }
 
 Json::Value Parse(const std::string& text) {
@@ -107,11 +116,7 @@ class FileindexctlTest : public ::testing::Test {
     const std::string socket = At("var/run/fileindexd.sock");
     const std::string log = At("daemon.log");
     std::vector<std::string> args = {FILEINDEXD_STANDIN, "--socket", socket, "--log", log};
-    std::vector<char*> argv;
-    for (std::string& arg : args) {
-      argv.push_back(arg.data());
-    }
-    argv.push_back(nullptr);
+    std::vector<char*> argv = Argv(args);
     ASSERT_EQ(posix_spawn(&m_daemon, argv[0], nullptr, nullptr, argv.data(), environ), 0);
     for (int i = 0; i < 500 && !fs::exists(socket); ++i) {
       std::this_thread::sleep_for(std::chrono::milliseconds(10));
@@ -126,11 +131,7 @@ class FileindexctlTest : public ::testing::Test {
       all.insert(all.end(), {"--root", m_root});
     }
     all.insert(all.end(), args.begin(), args.end());
-    std::vector<char*> argv;
-    for (std::string& arg : all) {
-      argv.push_back(arg.data());
-    }
-    argv.push_back(nullptr);
+    std::vector<char*> argv = Argv(all);
 
     const std::string outPath = At("tool.out");
     const std::string errPath = At("tool.err");

@@ -38,7 +38,7 @@ class Output {
 
   bool Json() const { return m_json; }
 
-  void Print(const Json::Value& value) const {
+  static void Print(const Json::Value& value) {
     Json::StreamWriterBuilder builder;
     builder["indentation"] = "  ";
     builder["emitUTF8"] = true;
