@@ -13,8 +13,8 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <csignal>
 #include <climits>
+#include <csignal>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -68,6 +68,16 @@ Json::Value Parse(const std::string& text) {
   return value;
 }
 
+// Waits up to five seconds for `text` to appear in the file at `path`; returns the file.
+std::string WaitFor(const std::string& path, const std::string& text) {
+  std::string content = Slurp(path);
+  for (int i = 0; i < 500 && content.find(text) == std::string::npos; ++i) {
+    std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    content = Slurp(path);
+  }
+  return content;
+}
+
 // `value` as it reads back from text: the tool's JSON is text, and a number read back is signed
 // where the library may have stored it unsigned.
 Json::Value ReadBack(const Json::Value& value) { return Parse(value.toStyledString()); }
@@ -118,10 +128,8 @@ class FileindexctlTest : public ::testing::Test {
     std::vector<std::string> args = {FILEINDEXD_STANDIN, "--socket", socket, "--log", log};
     std::vector<char*> argv = Argv(args);
     ASSERT_EQ(posix_spawn(&m_daemon, argv[0], nullptr, nullptr, argv.data(), environ), 0);
-    for (int i = 0; i < 500 && !fs::exists(socket); ++i) {
-      std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-    ASSERT_TRUE(fs::exists(socket)) << "the stand-in daemon did not start";
+    ASSERT_NE(WaitFor(log, "listening on").find("listening on"), std::string::npos)
+        << "the stand-in daemon did not start";
   }
 
   // Runs the tool with `--root <sandbox>` and `args`, collecting its output and exit status.
@@ -312,7 +320,7 @@ TEST_F(FileindexctlTest, OperationsReachTheDaemonServicesAndFiles) {
             "start fileindexd.service\nrestart smbd.service\n"
             "stop fileindexd.service\nrestart smbd.service\n");
   EXPECT_NE(Slurp(At("etc/samba/smb.conf")).find("spotlight = no"), std::string::npos);
-  const std::string daemon = Slurp(At("daemon.log"));
+  const std::string daemon = WaitFor(At("daemon.log"), "upsert_folder_setting");
   EXPECT_NE(daemon.find("upsert_folder_setting"), std::string::npos) << daemon;
 }
 
