@@ -304,7 +304,11 @@ changes
 expect_contains "$demo/notify.log" "fileindex:notify_no_space"
 
 step "Rename the share video to films"
-echo "(as the appliance does: the folder and the smb.conf section first)"
+echo "(as the appliance does: the share goes offline, is renamed on disk and in smb.conf, and"
+echo " comes back under its new name; the rename itself only moves the folder records)"
+ctl share pause video
+expect_daemon 'delete_share_worker {"share_name":"video"}'
+expect_no_file "$(registry_file "$(queue_of video)")"
 mv "$root/volume1/video" "$root/volume1/films"
 sed -i -e 's/^\[video\]$/[films]/' -e "s|$root/volume1/video\$|$root/volume1/films|" \
   "$root/etc/samba/smb.conf"
@@ -312,11 +316,12 @@ touch -d '-5 seconds' "$root/etc/samba/smb.conf"
 seen_queue[$(queue_of films)]=${seen_queue[$(queue_of video)]}  # the queue moved with its share
 unset "seen_queue[$(queue_of video)]"
 ctl share rename video films
+ctl share resume films
+expect_daemon 'revive_share_worker {"share_name":"films"}'
+expect_file "$(registry_file "$(queue_of films)")"
 expect_output list -- /films/movies "2 of 2 folder(s)"
 expect_output is-indexed share films -- "= 1"
 changes
-echo "  monitor registrations now:"
-registrations | indent
 
 step "Remove the folders: after the last one the service stops and Spotlight goes off"
 ctl remove /films/movies
