@@ -263,7 +263,8 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResult) {
   };
   for (const Case& c : {
            Case{{"list"}, 0, ULONG_MAX, "path", "ASC"},
-           Case{{"list", "--sort-by", "name", "--desc", "--limit", "1"}, 0, 1, "name", "DESC"},
+           Case{{"list", "--sort-by", "name", "--desc"}, 0, ULONG_MAX, "name", "DESC"},
+           Case{{"list", "--limit", "1"}, 0, 1, "path", "ASC"},
            Case{{"list", "--offset", "1", "--sort-by", "video"}, 1, ULONG_MAX, "video", "ASC"},
        }) {
     std::vector<std::string> args = c.args;

@@ -31,19 +31,19 @@ namespace {
 constexpr int kExitFailed = 1;
 constexpr int kExitUsage = 2;
 
+void PrintJson(const Json::Value& value) {
+  Json::StreamWriterBuilder builder;
+  builder["indentation"] = "  ";
+  builder["emitUTF8"] = true;
+  std::cout << Json::writeString(builder, value) << '\n';
+}
+
 // Where results go: text for people, or the library's JSON for scripts.
 class Output {
  public:
   explicit Output(const bool& json) : m_json(json) {}
 
   bool Json() const { return m_json; }
-
-  static void Print(const Json::Value& value) {
-    Json::StreamWriterBuilder builder;
-    builder["indentation"] = "  ";
-    builder["emitUTF8"] = true;
-    std::cout << Json::writeString(builder, value) << '\n';
-  }
 
   // Reports a failed operation `what` with the library's last error code; `detail` stands in for
   // the code's description when the failing call set no code of its own.
@@ -58,7 +58,7 @@ class Output {
       Json::Value error(Json::objectValue);
       error["error"]["code"] = code;
       error["error"]["description"] = description;
-      Print(error);
+      PrintJson(error);
     }
     return kExitFailed;
   }
@@ -139,7 +139,7 @@ int RunList(const Output& out, const ListArgs& args) {
     return out.Fail("list");
   }
   if (out.Json()) {
-    out.Print(page);
+    PrintJson(page);
     return 0;
   }
   std::vector<std::vector<std::string>> rows;
@@ -185,7 +185,7 @@ int RunGet(const Output& out, const std::string& path) {
     return out.Fail("get " + path);
   }
   if (out.Json()) {
-    out.Print(folder);
+    PrintJson(folder);
     return 0;
   }
   std::cout << "path: " << folder["path"].asString() << "\nname: " << folder["name"].asString()
@@ -284,7 +284,7 @@ int RunStatus(const Output& out, const std::vector<std::string>& paths) {
     for (const std::string& path : paths) {
       result["folders"][path] = fi::StatusMgr::GetFolderStatus(path);
     }
-    out.Print(result);
+    PrintJson(result);
     return 0;
   }
   std::cout << "indexing: " << status << "\npaused: " << PauseText(resumeTime) << '\n';
@@ -317,24 +317,32 @@ int RunSimple(const Output& out, const std::string& what, const std::function<bo
   return 0;
 }
 
-// A share flag: shown when `value` is empty, otherwise set "on" or cleared "off".
-int RunShareFlag(const Output& out, const std::string& flag, const std::string& share,
-                 const std::string& value, const std::function<bool(const std::string&, bool)>& set,
-                 const std::function<bool(const std::string&)>& get) {
+// A per-share flag of the status file, as the tool names it and as its JSON names it.
+struct ShareFlag {
+  const char* name;
+  const char* key;
+  bool (*set)(const std::string&, bool);
+  bool (*get)(const std::string&);
+};
+
+// Shows the flag of `share` when `value` is empty, otherwise sets it ("on") or clears it ("off").
+int RunShareFlag(const Output& out, const ShareFlag& flag, const std::string& share,
+                 const std::string& value) {
+  const std::string name = flag.name;
   if (value.empty()) {
-    const bool isSet = get(share);
+    const bool isSet = flag.get(share);
     if (out.Json()) {
       Json::Value result(Json::objectValue);
-      result[flag == "no-space" ? "no_space" : "need_reindex"] = isSet;
-      out.Print(result);
+      result[flag.key] = isSet;
+      PrintJson(result);
     } else {
-      std::cout << flag << ": " << YesNo(isSet) << '\n';
+      std::cout << name << ": " << YesNo(isSet) << '\n';
     }
     return 0;
   }
   return RunSimple(
-      out, "share " + flag + " " + share, [&] { return set(share, value == "on"); },
-      share + ": " + flag + " " + value);
+      out, "share " + name + " " + share, [&] { return flag.set(share, value == "on"); },
+      share + ": " + name + " " + value);
 }
 
 // ---- questions ----
@@ -345,7 +353,7 @@ int RunIsIndexed(const Output& out, const char* function, int (*question)(const 
   if (out.Json()) {
     Json::Value result(Json::objectValue);
     result["indexed"] = answer == 1;
-    out.Print(result);
+    PrintJson(result);
   } else {
     std::cout << function << "(\"" << argument << "\") = " << answer << "  ("
               << (answer == 1 ? "indexed" : "not indexed") << ")\n";
@@ -364,7 +372,7 @@ int RunStorage(const Output& out, const std::string& share) {
     Json::Value result(Json::objectValue);
     result["queue"] = queue;
     result["database"] = database;
-    out.Print(result);
+    PrintJson(result);
   } else {
     std::cout << "queue: " << queue << "\ndatabase: " << database << '\n';
   }
@@ -396,13 +404,14 @@ int RunExplain(const Output& out, const std::string& path, bool fullPathGiven) {
   // The indexed folder that holds the path, asked one folder at a time so that the membership
   // rule stays the library's.
   std::vector<fi::Folder> folders;
+  if (!fi::IndexMgr::List(folders)) {
+    return out.Fail("explain " + path);
+  }
   std::string holder;
-  if (fi::IndexMgr::List(folders)) {
-    for (const fi::Folder& folder : folders) {
-      if (fi::IndexMgr::IsFullPathIndexed(fullPath, {folder})) {
-        holder = folder.GetPath();
-        break;
-      }
+  for (const fi::Folder& folder : folders) {
+    if (fi::IndexMgr::IsFullPathIndexed(fullPath, {folder})) {
+      holder = folder.GetPath();
+      break;
     }
   }
 
@@ -415,7 +424,7 @@ int RunExplain(const Output& out, const std::string& path, bool fullPathGiven) {
     result["reason"] = fi::DescribeIndexRule(rule);
     result["indexed"] = !holder.empty();
     result["folder"] = holder;
-    out.Print(result);
+    PrintJson(result);
     return 0;
   }
   std::cout << "path: " << (sharePath.empty() ? "(in no share)" : sharePath)
@@ -588,18 +597,15 @@ class Tool {
     rename->add_option("OLD", m_share, "old share name")->required();
     rename->add_option("NEW", m_newShare, "new share name")->required();
 
-    CLI::App* noSpace =
-        Command(*share, "no-space", "show, set (on) or clear (off) the flag", [this] {
-          return RunShareFlag(m_out, "no-space", m_share, m_flag, fi::StatusMgr::ShareSetNoSpace,
-                              fi::StatusMgr::ShareIsNoSpace);
-        });
-    CLI::App* needReindex =
-        Command(*share, "need-reindex", "show, set (on) or clear (off) the flag", [this] {
-          return RunShareFlag(m_out, "need-reindex", m_share, m_flag,
-                              fi::StatusMgr::ShareSetNeedReindex,
-                              fi::StatusMgr::ShareIsNeedReindex);
-        });
-    for (CLI::App* command : {noSpace, needReindex}) {
+    for (const ShareFlag& flag : {
+             ShareFlag{"no-space", "no_space", fi::StatusMgr::ShareSetNoSpace,
+                       fi::StatusMgr::ShareIsNoSpace},
+             ShareFlag{"need-reindex", "need_reindex", fi::StatusMgr::ShareSetNeedReindex,
+                       fi::StatusMgr::ShareIsNeedReindex},
+         }) {
+      CLI::App* command =
+          Command(*share, flag.name, "show, set (on) or clear (off) the flag",
+                  [this, flag] { return RunShareFlag(m_out, flag, m_share, m_flag); });
       command->add_option("NAME", m_share, "share name")->required();
       command->add_option("VALUE", m_flag, "on or off")->check(CLI::IsMember({"on", "off"}));
     }
