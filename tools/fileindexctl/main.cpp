@@ -588,12 +588,16 @@ class Tool {
       command->add_option("NAME", m_share, "share name")->required();
     }
 
-    CLI::App* rename = Command(*share, "rename", "the share was renamed: move its folders", [this] {
-      return RunSimple(
-          m_out, "share rename " + m_share,
-          [this] { return fi::IndexMgr::ShareRename(m_share, m_newShare); },
-          m_share + ": renamed to " + m_newShare);
-    });
+    CLI::App* rename = Command(
+        *share, "rename",
+        "the share was renamed: move its folders (only the list changes; pause the share before "
+        "the rename and resume it under its new name)",
+        [this] {
+          return RunSimple(
+              m_out, "share rename " + m_share,
+              [this] { return fi::IndexMgr::ShareRename(m_share, m_newShare); },
+              m_share + ": renamed to " + m_newShare);
+        });
     rename->add_option("OLD", m_share, "old share name")->required();
     rename->add_option("NEW", m_newShare, "new share name")->required();
 
