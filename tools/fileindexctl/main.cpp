@@ -502,7 +502,8 @@ class Tool {
     list->add_option("--sort-by", m_list.sortBy, "sort key")
         ->check(CLI::IsMember({"path", "name", "document", "audio", "video", "photo"}))
         ->capture_default_str();
-    list->add_flag("--desc", m_list.descending, "sort in descending order");
+    list->add_flag("--desc", m_list.descending,
+                   "descending: the ascending page at offset 0, reversed (the library's paging)");
     list->add_option("-a,--additional", m_list.additional, "add a value per folder")
         ->check(CLI::IsMember({"status", "is_valid"}))
         ->delimiter(',');
