@@ -8,14 +8,12 @@
 #include <json/value.h>
 #include <spawn.h>
 #include <sys/file.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
 #include <chrono>
 #include <climits>
 #include <csignal>
-#include <cstdlib>
 #include <filesystem>
 #include <fstream>
 #include <memory>
@@ -25,6 +23,7 @@
 #include <vector>
 
 #include "fileindex/fileindex.h"
+#include "sandbox.h"
 
 namespace Json {
 inline void PrintTo(const Value& value, std::ostream* os) { *os << value.toStyledString(); }
@@ -82,13 +81,13 @@ std::string WaitFor(const std::string& path, const std::string& text) {
 // where the library may have stored it unsigned.
 Json::Value ReadBack(const Json::Value& value) { return Parse(value.toStyledString()); }
 
-class FileindexctlTest : public ::testing::Test {
+class FileindexctlTest : public SandboxTest {
  protected:
   void SetUp() override {
-    const char* tmp = std::getenv("TMPDIR");
-    std::string dir = std::string(tmp != nullptr && tmp[0] == '/' ? tmp : "/tmp") + "/ctl.XXXXXX";
-    ASSERT_NE(mkdtemp(dir.data()), nullptr);
-    m_root = fs::canonical(dir).string();
+    SandboxTest::SetUp();
+    // The folder rules compare a path with what it resolves to, so the root must hold no link.
+    root_ = fs::canonical(root_).string();
+    ASSERT_TRUE(fi::SetRootPrefix(root_));
     for (const char* folder : {"tmp", "var/run", "usr/wezo/etc/fileindex", "volume1/photo/2019",
                                "volume1/video/movies"}) {
       fs::create_directories(At(folder));
@@ -100,7 +99,6 @@ class FileindexctlTest : public ::testing::Test {
     Write("usr/bin/systemctl", "#!/bin/sh\necho \"$@\" >> " + At("services.log") + "\n", 0755);
     Write("usr/wezo/bin/wezohxonotify", "#!/bin/sh\necho \"$@\" >> " + At("notify.log") + "\n",
           0755);
-    ASSERT_TRUE(fi::SetRootPrefix(m_root));
     StartDaemon();
   }
 
@@ -109,17 +107,7 @@ class FileindexctlTest : public ::testing::Test {
       kill(m_daemon, SIGTERM);
       waitpid(m_daemon, nullptr, 0);
     }
-    fi::SetRootPrefix("");
-    std::error_code ec;
-    fs::remove_all(m_root, ec);
-  }
-
-  std::string At(const std::string& relative) const { return m_root + "/" + relative; }
-
-  void Write(const std::string& relative, const std::string& text, mode_t mode = 0644) const {
-    fs::create_directories(fs::path(At(relative)).parent_path());
-    std::ofstream(At(relative), std::ios::binary | std::ios::trunc) << text;
-    ASSERT_EQ(chmod(At(relative).c_str(), mode), 0);
+    SandboxTest::TearDown();
   }
 
   void StartDaemon() {
@@ -136,7 +124,7 @@ class FileindexctlTest : public ::testing::Test {
   Result Run(const std::vector<std::string>& args, bool rooted = true) const {
     std::vector<std::string> all = {FILEINDEXCTL};
     if (rooted) {
-      all.insert(all.end(), {"--root", m_root});
+      all.insert(all.end(), {"--root", root_});
     }
     all.insert(all.end(), args.begin(), args.end());
     std::vector<char*> argv = Argv(all);
@@ -178,7 +166,6 @@ class FileindexctlTest : public ::testing::Test {
     ASSERT_EQ(added.status, 0) << added.err;
   }
 
-  std::string m_root;
   pid_t m_daemon = -1;
 };
 
@@ -313,14 +300,14 @@ TEST_F(FileindexctlTest, OperationsReachTheDaemonServicesAndFiles) {
   EXPECT_EQ(Run({"share", "no-space", "photo", "on"}).status, 0);
   EXPECT_EQ(Run({"share", "no-space", "photo", "on"}).status, 0);
   EXPECT_EQ(RunJson({"share", "no-space", "photo"})["no_space"], true);
-  EXPECT_EQ(Slurp(At("notify.log")).size(), Slurp(At("notify.log")).find('\n') + 1)
+  EXPECT_EQ(Read("notify.log").size(), Read("notify.log").find('\n') + 1)
       << "the notification runs once per transition";
 
   ASSERT_EQ(Run({"remove", "/photo/2019", "/video/movies"}).status, 0);
-  EXPECT_EQ(Slurp(At("services.log")),
+  EXPECT_EQ(Read("services.log"),
             "start fileindexd.service\nrestart smbd.service\n"
             "stop fileindexd.service\nrestart smbd.service\n");
-  EXPECT_NE(Slurp(At("etc/samba/smb.conf")).find("spotlight = no"), std::string::npos);
+  EXPECT_NE(Read("etc/samba/smb.conf").find("spotlight = no"), std::string::npos);
   const std::string daemon = WaitFor(At("daemon.log"), "upsert_folder_setting");
   EXPECT_NE(daemon.find("upsert_folder_setting"), std::string::npos) << daemon;
 }

@@ -30,6 +30,8 @@ namespace {
 
 constexpr int kExitFailed = 1;
 constexpr int kExitUsage = 2;
+// What a failure says when the failing call set no error code.
+constexpr char kNoCodeRecorded[] = "no code recorded; -v shows the library's log";
 
 void PrintJson(const Json::Value& value) {
   Json::StreamWriterBuilder builder;
@@ -47,8 +49,7 @@ class Output {
 
   // Reports a failed operation `what` with the library's last error code; `detail` stands in for
   // the code's description when the failing call set no code of its own.
-  int Fail(const std::string& what,
-           const std::string& detail = "no code recorded; -v shows the library's log") const {
+  int Fail(const std::string& what, const std::string& detail = kNoCodeRecorded) const {
     const int code = fi::ErrorHandler::GetError();
     const std::string description =
         code == fi::FILEINDEX_ERR_NONE ? detail : fi::ErrorHandler::Describe(code);
@@ -231,25 +232,17 @@ int RunAdd(const Output& out, const AddArgs& args) {
   return 0;
 }
 
-int RunRemove(const Output& out, const std::vector<std::string>& paths) {
-  if (!fi::IndexMgr::Delete(StringArray(paths))) {
-    return out.Fail("remove");
+// An operation on an array of share paths; `done` is told of each path on success, and
+// `noCode` explains a failure that sets no code.
+int RunOnPaths(const Output& out, const std::string& what, bool (*operation)(const Json::Value&),
+               const std::vector<std::string>& paths, const std::string& done,
+               const std::string& noCode) {
+  if (!operation(StringArray(paths))) {
+    return out.Fail(what, noCode);
   }
   if (!out.Json()) {
     for (const std::string& path : paths) {
-      std::cout << "removed " << path << '\n';
-    }
-  }
-  return 0;
-}
-
-int RunReindex(const Output& out, const std::vector<std::string>& paths) {
-  if (!fi::IndexMgr::Reindex(StringArray(paths))) {
-    return out.Fail("reindex", "a path lies in a share without indexed folders");
-  }
-  if (!out.Json()) {
-    for (const std::string& path : paths) {
-      std::cout << "queued a full reindex of " << path << '\n';
+      std::cout << done << path << '\n';
     }
   }
   return 0;
@@ -528,12 +521,17 @@ class Tool {
       add->add_flag(flag, *value, std::string("index ") + (flag + 2) + " files")->needs(path);
     }
 
-    CLI::App* remove = Command(m_app, "remove", "stop indexing folders",
-                               [this] { return RunRemove(m_out, m_paths); });
+    CLI::App* remove = Command(m_app, "remove", "stop indexing folders", [this] {
+      return RunOnPaths(m_out, "remove", fi::IndexMgr::Delete, m_paths, "removed ",
+                        kNoCodeRecorded);
+    });
     remove->add_option("PATH", m_paths, "share paths of the folders")->required();
 
-    CLI::App* reindex = Command(m_app, "reindex", "queue a full reindex of paths",
-                                [this] { return RunReindex(m_out, m_paths); });
+    CLI::App* reindex = Command(m_app, "reindex", "queue a full reindex of paths", [this] {
+      return RunOnPaths(m_out, "reindex", fi::IndexMgr::Reindex, m_paths,
+                        "queued a full reindex of ",
+                        "a path lies in a share without indexed folders");
+    });
     reindex->add_option("PATH", m_paths, "share paths in indexed shares")->required();
 
     CLI::App* update = Command(m_app, "update", "queue an update event for a path",
