@@ -7,7 +7,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <csignal>
 #include <cstdint>
 #include <cstring>
 #include <string>
@@ -28,12 +27,20 @@ constexpr size_t kWriteChunk = 1024;
 // that stopped reading can hold the caller to about three seconds.
 constexpr int kInterruptedWritesAllowed = 3;
 
+// How long a connect waits for room in a busy daemon's backlog, and each send for room in the
+// socket's buffer.
+constexpr timeval kSendTimeout{1, 0};
+
 // Writes all `count` bytes of `buffer` to `fd`. `interruptionsLeft` is shared by every write of
 // one command, so the whole frame, not each part of it, has the bounded number of retries.
 bool WriteAll(int fd, size_t count, const char* buffer, int& interruptionsLeft) {
   size_t done = 0;
   while (done < count) {
-    const ssize_t written = write(fd, buffer + done, std::min(count - done, kWriteChunk));
+    // A daemon that goes away while the frame is being written must cost the caller a failed
+    // call (EPIPE), not its process; the flag spares the host process a SIGPIPE disposition of
+    // the library's choosing.
+    const ssize_t written =
+        send(fd, buffer + done, std::min(count - done, kWriteChunk), MSG_NOSIGNAL);
     if (written > 0) {
       done += static_cast<size_t>(written);
       continue;
@@ -52,10 +59,6 @@ bool WriteAll(int fd, size_t count, const char* buffer, int& interruptionsLeft) 
 }  // namespace
 
 bool SendCammandToDaemon(const std::string& type, const Json::Value& data) {
-  // A daemon that goes away while the frame is being written must cost the caller a failed call,
-  // not its process.
-  (void)signal(SIGPIPE, SIG_IGN);
-
   UniqueFd sock(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
   if (!sock) {
     return false;
@@ -69,12 +72,11 @@ bool SendCammandToDaemon(const std::string& type, const Json::Value& data) {
   }
   address.sun_family = AF_UNIX;
   std::memcpy(address.sun_path, path.c_str(), path.size() + 1);
-  if (connect(sock.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0) {
-    return false;
-  }
-
-  const timeval sendTimeout{1, 0};
-  if (setsockopt(sock.get(), SOL_SOCKET, SO_SNDTIMEO, &sendTimeout, sizeof(sendTimeout)) != 0) {
+  // Set before connecting: a local stream connect waits for room in the daemon's backlog for as
+  // long as the send timeout allows (then EAGAIN), and without one it waits for good, with the
+  // caller's configuration lock held.
+  if (setsockopt(sock.get(), SOL_SOCKET, SO_SNDTIMEO, &kSendTimeout, sizeof(kSendTimeout)) != 0 ||
+      connect(sock.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0) {
     return false;
   }
 

@@ -19,10 +19,10 @@ namespace FILEINDEX {
 
 // Sends the command `type` with the arguments `data` to the daemon on a fresh connection and
 // closes it. Returns true when the whole frame was written; false when the daemon cannot be
-// reached (no socket, nobody listening) or stops taking the frame, in which case the call gives
-// up within a few seconds. Ignores SIGPIPE for the whole process from the first call on, so that
-// a daemon that goes away cannot kill the caller. Neither logs nor sets an error code: the caller
-// decides what a lost command means.
+// reached (no socket, nobody listening, a backlog that stays full for a second) or stops taking
+// the frame, in which case the call gives up within a few seconds. A daemon that goes away
+// mid-frame fails the call without raising SIGPIPE; the process's SIGPIPE disposition is left as
+// it is. Neither logs nor sets an error code: the caller decides what a lost command means.
 FILEINDEX_EXPORT bool SendCammandToDaemon(const std::string& type, const Json::Value& data);
 
 }  // namespace FILEINDEX
