@@ -21,6 +21,27 @@ namespace {
 
 constexpr int kLockAttempts = 3;
 constexpr mode_t kFileMode = 0644;
+// Only the library's user may open a lock file: flock needs no more than a read-only descriptor,
+// so a lock file that others can read is one that any local user can hold to block every change.
+constexpr mode_t kLockFileMode = 0600;
+
+// Whether the open lock file `fd` is one that only this user can hold: a regular file of ours
+// with no other name (a second name could make the mode fix below change another file's mode).
+// Narrows its mode to kLockFileMode when an earlier version or the umask left it wider.
+enum class LockFileCheck { kPrivate, kForeign, kFailed };
+LockFileCheck MakePrivate(int fd) {
+  struct stat st {};
+  if (fstat(fd, &st) != 0) {
+    return LockFileCheck::kFailed;
+  }
+  if (!S_ISREG(st.st_mode) || st.st_uid != geteuid() || st.st_nlink != 1) {
+    return LockFileCheck::kForeign;
+  }
+  if ((st.st_mode & 07777) != kLockFileMode && fchmod(fd, kLockFileMode) != 0) {
+    return LockFileCheck::kFailed;
+  }
+  return LockFileCheck::kPrivate;
+}
 
 }  // namespace
 
@@ -65,8 +86,17 @@ bool Config::Lock(bool exclusive) {
   const int operation = (exclusive ? LOCK_EX : LOCK_SH) | LOCK_NB;
   for (int attempt = 1; attempt <= kLockAttempts; ++attempt) {
     // The lock files live in world-writable /tmp: never follow a link planted there.
-    const int fd = open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, kFileMode);
+    const int fd = open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, kLockFileMode);
     if (fd < 0) {
+      break;
+    }
+    const LockFileCheck check = MakePrivate(fd);
+    if (check != LockFileCheck::kPrivate) {
+      close(fd);
+      if (check == LockFileCheck::kForeign) {
+        FILEINDEX_LOG("Lock file refused, not a regular file of uid %u with one link, path=%s",
+                      static_cast<unsigned>(geteuid()), path.c_str());
+      }
       break;
     }
     if (flock(fd, operation) == 0) {

@@ -103,20 +103,64 @@ TEST_F(ConfigTest, SharedLockOfAnotherProcessAdmitsSharedButNotExclusive) {
   exclusive.Unlock();
 }
 
-TEST_F(ConfigTest, LockIsReleasedByUnlockAndLockFileIsKept) {
+TEST_F(ConfigTest, LockIsReleasedByUnlockAndLockFileIsKeptPrivate) {
+  // Readable by others, the lock file could be opened and held by any local user.
+  const mode_t old = umask(0);
   TestConfig first;
   ASSERT_TRUE(first.Lock(true));
-  EXPECT_EQ(testsupport::ModeOf(FolderLockPath()), 0644);
+  umask(old);
+  EXPECT_EQ(testsupport::ModeOf(FolderLockPath()), 0600);
   {
     TestConfig second;
     EXPECT_FALSE(second.Lock(true));  // two objects of one process lock independently
     second.Unlock();
   }
   first.Unlock();
+  ASSERT_EQ(chmod(FolderLockPath().c_str(), 0644), 0);  // as earlier versions left it
   TestConfig third;
   EXPECT_TRUE(third.Lock(true));
   third.Unlock();
-  EXPECT_EQ(testsupport::ModeOf(FolderLockPath()), 0644);
+  EXPECT_EQ(testsupport::ModeOf(FolderLockPath()), 0600);
+}
+
+TEST_F(ConfigTest, LockFileThatOthersCouldHoldIsRefused) {
+  const std::string lock = FolderLockPath();
+  const std::string other = sandbox.Path("/other");
+  const struct {
+    const char* what;
+    bool needsRoot;
+  } cases[] = {{"a FIFO", false},
+               {"a second name of another file", false},
+               {"a file of another user", true}};
+  for (const auto& c : cases) {
+    if (c.needsRoot && geteuid() != 0) {
+      continue;  // only root can give a file away
+    }
+    unlink(lock.c_str());
+    const std::string what = c.what;
+    if (what == "a FIFO") {
+      ASSERT_EQ(mkfifo(lock.c_str(), 0600), 0);
+    } else if (what == "a second name of another file") {
+      testsupport::WriteFile(other, "");
+      ASSERT_EQ(chmod(other.c_str(), 0644), 0);
+      ASSERT_EQ(link(other.c_str(), lock.c_str()), 0);
+    } else {
+      testsupport::WriteFile(lock, "");
+      ASSERT_EQ(chown(lock.c_str(), 65534, 65534), 0);
+    }
+    TestConfig cfg;
+    log.Clear();
+    ErrorHandler::SetError(FILEINDEX_ERR_NONE);
+    EXPECT_FALSE(cfg.Lock(true)) << what;
+    EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_LOCK) << what;
+    EXPECT_THAT(log.Lines(),
+                ElementsAre("config:N Lock file refused, not a regular file of uid " +
+                                std::to_string(geteuid()) + " with one link, path=" + lock,
+                            "config:N Failed to lock folder"))
+        << what;
+    cfg.Unlock();
+  }
+  EXPECT_EQ(testsupport::ModeOf(other), 0644);  // the linked file's mode is not touched
 }
 
 TEST_F(ConfigTest, LockDescriptorIsCloseOnExec) {

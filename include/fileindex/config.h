@@ -49,10 +49,12 @@ class FILEINDEX_EXPORT Config {
   // a mode that cannot be set is only logged.
   bool SaveJson();
 
-  // Opens the lock file at GetLockPath() (created with mode 0644) and takes a shared or exclusive
-  // flock without blocking. A busy lock is tried three times in all, with sleeps of 0 to 9 ms in
-  // between. Returns false with FILEINDEX_ERR_LOCK, logged, when the lock file cannot be opened
-  // (a symbolic link there is refused), flock fails otherwise, or all three attempts find it busy.
+  // Opens the lock file at GetLockPath() (created, or narrowed, to mode 0600) and takes a shared
+  // or exclusive flock without blocking. A busy lock is tried three times in all, with sleeps of
+  // 0 to 9 ms in between. Returns false with FILEINDEX_ERR_LOCK, logged, when the lock file cannot
+  // be opened (a symbolic link there is refused), is not a regular file of this process's
+  // effective user with a single link (refused with a line of its own), flock fails otherwise,
+  // or all three attempts find it busy.
   bool Lock(bool exclusive);
 
   // Releases the lock and closes the lock file. Does nothing when no lock file is open, so a
