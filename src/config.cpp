@@ -10,6 +10,7 @@
 #include <cerrno>
 #include <cstdlib>
 
+#include "file_io.h"
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
@@ -67,6 +68,11 @@ bool Config::LoadJson() {
 
 bool Config::SaveJson() {
   const std::string path = GetPath();
+  // Every writer of the file saves under its lock, so while this object holds it, a temporary
+  // file beside the configuration belongs to a writer that died before its rename.
+  if (m_lockFd >= 0) {
+    RemoveStaleTemporaries(path, 0);
+  }
   switch (JsonToFile(m_jsRoot, path, kFileMode)) {
     case JsonSaveResult::kReplaced:
       return true;

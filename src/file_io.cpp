@@ -1,11 +1,13 @@
 #include "file_io.h"
 
+#include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <cstdlib>
+#include <ctime>
 
 #include "unique_fd.h"
 
@@ -36,7 +38,52 @@ std::string DirectoryOf(const std::string& path) {
   return slash == 0 ? "/" : path.substr(0, slash);
 }
 
+// mkstemp's suffix: as many letters and digits as the template has X's.
+constexpr char kTemporarySuffix[] = ".XXXXXX";
+constexpr size_t kRandomLength = sizeof(kTemporarySuffix) - 2;
+
+bool IsTemporaryName(const std::string& name, const std::string& base) {
+  if (name.size() != base.size() + 1 + kRandomLength || name.compare(0, base.size(), base) != 0 ||
+      name[base.size()] != '.') {
+    return false;
+  }
+  for (size_t i = base.size() + 1; i < name.size(); ++i) {
+    const char c = name[i];
+    if (!((c >= 'A' && c <= 'Z') || (c >= 'a' && c <= 'z') || (c >= '0' && c <= '9'))) {
+      return false;
+    }
+  }
+  return true;
+}
+
 }  // namespace
+
+void RemoveStaleTemporaries(const std::string& path, time_t minAgeSeconds) {
+  const size_t slash = path.rfind('/');
+  const std::string base = slash == std::string::npos ? path : path.substr(slash + 1);
+  const int dirFd = open(DirectoryOf(path).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+  if (dirFd < 0) {
+    return;
+  }
+  DIR* dir = fdopendir(dirFd);  // takes the descriptor
+  if (dir == nullptr) {
+    close(dirFd);
+    return;
+  }
+  const time_t now = time(nullptr);
+  while (const dirent* entry = readdir(dir)) {
+    const std::string name = entry->d_name;
+    struct stat st {};
+    if (!IsTemporaryName(name, base) ||
+        fstatat(dirFd, name.c_str(), &st, AT_SYMLINK_NOFOLLOW) != 0 || !S_ISREG(st.st_mode) ||
+        (minAgeSeconds > 0 && now - st.st_mtime < minAgeSeconds)) {
+      continue;
+    }
+    // Should a link have taken the name since, unlinkat removes the link, never its target.
+    (void)unlinkat(dirFd, name.c_str(), 0);
+  }
+  closedir(dir);
+}
 
 bool ReadWholeFile(const std::string& path, std::string& out) {
   UniqueFd fd(open(path.c_str(), O_RDONLY | O_CLOEXEC));
@@ -66,7 +113,7 @@ bool ReadWholeFile(const std::string& path, std::string& out) {
 }
 
 ReplaceResult ReplaceFile(const std::string& path, const std::string& data, mode_t mode) {
-  std::string tmpPath = path + ".XXXXXX";
+  std::string tmpPath = path + kTemporarySuffix;
   UniqueFd fd(mkostemp(tmpPath.data(), O_CLOEXEC));
   if (!fd) {
     return ReplaceResult::kFailed;

@@ -27,6 +27,15 @@ enum class ReplaceResult {
 // must exist.
 ReplaceResult ReplaceFile(const std::string& path, const std::string& data, mode_t mode);
 
+// Removes the temporary files that ReplaceFile(`path`, ...) leaves behind when its process dies
+// between creating one and renaming it: regular files in `path`'s directory named `path`'s file
+// name, a '.' and six letters or digits, last modified at least `minAgeSeconds` ago. Symbolic
+// links, directories and every other name are left alone. Removing another writer's temporary
+// file fails that writer's replace, so the caller either holds the lock that all writers of
+// `path` take (`minAgeSeconds` 0) or gives an age that no live writer reaches. Best effort: a
+// file that cannot be removed stays, and nothing is reported.
+void RemoveStaleTemporaries(const std::string& path, time_t minAgeSeconds);
+
 }  // namespace FILEINDEX
 }  // namespace WEZO
 

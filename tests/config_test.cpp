@@ -66,6 +66,19 @@ TEST_F(ConfigTest, SymbolicLinkInPlaceOfTheFileCountsAsMissing) {
   EXPECT_EQ(cfg.Doc(), Json::Value(Json::objectValue));
 }
 
+TEST_F(ConfigTest, SaveUnderTheLockRemovesTemporariesOfKilledWriters) {
+  const std::string stale = FolderConfPath() + ".a1B2c3";
+  for (const bool locked : {false, true}) {
+    testsupport::WriteFile(stale, "{\"half");
+    TestConfig cfg;
+    ASSERT_TRUE(!locked || cfg.Lock(true));
+    EXPECT_TRUE(cfg.SaveJson());
+    cfg.Unlock();
+    // Without the lock it may be the temporary file of a writer that is saving right now.
+    EXPECT_EQ(testsupport::ModeOf(stale) < 0, locked) << locked;
+  }
+}
+
 TEST_F(ConfigTest, SaveIntoAMissingDirectoryFailsWithCodeSeven) {
   ASSERT_EQ(rmdir(sandbox.Path("/usr/wezo/etc/fileindex").c_str()), 0);
   TestConfig cfg;

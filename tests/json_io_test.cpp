@@ -1,11 +1,14 @@
 #include <dirent.h>
+#include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <ctime>
 #include <string>
 
+#include "file_io.h"
 #include "json_io.h"
 #include "test_support.h"
 
@@ -96,6 +99,45 @@ TEST_F(JsonIoTest, SaveReplacesASymbolicLinkInsteadOfWritingThroughIt) {
   EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kReplaced);
   EXPECT_EQ(testsupport::ReadFile(target), "keep");
   EXPECT_EQ(testsupport::ReadFile(path), "{}\n");
+}
+
+TEST_F(JsonIoTest, RemovesOnlyOldRegularTemporariesOfTheFile) {
+  enum Kind { kFile, kLink, kDir };
+  const struct {
+    const char* name;
+    Kind kind;
+    bool old;
+    bool removed;
+  } cases[] = {
+      {"folder.conf.a1B2c3", kFile, true, true},
+      {"folder.conf.Z9z9Z9", kFile, false, false},  // its writer may still be saving
+      {"folder.conf.a1B2c", kFile, true, false},
+      {"folder.conf.a1B2c3d", kFile, true, false},
+      {"folder.conf.a1-2c3", kFile, true, false},
+      {"folder.confXa1B2c3", kFile, true, false},
+      {"status.conf.a1B2c3", kFile, true, false},
+      {"folder.conf.L1nk00", kLink, true, false},
+      {"folder.conf.D1r000", kDir, true, false},
+  };
+  const std::string target = sandbox.Path("/target");
+  testsupport::WriteFile(target, "keep");
+  for (const auto& c : cases) {
+    const std::string path = Dir() + "/" + c.name;
+    if (c.kind == kFile) {
+      testsupport::WriteFile(path, "{");
+    } else {
+      ASSERT_EQ(c.kind == kLink ? symlink(target.c_str(), path.c_str()) : mkdir(path.c_str(), 0755),
+                0);
+    }
+    const timespec twoHoursAgo[2] = {{time(nullptr) - 7200, 0}, {time(nullptr) - 7200, 0}};
+    ASSERT_EQ(c.old ? utimensat(AT_FDCWD, path.c_str(), twoHoursAgo, AT_SYMLINK_NOFOLLOW) : 0, 0);
+  }
+  RemoveStaleTemporaries(Dir() + "/folder.conf", 3600);
+  for (const auto& c : cases) {
+    struct stat st {};
+    EXPECT_EQ(lstat((Dir() + "/" + c.name).c_str(), &st) != 0, c.removed) << c.name;
+  }
+  EXPECT_EQ(testsupport::ReadFile(target), "keep");
 }
 
 TEST_F(JsonIoTest, ReaderNeverSeesAPartialFileWhileAnotherProcessSaves) {

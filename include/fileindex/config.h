@@ -46,7 +46,8 @@ class FILEINDEX_EXPORT Config {
   // Replaces the file at GetPath() with the document, atomically: readers see the old file or the
   // new one, never a part. The new file has mode 0644. Returns false with
   // FILEINDEX_ERR_SAVE_JSON, logged, when the file cannot be written (the old file then stays);
-  // a mode that cannot be set is only logged.
+  // a mode that cannot be set is only logged. While this object holds the lock, temporary files
+  // that writers killed in the middle of a save left beside the file are removed first.
   bool SaveJson();
 
   // Opens the lock file at GetLockPath() (created, or narrowed, to mode 0600) and takes a shared

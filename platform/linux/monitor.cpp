@@ -10,8 +10,10 @@
 
 #include <cerrno>
 #include <climits>
+#include <ctime>
 #include <string>
 
+#include "file_io.h"
 #include "internal.h"
 #include "json_io.h"
 
@@ -20,6 +22,10 @@ namespace {
 using WEZO::PLATFORM::kErrSystem;
 
 constexpr const char* kRegistry = "/var/lib/wezotifyd";
+
+// Registrations are written without a lock that all their writers share, so a temporary file
+// may belong to a writer that is still saving; one this old belongs to a writer that died.
+constexpr time_t kAbandonedAfterSeconds = 600;
 
 bool ValidClient(const std::string& client) {
   return !client.empty() && client != "." && client != ".." &&
@@ -81,8 +87,12 @@ bool MonitorQueue::Upsert(const MonitorQueue& entry, const std::string& client, 
   if (path.empty()) {
     return false;
   }
-  if (!MakeFolders(client) ||
-      FILEINDEX::JsonToFile(entry.Entry(), path, 0644) == FILEINDEX::JsonSaveResult::kFailed) {
+  if (!MakeFolders(client)) {
+    PLATFORM_FAIL(kErrSystem);
+    return false;
+  }
+  FILEINDEX::RemoveStaleTemporaries(path, kAbandonedAfterSeconds);
+  if (FILEINDEX::JsonToFile(entry.Entry(), path, 0644) == FILEINDEX::JsonSaveResult::kFailed) {
     PLATFORM_FAIL(kErrSystem);
     return false;
   }
@@ -94,6 +104,7 @@ bool MonitorQueue::Delete(const std::string& queuePath, const std::string& clien
   if (path.empty()) {
     return false;
   }
+  FILEINDEX::RemoveStaleTemporaries(path, kAbandonedAfterSeconds);
   if (unlink(path.c_str()) != 0 && errno != ENOENT) {
     PLATFORM_FAIL(kErrSystem);
     return false;
