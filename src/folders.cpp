@@ -5,7 +5,10 @@
 #include <wezo/platform.h>
 
 #include <algorithm>
+#include <cstddef>
+#include <iterator>
 #include <utility>
+#include <vector>
 
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
@@ -78,6 +81,35 @@ FolderOrder OrderBy(const std::string& sortBy) {
   };
 }
 
+// Sorts `folders` by `before` with a bottom-up merge sort. Folders that compare equal keep their
+// order in `folders` (the list's byte order of paths), so a page never depends on the sort's
+// whims. It also stays within the vector and ends whatever `before` answers: the platform's
+// text comparison need not be a strict weak ordering for every byte string, and std::sort given
+// one that is not may read past the vector's end.
+void SortFolders(std::vector<Folder>& folders, FolderOrder before) {
+  const size_t size = folders.size();
+  std::vector<Folder> merged;
+  merged.reserve(size);
+  for (size_t width = 1; width < size; width *= 2) {
+    merged.clear();
+    for (size_t low = 0; low < size; low += 2 * width) {
+      const size_t middle = std::min(low + width, size);
+      const size_t high = std::min(middle + width, size);
+      size_t left = low;
+      size_t right = middle;
+      while (left < middle && right < high) {
+        const bool takeRight = before(folders[right], folders[left]);
+        merged.push_back(std::move(folders[takeRight ? right++ : left++]));
+      }
+      std::move(folders.begin() + static_cast<std::ptrdiff_t>(left),
+                folders.begin() + static_cast<std::ptrdiff_t>(middle), std::back_inserter(merged));
+      std::move(folders.begin() + static_cast<std::ptrdiff_t>(right),
+                folders.begin() + static_cast<std::ptrdiff_t>(high), std::back_inserter(merged));
+    }
+    folders.swap(merged);
+  }
+}
+
 }  // namespace
 
 std::string Folders::GetLockPath() const { return FolderLockPath(); }
@@ -141,7 +173,7 @@ bool Folders::List(Json::Value& out, unsigned long offset, unsigned long limit,
   out["total"] = static_cast<Json::UInt>(total);
   out["offset"] = static_cast<Json::UInt64>(offset);
 
-  std::sort(folders.begin(), folders.end(), OrderBy(sort_by));
+  SortFolders(folders, OrderBy(sort_by));
 
   const size_t count = offset >= total ? 0 : std::min<size_t>(total - offset, limit);
   Json::Value page(Json::arrayValue);

@@ -2,6 +2,7 @@
 #include <gtest/gtest.h>
 #include <json/value.h>
 
+#include <algorithm>
 #include <filesystem>
 #include <string>
 #include <vector>
@@ -25,6 +26,7 @@ using testsupport::ParseJson;
 
 std::vector<std::string> PathsOf(const std::vector<Folder>& folders) {
   std::vector<std::string> paths;
+  paths.reserve(folders.size());
   for (const Folder& folder : folders) {
     paths.push_back(folder.GetPath());
   }
@@ -51,7 +53,7 @@ Json::Value Report(bool document, bool audio, bool video, bool photo) {
 class FoldersTest : public testsupport::LibraryTest {
  protected:
   // Writes `text` as the folder list and loads it into `folders`.
-  void LoadText(Folders& folders, const std::string& text) {
+  static void LoadText(Folders& folders, const std::string& text) {
     testsupport::WriteFile(FolderConfPath(), text);
     ASSERT_TRUE(folders.Load());
   }
@@ -233,6 +235,38 @@ TEST_F(FoldersTest, PagedListingSortsAndPages) {
   EXPECT_FALSE(page["folder"][1]["photo"].asBool());
   EXPECT_TRUE(page["folder"][2]["photo"].asBool());
   EXPECT_EQ(page["folder"][0]["additional"], Json::Value(Json::objectValue));
+}
+
+TEST_F(FoldersTest, PagedListingNeedsNoConsistentOrderFromThePlatform) {
+  // More folders than a sort puts in order by insertion, with names equal but for case.
+  Json::Value list(Json::objectValue);
+  std::vector<std::string> byteOrder;
+  for (int i = 0; i < 40; ++i) {
+    const std::string path = "/photo/" + std::to_string(i);
+    list[path]["name"] = i % 2 == 0 ? "Trip" : "TRIP";
+    byteOrder.push_back(path);
+  }
+  std::sort(byteOrder.begin(), byteOrder.end());
+  Folders folders;
+  LoadText(folders, JsonToString(list));
+  const struct {
+    int (*compare)(const char*, const char*);
+    bool tiesInByteOrder;  // else: only each folder once
+  } cases[] = {
+      {nullptr, true},
+      // Each string before every other: std::sort given this walks off the vector's end.
+      {[](const char*, const char*) { return -1; }, false},
+  };
+  for (const auto& c : cases) {
+    fake::Get().strCaseCmp = c.compare;
+    Json::Value page;
+    ASSERT_TRUE(folders.List(page, 0, 100, "name", "ASC", Json::Value(Json::arrayValue)));
+    std::vector<std::string> paths = PathsOf(page);
+    if (!c.tiesInByteOrder) {
+      std::sort(paths.begin(), paths.end());
+    }
+    EXPECT_EQ(paths, byteOrder) << c.tiesInByteOrder;
+  }
 }
 
 TEST_F(FoldersTest, GetOfAnUnknownPathFailsWithCodeFour) {

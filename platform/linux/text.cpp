@@ -1,26 +1,82 @@
 // Case-insensitive comparison of UTF-8 text through ICU's full case folding.
+//
+// Each string is turned into a sort key of its own and the keys are compared byte by byte, so the
+// comparison is a strict weak ordering over all byte strings, well-formed UTF-8 or not: sorting
+// needs that, and comparing a pair one way when both are well-formed and another way otherwise
+// made cycles ("Z\xFF" < "a" < "B" < "Z\xFF").
 #include <unicode/stringoptions.h>
 #include <unicode/ustring.h>
+#include <unicode/utf16.h>
+#include <unicode/utf8.h>
 #include <unicode/utypes.h>
 #include <wezo/platform.h>
 
+#include <algorithm>
+#include <cstddef>
+#include <cstdint>
 #include <cstring>
 #include <string>
 
 namespace {
 
-// Converts well-formed UTF-8 to UTF-16; false for ill-formed input.
-bool ToUtf16(const char* utf8, std::u16string& out) {
-  UErrorCode err = U_ZERO_ERROR;
-  int32_t length = 0;
-  u_strFromUTF8(nullptr, 0, &length, utf8, -1, &err);
-  if (err != U_BUFFER_OVERFLOW_ERROR && U_FAILURE(err)) {
-    return false;
+// Appends `run` (well-formed UTF-16), case-folded, to `key` as UTF-8, and empties `run`.
+void AppendFolded(std::u16string& run, std::string& key) {
+  if (run.empty()) {
+    return;
   }
-  out.resize(static_cast<size_t>(length));
+  // Full folding turns one unit into at most three; should that change, ICU says how many.
+  std::u16string folded(run.size() * 3, u'\0');
+  int32_t length = 0;
+  UErrorCode err = U_BUFFER_OVERFLOW_ERROR;
+  while (err == U_BUFFER_OVERFLOW_ERROR) {
+    folded.resize(std::max(folded.size(), static_cast<size_t>(length)));
+    err = U_ZERO_ERROR;
+    length = u_strFoldCase(folded.data(), static_cast<int32_t>(folded.size()), run.data(),
+                           static_cast<int32_t>(run.size()), U_FOLD_CASE_DEFAULT, &err);
+  }
+  if (U_FAILURE(err)) {
+    // Not for well-formed input; the unfolded text still gives every string one key.
+    folded = run;
+    length = static_cast<int32_t>(run.size());
+  }
+  const size_t start = key.size();
+  key.resize(start + static_cast<size_t>(length) * 3);  // a UTF-16 unit is at most 3 bytes
+  int32_t written = 0;
   err = U_ZERO_ERROR;
-  u_strFromUTF8(out.data(), length, nullptr, utf8, -1, &err);
-  return U_SUCCESS(err);
+  u_strToUTF8(&key[start], static_cast<int32_t>(key.size() - start), &written, folded.data(),
+              length, &err);
+  key.resize(start + (U_SUCCESS(err) ? static_cast<size_t>(written) : 0));
+  run.clear();
+}
+
+// The sort key of `text`: its well-formed UTF-8 sequences with full default case folding, still
+// in UTF-8 (whose byte order is code point order), and every byte that belongs to no well-formed
+// sequence kept as it is, so "A\xFF" and "a\xFF" are equal and "\xC0\xAF" is not "/".
+std::string SortKey(const char* text) {
+  const auto* bytes = reinterpret_cast<const uint8_t*>(text);
+  const auto length = static_cast<int32_t>(std::strlen(text));
+  std::string key;
+  key.reserve(static_cast<size_t>(length));
+  std::u16string run;
+  int32_t i = 0;
+  while (i < length) {
+    const int32_t start = i;
+    UChar32 c = 0;
+    U8_NEXT(bytes, i, length, c);
+    if (c < 0) {
+      // One byte at a time: the rest of an ill-formed sequence gets the same treatment on its own.
+      AppendFolded(run, key);
+      key += text[start];
+      i = start + 1;
+    } else if (U_IS_BMP(c)) {
+      run += static_cast<char16_t>(c);
+    } else {
+      run += static_cast<char16_t>(U16_LEAD(c));
+      run += static_cast<char16_t>(U16_TRAIL(c));
+    }
+  }
+  AppendFolded(run, key);
+  return key;
 }
 
 }  // namespace
@@ -31,17 +87,13 @@ int WLIBCUnicodeUTF8StrCaseCmp(const char* szA, const char* szB) {
   if (szA == nullptr || szB == nullptr) {
     return (szA != nullptr ? 1 : 0) - (szB != nullptr ? 1 : 0);
   }
-  std::u16string a;
-  std::u16string b;
-  if (!ToUtf16(szA, a) || !ToUtf16(szB, b)) {
-    return std::strcmp(szA, szB);
+  const std::string a = SortKey(szA);
+  const std::string b = SortKey(szB);
+  const int result = std::memcmp(a.data(), b.data(), std::min(a.size(), b.size()));
+  if (result != 0) {
+    return result < 0 ? -1 : 1;
   }
-  // Code point order, so that text that differs beyond case sorts as its UTF-8 bytes do.
-  UErrorCode err = U_ZERO_ERROR;
-  const int32_t result = u_strCaseCompare(a.data(), static_cast<int32_t>(a.size()), b.data(),
-                                          static_cast<int32_t>(b.size()),
-                                          U_FOLD_CASE_DEFAULT | U_COMPARE_CODE_POINT_ORDER, &err);
-  return U_SUCCESS(err) ? result : std::strcmp(szA, szB);
+  return (a.size() > b.size() ? 1 : 0) - (a.size() < b.size() ? 1 : 0);
 }
 
 }  // extern "C"

@@ -61,6 +61,9 @@ struct Platform {
   int execResult = 0;                   // what WLIBCExec and WLIBCExecv return
   // Monitor registrations by client, then queue path.
   std::map<std::string, std::map<std::string, Json::Value>> monitor;
+  // WLIBCUnicodeUTF8StrCaseCmp's answer when set (strcasecmp otherwise), to play a platform
+  // whose comparison is not a consistent order.
+  int (*strCaseCmp)(const char*, const char*) = nullptr;
 
   // ---- failure injection ----
   bool share_get_fails = false;

@@ -24,7 +24,8 @@ TEST(TextTest, ComparesUtf8WithUnicodeCaseFolding) {
       {"ab", "A", 1},
       {"z", "\xC3\xA9", -1},                     // code point order
       {"\xEF\xBC\xA1", "\xF0\x9F\x98\x80", -1},  // U+FF21 before U+1F600
-      {"A\xFF", "a\xFF", -1},                    // invalid: bytes, 'A' < 'a'
+      {"A\xFF", "a\xFF", 0},                     // a stray byte stands for itself
+      {"Z\xFF", "a", 1},                         // ... and folding goes on around it
       {"\xC3", "\xC3\xA9", -1},                  // truncated sequence
       {"\xED\xA0\x80", "\xED\xA0\x80", 0},       // encoded surrogate
       {"\xC0\xAF", "/", 1},                      // overlong "/" is not "/"
@@ -33,6 +34,47 @@ TEST(TextTest, ComparesUtf8WithUnicodeCaseFolding) {
     SCOPED_TRACE(std::string(c.a) + " vs " + c.b);
     EXPECT_EQ(Sign(WLIBCUnicodeUTF8StrCaseCmp(c.a, c.b)), c.sign);
     EXPECT_EQ(Sign(WLIBCUnicodeUTF8StrCaseCmp(c.b, c.a)), -c.sign);
+  }
+}
+
+TEST(TextTest, ComparisonIsAStrictWeakOrderingOfAnyBytes) {
+  // Hex escapes end where a letter follows: "\x42" is 'B', "\x65" is 'e'.
+  const char* const texts[] = {"",
+                               "a",
+                               "A",
+                               "B",
+                               "b",
+                               "Z\xFF",
+                               "z\xFF",
+                               "\xFF",
+                               "\xC3",
+                               "\xC3\xA9",
+                               "\xC3\x89",
+                               "e",
+                               "\xC0\xAF",
+                               "/",
+                               "0",
+                               "\x80",
+                               "STRASSE",
+                               "Stra\xC3\x9F\x65",
+                               "\xED\xA0\x80",
+                               "a\x80\x62",
+                               "A\x80\x42",
+                               "\xE2\x82",
+                               "\xE2\x82\xAC",
+                               "\xE2\x82\xAC\xFF"};
+  for (const char* a : texts) {
+    for (const char* b : texts) {
+      const int ab = Sign(WLIBCUnicodeUTF8StrCaseCmp(a, b));
+      ASSERT_EQ(ab, -Sign(WLIBCUnicodeUTF8StrCaseCmp(b, a))) << a << " vs " << b;
+      for (const char* c : texts) {
+        const int bc = Sign(WLIBCUnicodeUTF8StrCaseCmp(b, c));
+        const int ac = Sign(WLIBCUnicodeUTF8StrCaseCmp(a, c));
+        if (ab <= 0 && bc <= 0) {
+          ASSERT_LE(ac, ab + bc < 0 ? -1 : 0) << a << " <= " << b << " <= " << c;
+        }
+      }
+    }
   }
 }
 
