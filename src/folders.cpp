@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <cstddef>
-#include <iterator>
 #include <utility>
 #include <vector>
 
@@ -81,14 +80,19 @@ FolderOrder OrderBy(const std::string& sortBy) {
   };
 }
 
-// Sorts `folders` by `before` with a bottom-up merge sort. Folders that compare equal keep their
-// order in `folders` (the list's byte order of paths), so a page never depends on the sort's
-// whims. It also stays within the vector and ends whatever `before` answers: the platform's
-// text comparison need not be a strict weak ordering for every byte string, and std::sort given
-// one that is not may read past the vector's end.
-void SortFolders(std::vector<Folder>& folders, FolderOrder before) {
-  const size_t size = folders.size();
-  std::vector<Folder> merged;
+// `folders` in the order of `before`, by a bottom-up merge sort. Folders that compare equal keep
+// their order in `folders` (the list's byte order of paths), so a page never depends on the
+// sort's whims. It also stays within the vector and ends whatever `before` answers: the
+// platform's text comparison need not be a strict weak ordering for every byte string, and
+// std::sort given one that is not may read past the vector's end.
+std::vector<const Folder*> SortedFolders(const std::vector<Folder>& folders, FolderOrder before) {
+  std::vector<const Folder*> order;
+  order.reserve(folders.size());
+  for (const Folder& folder : folders) {
+    order.push_back(&folder);
+  }
+  const size_t size = order.size();
+  std::vector<const Folder*> merged;
   merged.reserve(size);
   for (size_t width = 1; width < size; width *= 2) {
     merged.clear();
@@ -98,16 +102,16 @@ void SortFolders(std::vector<Folder>& folders, FolderOrder before) {
       size_t left = low;
       size_t right = middle;
       while (left < middle && right < high) {
-        const bool takeRight = before(folders[right], folders[left]);
-        merged.push_back(std::move(folders[takeRight ? right++ : left++]));
+        merged.push_back(before(*order[right], *order[left]) ? order[right++] : order[left++]);
       }
-      std::move(folders.begin() + static_cast<std::ptrdiff_t>(left),
-                folders.begin() + static_cast<std::ptrdiff_t>(middle), std::back_inserter(merged));
-      std::move(folders.begin() + static_cast<std::ptrdiff_t>(right),
-                folders.begin() + static_cast<std::ptrdiff_t>(high), std::back_inserter(merged));
+      merged.insert(merged.end(), order.begin() + static_cast<std::ptrdiff_t>(left),
+                    order.begin() + static_cast<std::ptrdiff_t>(middle));
+      merged.insert(merged.end(), order.begin() + static_cast<std::ptrdiff_t>(right),
+                    order.begin() + static_cast<std::ptrdiff_t>(high));
     }
-    folders.swap(merged);
+    order.swap(merged);
   }
+  return order;
 }
 
 }  // namespace
@@ -173,7 +177,7 @@ bool Folders::List(Json::Value& out, unsigned long offset, unsigned long limit,
   out["total"] = static_cast<Json::UInt>(total);
   out["offset"] = static_cast<Json::UInt64>(offset);
 
-  SortFolders(folders, OrderBy(sort_by));
+  const std::vector<const Folder*> sorted = SortedFolders(folders, OrderBy(sort_by));
 
   const size_t count = offset >= total ? 0 : std::min<size_t>(total - offset, limit);
   Json::Value page(Json::arrayValue);
@@ -181,11 +185,11 @@ bool Folders::List(Json::Value& out, unsigned long offset, unsigned long limit,
     // A descending page is the start of the ascending order, reversed, whatever the offset; the
     // management interface has always paged this way.
     for (size_t i = count; i > 0; --i) {
-      page.append(folders[i - 1].asJson(additional));
+      page.append(sorted[i - 1]->asJson(additional));
     }
   } else {
     for (size_t i = 0; i < count; ++i) {
-      page.append(folders[offset + i].asJson(additional));
+      page.append(sorted[offset + i]->asJson(additional));
     }
   }
   out["folder"] = std::move(page);

@@ -20,12 +20,13 @@
 namespace {
 
 // Appends `run` (well-formed UTF-16), case-folded, to `key` as UTF-8, and empties `run`.
-void AppendFolded(std::u16string& run, std::string& key) {
+// `folded` is scratch space.
+void AppendFolded(std::u16string& run, std::u16string& folded, std::string& key) {
   if (run.empty()) {
     return;
   }
   // Full folding turns one unit into at most three; should that change, ICU says how many.
-  std::u16string folded(run.size() * 3, u'\0');
+  folded.resize(run.size() * 3);
   int32_t length = 0;
   UErrorCode err = U_BUFFER_OVERFLOW_ERROR;
   while (err == U_BUFFER_OVERFLOW_ERROR) {
@@ -58,14 +59,22 @@ std::string SortKey(const char* text) {
   std::string key;
   key.reserve(static_cast<size_t>(length));
   std::u16string run;
+  std::u16string folded;
   int32_t i = 0;
   while (i < length) {
     const int32_t start = i;
+    if (bytes[i] < 0x80) {
+      // ASCII folds to itself but for A-Z, and folding never looks at a code point's neighbours.
+      AppendFolded(run, folded, key);
+      const char c = text[i++];
+      key += c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c;
+      continue;
+    }
     UChar32 c = 0;
     U8_NEXT(bytes, i, length, c);
     if (c < 0) {
       // One byte at a time: the rest of an ill-formed sequence gets the same treatment on its own.
-      AppendFolded(run, key);
+      AppendFolded(run, folded, key);
       key += text[start];
       i = start + 1;
     } else if (U_IS_BMP(c)) {
@@ -75,7 +84,7 @@ std::string SortKey(const char* text) {
       run += static_cast<char16_t>(U16_TRAIL(c));
     }
   }
-  AppendFolded(run, key);
+  AppendFolded(run, folded, key);
   return key;
 }
 
