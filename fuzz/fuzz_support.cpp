@@ -24,7 +24,16 @@ size_t g_malformed = 0;
 
 // Counts what a target asks about and drops the rest, which would otherwise fill the system log.
 void CountingSink(int /*priority*/, const char* line) {
-  if (std::strstr(line, "Malformed command: ") != nullptr) {
+  // "status_mgr:<line> Malformed command: ...", and not another line that quotes such text.
+  const char* rest = line;
+  if (std::strncmp(rest, "status_mgr:", 11) != 0) {
+    return;
+  }
+  rest += 11;
+  while (*rest >= '0' && *rest <= '9') {
+    ++rest;
+  }
+  if (std::strncmp(rest, " Malformed command: ", 20) == 0) {
     ++g_malformed;
   }
 }
