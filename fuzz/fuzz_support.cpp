@@ -92,10 +92,7 @@ void ServeDaemon(int listener) {
 }  // namespace
 
 const std::string& Root() {
-  static const std::string root = [] {
-    std::string made = MakeSandbox();
-    return made;
-  }();
+  static const std::string root = MakeSandbox();
   static const bool cleanup = [] { return std::atexit(RemoveSandbox) == 0; }();
   (void)cleanup;
   return root;
@@ -125,7 +122,7 @@ std::string ReadBytes(const std::string& path) {
   for (size_t n; (n = std::fread(buffer, 1, sizeof buffer, file)) > 0;) {
     out.append(buffer, n);
   }
-  std::fclose(file);
+  (void)std::fclose(file);
   return out;
 }
 
@@ -140,7 +137,7 @@ void StartDaemon() {
     const std::string path = WEZO::FILEINDEX::DaemonSocketPath();
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
-    std::snprintf(address.sun_path, sizeof address.sun_path, "%s", path.c_str());
+    (void)std::snprintf(address.sun_path, sizeof address.sun_path, "%s", path.c_str());
     const int listener = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
     if (listener < 0 || path.size() >= sizeof address.sun_path ||
         bind(listener, reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0 ||
@@ -154,7 +151,7 @@ void StartDaemon() {
 }
 
 void Fail(const std::string& what) {
-  std::fprintf(stderr, "property broken: %s\n", what.c_str());
+  (void)std::fprintf(stderr, "property broken: %s\n", what.c_str());
   std::abort();
 }
 

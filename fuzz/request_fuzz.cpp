@@ -7,6 +7,7 @@
 #include <json/value.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <string>
@@ -43,12 +44,8 @@ void ResetSandbox(const std::string& root) {
 }
 
 bool Listed(const std::vector<Folder>& folders, const std::string& path) {
-  for (const Folder& folder : folders) {
-    if (folder.GetPath() == path) {
-      return true;
-    }
-  }
-  return false;
+  return std::any_of(folders.begin(), folders.end(),
+                     [&](const Folder& folder) { return folder.GetPath() == path; });
 }
 
 }  // namespace

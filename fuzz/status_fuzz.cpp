@@ -48,13 +48,15 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   fuzzsupport::ResetPlatform(root + "/volume1");
   fuzzsupport::WriteBytes(WEZO::FILEINDEX::StatusConfPath(), data, size);
 
+  WEZO::FILEINDEX::ErrorHandler::SetError(WEZO::FILEINDEX::FILEINDEX_ERR_NONE);
   const Answers before = Ask();
+  const int loadCode = WEZO::FILEINDEX::ErrorHandler::GetError();
   (void)StatusMgr::ShareIsNeedReindex("photo");
   (void)StatusMgr::GetFolderStatus("/photo/a");
   std::string overall;
   (void)StatusMgr::GetStatus(overall);
   if (!before.loaded) {
-    if (WEZO::FILEINDEX::ErrorHandler::GetError() != WEZO::FILEINDEX::FILEINDEX_ERR_LOAD_JSON) {
+    if (loadCode != WEZO::FILEINDEX::FILEINDEX_ERR_LOAD_JSON) {
       fuzzsupport::Fail("a failed load set another code");
     }
     return 0;

@@ -11,7 +11,6 @@
 #include <gtest/gtest.h>
 #include <json/value.h>
 #include <poll.h>
-#include <signal.h>
 #include <sys/inotify.h>
 #include <sys/mman.h>
 #include <sys/wait.h>
@@ -20,6 +19,8 @@
 #include <algorithm>
 #include <atomic>
 #include <chrono>
+#include <climits>
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
@@ -29,6 +30,7 @@
 #include <ostream>
 #include <random>
 #include <set>
+#include <sstream>
 #include <string>
 #include <thread>
 #include <vector>
@@ -49,8 +51,8 @@ using testsupport::FakeDaemon;
 
 int CountFromEnv(const char* name, int fallback) {
   const char* text = std::getenv(name);
-  const int value = text != nullptr ? std::atoi(text) : 0;
-  return value > 0 ? value : fallback;
+  const long value = text != nullptr ? std::strtol(text, nullptr, 10) : 0;
+  return value > 0 && value <= INT_MAX ? static_cast<int>(value) : fallback;
 }
 
 // What the two files say: each folder's name by path, and the shares flagged for a reindex.
@@ -248,7 +250,7 @@ class CrashTest : public StressTest {
   State model;                           // what the changes up to modelAt leave
   long modelAt = 0;
   int changeMicros = 2000;  // how long the last change took, to spread the random kills over it
-  std::mt19937 rng{20261123};
+  std::mt19937 rng{std::random_device{}()};
   int kills = 0;
   int insideSave = 0;  // kills that left a temporary file: the writer was inside a save
   int afterSave = 0;   // kills after a save, before the writer counted its change
@@ -412,6 +414,7 @@ TEST_F(StressTest, ConcurrentWritersKeepEveryDoneChangeAndReadersSeeUntouchedFol
   ASSERT_TRUE(IndexMgr::Upsert(seeds));
 
   std::vector<Child> children;
+  children.reserve(kWriters + kReaders);
   for (int w = 0; w < kWriters; ++w) {
     children.push_back(Spawn([w, rounds] { return Writer(w, rounds); }));
   }
@@ -422,9 +425,12 @@ TEST_F(StressTest, ConcurrentWritersKeepEveryDoneChangeAndReadersSeeUntouchedFol
   for (size_t i = 0; i < children.size(); ++i) {
     ASSERT_GE(children[i].pid, 0);
     const std::string report = Collect(children[i]);
+    std::istringstream fields(report);
+    std::string ok;
     int done = 0;
     int busy = 0;
-    EXPECT_EQ(std::sscanf(report.c_str(), "ok %d %d", &done, &busy), 2) << report;
+    fields >> ok >> done >> busy;
+    EXPECT_TRUE(ok == "ok" && !fields.fail()) << report;
     counts[i < kWriters ? 0 : 1][0] += done;
     counts[i < kWriters ? 0 : 1][1] += busy;
   }
