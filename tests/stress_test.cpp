@@ -27,9 +27,7 @@
 #include <functional>
 #include <map>
 #include <new>
-#include <ostream>
 #include <random>
-#include <set>
 #include <sstream>
 #include <string>
 #include <thread>
@@ -55,50 +53,33 @@ int CountFromEnv(const char* name, int fallback) {
   return value > 0 && value <= INT_MAX ? static_cast<int>(value) : fallback;
 }
 
-// What the two files say: each folder's name by path, and the shares flagged for a reindex.
-struct State {
-  std::map<std::string, std::string> folders;
-  std::set<std::string> needReindex;
-  bool operator==(const State& other) const {
-    return folders == other.folders && needReindex == other.needReindex;
-  }
-};
-
-std::ostream& operator<<(std::ostream& os, const State& state) {
-  for (const auto& [path, name] : state.folders) {
-    os << path << "=" << name << " ";
-  }
-  os << "| reindex:";
-  for (const std::string& share : state.needReindex) {
-    os << " " << share;
-  }
-  return os;
+// What the two files say: {"folders": {path: name}, "reindex": {share: true}}.
+Json::Value EmptyState() {
+  Json::Value state(Json::objectValue);
+  state["folders"] = Json::Value(Json::objectValue);
+  state["reindex"] = Json::Value(Json::objectValue);
+  return state;
 }
 
 // Reads both files as a reader that takes no lock does. False, with the reason, when one of them
 // does not parse.
-bool ReadState(State& out, std::string& why) {
-  out = State();
+bool ReadState(Json::Value& out, std::string& why) {
+  out = EmptyState();
   std::vector<Folder> folders;
   if (!IndexMgr::List(folders)) {
     why = "folder.conf does not load: " + testsupport::ReadFile(FolderConfPath());
     return false;
   }
   for (const Folder& folder : folders) {
-    out.folders[folder.GetPath()] = folder.GetName();
+    out["folders"][folder.GetPath()] = folder.GetName();
   }
-  if (!std::filesystem::exists(StatusConfPath())) {
-    return true;
-  }
-  Json::Value status;
-  if (!JsonFromFile(status, StatusConfPath()) || !status.isObject()) {
+  Json::Value status(Json::objectValue);
+  if (std::filesystem::exists(StatusConfPath()) &&
+      (!JsonFromFile(status, StatusConfPath()) || !status.isObject())) {
     why = "status.conf does not load: " + testsupport::ReadFile(StatusConfPath());
     return false;
   }
-  const Json::Value flags = status.get("need_reindex", Json::Value(Json::objectValue));
-  for (const std::string& share : flags.getMemberNames()) {
-    out.needReindex.insert(share);
-  }
+  out["reindex"] = status.get("need_reindex", out["reindex"]);
   return true;
 }
 
@@ -126,20 +107,20 @@ bool RunChange(long k) {
   }
 }
 
-void ApplyChange(State& state, long k) {
+void ApplyChange(Json::Value& state, long k) {
   switch (k % 4) {
     case 0:
       if (k % 8 == 0) {
-        state.needReindex.insert("s" + std::to_string(k % 5));
+        state["reindex"]["s" + std::to_string(k % 5)] = true;
       } else {
-        state.needReindex.erase("s" + std::to_string(k % 5));
+        state["reindex"].removeMember("s" + std::to_string(k % 5));
       }
       break;
     case 3:
-      state.folders.erase(FolderOf(k - 2));
+      state["folders"].removeMember(FolderOf(k - 2));
       break;
     default:
-      state.folders[FolderOf(k)] = "n" + std::to_string(k);
+      state["folders"][FolderOf(k)] = "n" + std::to_string(k);
   }
 }
 
@@ -222,12 +203,12 @@ class CrashTest : public StressTest {
     const long last = counted->load();
     for (; modelAt < last; ApplyChange(model, ++modelAt)) {
     }
-    State next = model;
+    Json::Value next = model;
     ApplyChange(next, last + 1);
-    State actual;
+    Json::Value actual;
     std::string why;
     ASSERT_TRUE(ReadState(actual, why)) << "after kill " << kills << ": " << why;
-    if (actual == next && !(actual == model)) {
+    if (actual == next && actual != model) {
       ++afterSave;
       model = next;
       modelAt = last + 1;
@@ -247,7 +228,7 @@ class CrashTest : public StressTest {
   }
 
   std::atomic<long>* counted = nullptr;  // shared with the writers
-  State model;                           // what the changes up to modelAt leave
+  Json::Value model = EmptyState();      // what the changes up to modelAt leave
   long modelAt = 0;
   int changeMicros = 2000;  // how long the last change took, to spread the random kills over it
   std::mt19937 rng{std::random_device{}()};
