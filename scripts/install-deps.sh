@@ -16,6 +16,9 @@ packages=(
   libcli11-dev
   # testparm, to check the Samba configuration the platform writes; brings no daemon with it
   samba-common-bin
+  # the fuzz targets (scripts/fuzz.sh): clang with libFuzzer and the sanitizers' runtimes
+  clang
+  libclang-rt-14-dev
 )
 
 missing=()

@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # Installs what is missing, builds, and runs the whole test suite twice: once as the library ships
 # and once under AddressSanitizer and UndefinedBehaviorSanitizer. Then runs each benchmark briefly
-# to show it still works (timings from this short run mean nothing).
+# to show it still works (timings from this short run mean nothing), and each fuzz target for a
+# few seconds.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 
@@ -18,3 +19,4 @@ ctest --test-dir build-sanitize -j"$jobs" --output-on-failure
 
 build/bench/fileindex_bench --benchmark_min_time=0.01 >/dev/null
 build/bench/fileindex_platform_bench --benchmark_min_time=0.01 >/dev/null
+./scripts/fuzz.sh 5

@@ -1,0 +1,143 @@
+// The queue readers against a reader that parses every line.
+//
+// Input: one byte choosing the read block size, then a line with the full path asked about
+// ("/volume1/photo/a"), then the queue file's content. The folder asked about is the same
+// location as a share path. Both readers must answer exactly as the reference below, the folder
+// reader must log each malformed line once, and the quick scan of a line must never claim an
+// event the parser does not give.
+#include <json/value.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "fileindex/queue.h"
+#include "fileindex/utils.h"
+#include "fuzz_support.h"
+#include "json_io.h"
+#include "queue_reader.h"
+
+namespace {
+
+using WEZO::FILEINDEX::QueueEvent;
+
+constexpr char kVolume[] = "/volume1";
+
+// Every line of `content`: split at "\n"; a last line without "\n" counts, nothing after a final
+// "\n" does.
+std::vector<std::string> SplitLines(const std::string& content) {
+  std::vector<std::string> lines;
+  size_t start = 0;
+  while (start < content.size()) {
+    size_t end = content.find('\n', start);
+    if (end == std::string::npos) {
+      end = content.size();
+    }
+    lines.push_back(content.substr(start, end - start));
+    start = end + 1;
+  }
+  return lines;
+}
+
+// A line is an event when it parses as one JSON object with an "event" convertible to an unsigned
+// integer and a string "path"; "path_old" counts only when it is a string.
+bool ReferenceParse(const std::string& line, QueueEvent& out) {
+  Json::Value parsed;
+  const Json::Value& root = parsed;
+  if (!WEZO::FILEINDEX::JsonFromString(parsed, line) || !root.isObject() ||
+      !root.isMember("event") || !root.isMember("path")) {
+    return false;
+  }
+  const Json::Value& event = root["event"];
+  const Json::Value& path = root["path"];
+  if (!event.isConvertibleTo(Json::uintValue) || !path.isString()) {
+    return false;
+  }
+  out.event = event.asUInt();
+  out.path = path.asString();
+  const Json::Value& pathOld = root["path_old"];
+  out.pathOld = pathOld.isString() ? pathOld.asString() : std::string();
+  return true;
+}
+
+bool Inside(const std::string& path, const std::string& folder) {
+  return WEZO::FILEINDEX::StringStartWith(path + "/", folder + "/");
+}
+
+void CheckScanAgreesWithParse(const std::string& line) {
+  WEZO::FILEINDEX::detail::ScannedEvent scanned;
+  if (!WEZO::FILEINDEX::detail::ScanQueueLine(line.data(), line.size(), scanned)) {
+    return;
+  }
+  QueueEvent parsed;
+  if (!WEZO::FILEINDEX::ParseQueueLine(line.data(), line.size(), parsed) ||
+      scanned.event != parsed.event || std::string(scanned.path, scanned.pathSize) != parsed.path ||
+      (scanned.pathOld == nullptr
+           ? std::string()
+           : std::string(scanned.pathOld, scanned.pathOldSize)) != parsed.pathOld) {
+    fuzzsupport::Fail("the quick scan and the parser disagree on: " + line);
+  }
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+  if (size < 2) {
+    return 0;
+  }
+  const std::string& root = fuzzsupport::Root();
+  fuzzsupport::ResetPlatform(kVolume);
+  const size_t blockSize = data[0] == 0xFF ? size_t{1} << 20 : size_t{1} + data[0] % 64;
+  const std::string rest(reinterpret_cast<const char*>(data) + 1, size - 1);
+  const size_t newline = rest.find('\n');
+  const std::string fullPath = rest.substr(0, newline);
+  const std::string content = newline == std::string::npos ? "" : rest.substr(newline + 1);
+  const std::string queue = root + "/queue";
+  fuzzsupport::WriteBytes(queue, reinterpret_cast<const uint8_t*>(content.data()), content.size());
+
+  // The folder reader's share path for the same location; a path outside the volume has none.
+  const bool onVolume = fullPath.rfind(std::string(kVolume) + "/", 0) == 0;
+  const std::string folder = onVolume ? fullPath.substr(sizeof kVolume - 1) : fullPath;
+  std::string folderFull;
+  const bool resolvable = WEZO::FILEINDEX::GetFullPath(folderFull, folder);
+
+  bool reindexQueued = false;
+  bool folderEvent = false;
+  size_t malformed = 0;
+  for (const std::string& line : SplitLines(content)) {
+    CheckScanAgreesWithParse(line);
+    QueueEvent event;
+    if (!ReferenceParse(line, event)) {
+      ++malformed;
+      continue;
+    }
+    reindexQueued =
+        reindexQueued || (event.event == static_cast<unsigned>(WEZO::FILEINDEX::kEventReindex) &&
+                          event.path == fullPath);
+    folderEvent = folderEvent || Inside(event.path, folderFull) ||
+                  (event.event == static_cast<unsigned>(WEZO::FILEINDEX::kEventMoved) &&
+                   Inside(event.pathOld, folderFull));
+  }
+
+  if (WEZO::FILEINDEX::detail::IsReindexQueued(fullPath, queue, blockSize) != reindexQueued) {
+    fuzzsupport::Fail("IsReindexQueued answered " + std::to_string(!reindexQueued));
+  }
+  (void)fuzzsupport::TakeMalformedLineCount();
+  const bool answer = WEZO::FILEINDEX::detail::QueueHasFolderEvent(folder, queue, blockSize);
+  const size_t logged = fuzzsupport::TakeMalformedLineCount();
+  if (!resolvable) {
+    if (answer || logged != 0) {
+      fuzzsupport::Fail("QueueHasFolderEvent read the queue of a folder it cannot place");
+    }
+    return 0;
+  }
+  if (answer != folderEvent) {
+    fuzzsupport::Fail("QueueHasFolderEvent answered " + std::to_string(answer));
+  }
+  if (logged != malformed) {
+    fuzzsupport::Fail("logged " + std::to_string(logged) + " malformed lines of " +
+                      std::to_string(malformed));
+  }
+  return 0;
+}
