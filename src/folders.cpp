@@ -31,28 +31,6 @@ Json::Value ChangeReport(const Json::Value& before, const Json::Value& after) {
   return report;
 }
 
-// A share path that names one place and no other: it starts with "/" and none of its components
-// is empty (doubled or trailing slashes), "." or "..". The monitor watches what the list names
-// with root's rights, so "/photo/../../etc" must never get in.
-bool IsCleanSharePath(const std::string& path) {
-  if (path.empty() || path.front() != '/') {
-    return false;
-  }
-  size_t start = 1;
-  while (true) {
-    const size_t slash = path.find('/', start);
-    const std::string component =
-        path.substr(start, slash == std::string::npos ? std::string::npos : slash - start);
-    if (component.empty() || component == "." || component == "..") {
-      return false;
-    }
-    if (slash == std::string::npos) {
-      return true;
-    }
-    start = slash + 1;
-  }
-}
-
 using FolderOrder = bool (*)(const Folder&, const Folder&);
 
 FolderOrder OrderBy(const std::string& sortBy) {
@@ -179,7 +157,7 @@ bool Folders::Upsert(Json::Value& result, const Json::Value& request) {
 
   std::string path;
   std::string fullPath;
-  if (!RetrieveStringFromJsonObj(path, "path", request) || !IsCleanSharePath(path) ||
+  if (!RetrieveStringFromJsonObj(path, "path", request) ||
       !WEZO::FILEINDEX::GetFullPath(fullPath, path)) {
     FILEINDEX_LOG("Bad param: %s", JsonToString(request).c_str());
     ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
