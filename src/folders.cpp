@@ -73,10 +73,14 @@ bool Folders::Load() {
   }
   for (auto it = m_jsRoot.begin(); it != m_jsRoot.end(); ++it) {
     // A folder whose share is gone is kept: it reports itself as not valid, and the user removes
-    // it. The stored "path" is ignored; the member's name is the folder's path.
+    // it. That is no failure of the load, so the code its full path left is not kept either.
+    // The stored "path" is ignored; the member's name is the folder's path.
     Folder folder;
     const std::string path = it.name();
-    folder.Load(path, *it);
+    const _tag_fileindex_err_ code = ErrorHandler::GetError();
+    if (!folder.Load(path, *it)) {
+      ErrorHandler::SetError(code);
+    }
     m_folders.emplace(path, std::move(folder));
   }
   return true;

@@ -422,8 +422,10 @@ bool IndexMgr::IsPathIndexed(const std::string& path, const std::vector<Folder>&
 
 bool IndexMgr::IsFullPathIndexed(const std::string& fullPath, const std::vector<Folder>& folders) {
   const std::string target = fullPath + "/";
+  // A folder whose share is gone holds no full path; its empty one would make "/" a prefix of
+  // everything.
   return std::any_of(folders.begin(), folders.end(), [&](const Folder& folder) {
-    return StringStartWith(target, folder.GetFullPath() + "/");
+    return folder.HasFullPath() && StringStartWith(target, folder.GetFullPath() + "/");
   });
 }
 

@@ -23,6 +23,7 @@ static const struct Question kQuestions[] = {
     {"FILEIDXIsFullPathIndexed", FILEIDXIsFullPathIndexed, "/video/clips/x", 1, 1},
     {"FILEIDXIsFullPathIndexed", FILEIDXIsFullPathIndexed, "/video/clip", 1, 0},
     {"FILEIDXIsFullPathIndexed", FILEIDXIsFullPathIndexed, "/photo", 0, 0},
+    {"FILEIDXIsFullPathIndexed", FILEIDXIsFullPathIndexed, "/etc/passwd", 0, 0},
     {"FILEIDXIsShareIndexed", FILEIDXIsShareIndexed, "video", 0, 1},
     {"FILEIDXIsShareIndexed", FILEIDXIsShareIndexed, "vid", 0, 0},
     {"FILEIDXIsShareIndexed", FILEIDXIsShareIndexed, "/video", 0, 0},

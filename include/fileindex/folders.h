@@ -34,7 +34,7 @@ class FILEINDEX_EXPORT Folders : public Config {
   Folders& operator=(const Folders&) = delete;
 
   // Reads the file into the list. A missing file is an empty list. A folder whose share cannot be
-  // resolved is kept, with an empty full path. Returns false with
+  // resolved is kept, with an empty full path, and sets no code. Returns false with
   // FILEINDEX_ERR_LOAD_JSON when the file cannot be read, or FILEINDEX_ERR_MALFORMED_FOLDERS
   // (logged, list unchanged) when it does not hold a JSON object.
   bool Load() override;

@@ -60,7 +60,8 @@ class FILEINDEX_EXPORT IndexMgr {
   // True when the share path `path` is an indexed folder or lies in one.
   static bool IsPathIndexed(const std::string& path, const std::vector<Folder>& folders);
   static bool IsPathIndexed(const std::string& path);
-  // The same for a full path ("/volume1/photo/2016"), compared with each folder's full path.
+  // The same for a full path ("/volume1/photo/2016"), compared with each folder's full path. A
+  // folder whose share is gone holds no full path and is passed over without a log line.
   static bool IsFullPathIndexed(const std::string& fullPath, const std::vector<Folder>& folders);
   static bool IsFullPathIndexed(const std::string& fullPath);
   // True when an indexed folder is the share path `path` or lies below it ("/photo" asks whether
