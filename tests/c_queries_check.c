@@ -39,13 +39,13 @@ int CheckCQueries(const char* volume) {
     const char* argument = q->argument;
     int answer;
     if (q->fullPath) {
-      snprintf(full, sizeof full, "%s%s", volume, q->argument);
+      (void)snprintf(full, sizeof full, "%s%s", volume, q->argument);
       argument = full;
     }
     answer = q->ask(argument);
     if (answer != q->expected) {
-      fprintf(stderr, "%s(\"%s\") = %d, expected %d\n", q->function,
-              argument != NULL ? argument : "(null)", answer, q->expected);
+      (void)fprintf(stderr, "%s(\"%s\") = %d, expected %d\n", q->function,
+                    argument != NULL ? argument : "(null)", answer, q->expected);
       ++wrong;
     }
   }

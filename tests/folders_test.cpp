@@ -25,6 +25,7 @@ using testsupport::ParseJson;
 
 std::vector<std::string> PathsOf(const std::vector<Folder>& folders) {
   std::vector<std::string> paths;
+  paths.reserve(folders.size());
   for (const Folder& folder : folders) {
     paths.push_back(folder.GetPath());
   }
@@ -51,7 +52,7 @@ Json::Value Report(bool document, bool audio, bool video, bool photo) {
 class FoldersTest : public testsupport::LibraryTest {
  protected:
   // Writes `text` as the folder list and loads it into `folders`.
-  void LoadText(Folders& folders, const std::string& text) {
+  static void LoadText(Folders& folders, const std::string& text) {
     testsupport::WriteFile(FolderConfPath(), text);
     ASSERT_TRUE(folders.Load());
   }
