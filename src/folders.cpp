@@ -33,28 +33,6 @@ Json::Value ChangeReport(const Json::Value& before, const Json::Value& after) {
   return report;
 }
 
-// A share path that names one place and no other: it starts with "/" and none of its components
-// is empty (doubled or trailing slashes), "." or "..". The monitor watches what the list names
-// with root's rights, so "/photo/../../etc" must never get in.
-bool IsCleanSharePath(const std::string& path) {
-  if (path.empty() || path.front() != '/') {
-    return false;
-  }
-  size_t start = 1;
-  while (true) {
-    const size_t slash = path.find('/', start);
-    const std::string component =
-        path.substr(start, slash == std::string::npos ? std::string::npos : slash - start);
-    if (component.empty() || component == "." || component == "..") {
-      return false;
-    }
-    if (slash == std::string::npos) {
-      return true;
-    }
-    start = slash + 1;
-  }
-}
-
 using FolderOrder = bool (*)(const Folder&, const Folder&);
 
 FolderOrder OrderBy(const std::string& sortBy) {
@@ -131,10 +109,14 @@ bool Folders::Load() {
   }
   for (auto it = m_jsRoot.begin(); it != m_jsRoot.end(); ++it) {
     // A folder whose share is gone is kept: it reports itself as not valid, and the user removes
-    // it. The stored "path" is ignored; the member's name is the folder's path.
+    // it. That is no failure of the load, so the code its full path left is not kept either.
+    // The stored "path" is ignored; the member's name is the folder's path.
     Folder folder;
     const std::string path = it.name();
-    folder.Load(path, *it);
+    const _tag_fileindex_err_ code = ErrorHandler::GetError();
+    if (!folder.Load(path, *it)) {
+      ErrorHandler::SetError(code);
+    }
     m_folders.emplace(path, std::move(folder));
   }
   return true;
@@ -215,7 +197,7 @@ bool Folders::Upsert(Json::Value& result, const Json::Value& request) {
 
   std::string path;
   std::string fullPath;
-  if (!RetrieveStringFromJsonObj(path, "path", request) || !IsCleanSharePath(path) ||
+  if (!RetrieveStringFromJsonObj(path, "path", request) ||
       !WEZO::FILEINDEX::GetFullPath(fullPath, path)) {
     FILEINDEX_LOG("Bad param: %s", JsonToString(request).c_str());
     ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);

@@ -23,6 +23,7 @@
 #include "fileindex/utils.h"
 #include "json_io.h"
 #include "log.h"
+#include "path_rules.h"
 #include "storage.h"
 
 namespace WEZO {
@@ -69,6 +70,65 @@ bool RefuseOnJsonError(const Json::Value& request, Operation operation) {
     RefuseRequest(__LINE__, request);
     return false;
   }
+}
+
+// Refuses a share operation on `share` unless it is the name of a share: an empty name would reach
+// the folder list as "every share", a name with a slash or a NUL byte another share than the one
+// named. True when refused.
+bool RefuseShareName(const std::string& share) {
+  if (IsShareName(share)) {
+    return false;
+  }
+  RefuseRequest(__LINE__, Json::Value(share));
+  return true;
+}
+
+// Decides whether a share path handed in by a caller may be used. A new path must be clean
+// (path_rules.h). A path that already names a folder in the list is taken as it is stored:
+// earlier versions stored paths that the rule refuses ("/photo/a/"), and those folders must still
+// be changed, reindexed and removed. The list is read only for a path that is not clean.
+class PathCheck {
+ public:
+  // Reads folder.conf without the lock when it is needed.
+  PathCheck() = default;
+  // Asks `list`, already loaded under the lock.
+  explicit PathCheck(const Folders& list) : m_list(&list) {}
+
+  bool Accepts(const std::string& path) {
+    if (IsCleanSharePath(path)) {
+      return true;
+    }
+    if (!m_read) {
+      m_read = true;
+      std::vector<Folder> folders;
+      if (m_list != nullptr ? m_list->List(folders) : IndexMgr::List(folders)) {
+        for (const Folder& folder : folders) {
+          m_stored.insert(folder.GetPath());
+        }
+      }
+    }
+    return m_stored.count(path) != 0;
+  }
+
+ private:
+  const Folders* m_list = nullptr;
+  bool m_read = false;
+  std::set<std::string> m_stored;
+};
+
+// Queues the update event of `path`, a path the operation has already accepted.
+bool QueueUpdate(const std::string& path, const Json::Value& data) {
+  std::string fullPath;
+  if (!GetFullPath(fullPath, path)) {
+    FILEINDEX_LOG("GetFullPath failed, path=%s", path.c_str());
+    ErrorHandler::SetError(FILEINDEX_ERR_PATH);
+    return false;
+  }
+  if (!AddCustomEvent(kEventUpdate, fullPath, data)) {
+    FILEINDEX_LOG("AddCustomEvent failed");
+    return false;
+  }
+  return true;
 }
 
 // Spotlight is switched on when it is known to be off; the SMB service reads the setting only
@@ -171,6 +231,16 @@ bool UpsertFolders(const Json::Value& request) {
   if (!list.Lock(true) || !list.Load()) {
     return false;
   }
+  // An element without a string "path" is left to Folders::Upsert, which refuses it in its own
+  // words.
+  PathCheck check(list);
+  for (const Json::Value& element : request) {
+    std::string path;
+    if (RetrieveStringFromJsonObj(path, "path", element) && !check.Accepts(path)) {
+      RefuseRequest(__LINE__, request);
+      return false;
+    }
+  }
 
   std::vector<std::string> paths;
   std::map<std::string, Json::Value> changed;  // a later element replaces an earlier report
@@ -210,7 +280,7 @@ bool UpsertFolders(const Json::Value& request) {
     }
   }
   return std::all_of(changed.begin(), changed.end(), [](const auto& pathAndReport) {
-    return IndexMgr::Update(pathAndReport.first, pathAndReport.second);
+    return QueueUpdate(pathAndReport.first, pathAndReport.second);
   });
 }
 
@@ -224,6 +294,12 @@ bool DeleteFolders(const Json::Value& request) {
   Folders list;
   const UnlockOnExit unlock(list);
   if (!list.Lock(true) || !list.Load()) {
+    return false;
+  }
+  PathCheck check(list);
+  if (!std::all_of(request.begin(), request.end(),
+                   [&](const Json::Value& element) { return check.Accepts(element.asString()); })) {
+    RefuseRequest(__LINE__, request);
     return false;
   }
 
@@ -255,7 +331,7 @@ bool DeleteFolders(const Json::Value& request) {
     // Only the setting now in force at the last path is queued as an update; the earlier paths
     // of the batch have had their commands.
     for (const std::string& path : lastReport.getMemberNames()) {
-      if (!IndexMgr::Update(path, lastReport[path])) {
+      if (!QueueUpdate(path, lastReport[path])) {
         FILEINDEX_LOG("Update failed");
         return false;
       }
@@ -272,9 +348,10 @@ bool ReindexPaths(const Json::Value& request) {
     return false;
   }
   // Every element is checked before anything is queued.
+  PathCheck check;
   std::set<std::string> noSpace;
   for (const Json::Value& element : request) {
-    if (!element.isString()) {
+    if (!element.isString() || !check.Accepts(element.asString())) {
       FILEINDEX_LOG("Malformed jsArrPath: %s", JsonToString(element).c_str());
       ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
       return false;
@@ -345,8 +422,10 @@ bool IndexMgr::IsPathIndexed(const std::string& path, const std::vector<Folder>&
 
 bool IndexMgr::IsFullPathIndexed(const std::string& fullPath, const std::vector<Folder>& folders) {
   const std::string target = fullPath + "/";
+  // A folder whose share is gone holds no full path; its empty one would make "/" a prefix of
+  // everything.
   return std::any_of(folders.begin(), folders.end(), [&](const Folder& folder) {
-    return StringStartWith(target, folder.GetFullPath() + "/");
+    return folder.HasFullPath() && StringStartWith(target, folder.GetFullPath() + "/");
   });
 }
 
@@ -407,20 +486,17 @@ bool IndexMgr::Reindex(const Json::Value& paths) {
 }
 
 bool IndexMgr::Update(const std::string& path, const Json::Value& data) {
-  std::string fullPath;
-  if (!GetFullPath(fullPath, path)) {
-    FILEINDEX_LOG("GetFullPath failed, path=%s", path.c_str());
-    ErrorHandler::SetError(FILEINDEX_ERR_PATH);
+  if (!PathCheck().Accepts(path)) {
+    RefuseRequest(__LINE__, Json::Value(path));
     return false;
   }
-  if (!AddCustomEvent(kEventUpdate, fullPath, data)) {
-    FILEINDEX_LOG("AddCustomEvent failed");
-    return false;
-  }
-  return true;
+  return QueueUpdate(path, data);
 }
 
 bool IndexMgr::ShareRemove(const std::string& share) {
+  if (RefuseShareName(share)) {
+    return false;
+  }
   Folders list;
   const UnlockOnExit unlock(list);
   std::vector<Folder> folders;
@@ -443,6 +519,13 @@ bool IndexMgr::ShareRemove(const std::string& share) {
 }
 
 bool IndexMgr::ShareRename(const std::string& oldShare, const std::string& newShare) {
+  if (!IsShareName(oldShare) || !IsShareName(newShare)) {
+    Json::Value names(Json::arrayValue);
+    names.append(oldShare);
+    names.append(newShare);
+    RefuseRequest(__LINE__, names);
+    return false;
+  }
   Folders list;
   const UnlockOnExit unlock(list);
   std::vector<Folder> folders;
@@ -455,7 +538,8 @@ bool IndexMgr::ShareRename(const std::string& oldShare, const std::string& newSh
       return false;
     }
     // The name and the settings travel with the record; the index data lies inside the share
-    // and moves with it.
+    // and moves with it. The rest of the path is carried over as stored, even where a request
+    // could no longer name it.
     folder.SetPath(ReplaceShareName(folder.GetPath(), newShare));
     if (!list.Upsert(report, folder.asJson())) {
       return false;
@@ -465,6 +549,9 @@ bool IndexMgr::ShareRename(const std::string& oldShare, const std::string& newSh
 }
 
 bool IndexMgr::SharePause(const std::string& share) {
+  if (RefuseShareName(share)) {
+    return false;
+  }
   // The worker stops first, so that nothing of the share is indexed once the monitor stops
   // reporting its changes.
   if (!SendCammandToDaemon("delete_share_worker", ShareCommand(share))) {
@@ -478,6 +565,9 @@ bool IndexMgr::SharePause(const std::string& share) {
 }
 
 bool IndexMgr::ShareResume(const std::string& share) {
+  if (RefuseShareName(share)) {
+    return false;
+  }
   // The monitor first, so that no change made while the worker starts is missed.
   if (!UpsertWEZotifydCfg(share)) {
     FILEINDEX_LOG("UpsertWEZotifydCfg failed, share=%s", share.c_str());
@@ -487,6 +577,9 @@ bool IndexMgr::ShareResume(const std::string& share) {
 }
 
 bool IndexMgr::CleanShareIndexData(const std::string& share) {
+  if (RefuseShareName(share)) {
+    return false;
+  }
   char location[kLocationSize] = {};
   if (FILEIDXQueuePathGet(share.c_str(), location, kLocationSize) < 0) {
     FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", share.c_str());

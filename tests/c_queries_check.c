@@ -23,6 +23,7 @@ static const struct Question kQuestions[] = {
     {"FILEIDXIsFullPathIndexed", FILEIDXIsFullPathIndexed, "/video/clips/x", 1, 1},
     {"FILEIDXIsFullPathIndexed", FILEIDXIsFullPathIndexed, "/video/clip", 1, 0},
     {"FILEIDXIsFullPathIndexed", FILEIDXIsFullPathIndexed, "/photo", 0, 0},
+    {"FILEIDXIsFullPathIndexed", FILEIDXIsFullPathIndexed, "/etc/passwd", 0, 0},
     {"FILEIDXIsShareIndexed", FILEIDXIsShareIndexed, "video", 0, 1},
     {"FILEIDXIsShareIndexed", FILEIDXIsShareIndexed, "vid", 0, 0},
     {"FILEIDXIsShareIndexed", FILEIDXIsShareIndexed, "/video", 0, 0},
@@ -38,13 +39,13 @@ int CheckCQueries(const char* volume) {
     const char* argument = q->argument;
     int answer;
     if (q->fullPath) {
-      snprintf(full, sizeof full, "%s%s", volume, q->argument);
+      (void)snprintf(full, sizeof full, "%s%s", volume, q->argument);
       argument = full;
     }
     answer = q->ask(argument);
     if (answer != q->expected) {
-      fprintf(stderr, "%s(\"%s\") = %d, expected %d\n", q->function,
-              argument != NULL ? argument : "(null)", answer, q->expected);
+      (void)fprintf(stderr, "%s(\"%s\") = %d, expected %d\n", q->function,
+                    argument != NULL ? argument : "(null)", answer, q->expected);
       ++wrong;
     }
   }

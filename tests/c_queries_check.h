@@ -7,8 +7,8 @@ extern "C" {
 #endif
 
 /* Asks the three questions of a fixed table about a folder list holding "/photo" and
- * "/video/clips", whose shares lie under `volume`. Prints each wrong answer to stderr and returns
- * how many there were. */
+ * "/video/clips", whose shares lie under `volume`, and a folder whose share is gone. Prints each
+ * wrong answer to stderr and returns how many there were. */
 int CheckCQueries(const char* volume);
 
 #ifdef __cplusplus

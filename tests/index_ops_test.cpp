@@ -325,6 +325,18 @@ TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {
       R"([{"path":"/photo/b"},"/photo/a"])",
       R"(["/photo/a",{"path":"/photo/b"}])",
       R"([{"path":"/photo/b"},[1]])",
+      // Paths that name more than one place, or another place than they seem to, are refused
+      // like any other malformed element.
+      R"(["/photo/../../../../etc"])",
+      R"(["/photo/a","/photo/.."])",
+      R"([""])",
+      R"(["photo/a"])",
+      R"(["/photo/./a"])",
+      R"(["/photo//a"])",
+      R"(["/photo/a/"])",
+      R"(["/photo/a\u0000"])",
+      R"([{"path":"/photo/b"},{"path":"/photo/x/../../../etc"}])",
+      R"([{"path":"/photo/b\u0000"}])",
   };
   const std::pair<const char*, bool (*)(const Json::Value&)> operations[] = {
       {"Upsert", &IndexMgr::Upsert}, {"Set", &IndexMgr::Set},         {"Add", &IndexMgr::Add},
@@ -345,6 +357,28 @@ TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {
       EXPECT_EQ(ReadFile(FolderConfPath()), before);
     }
   }
+  // A share name that is empty, or that no share can have, names no share: the folder list
+  // would read "" as every share.
+  const std::pair<const char*, std::function<bool()>> shareOperations[] = {
+      {"ShareRemove", [] { return IndexMgr::ShareRemove(""); }},
+      {"ShareRename old", [] { return IndexMgr::ShareRename("", "video"); }},
+      {"ShareRename new", [] { return IndexMgr::ShareRename("photo", ""); }},
+      {"ShareRename up", [] { return IndexMgr::ShareRename("photo", ".."); }},
+      {"SharePause", [] { return IndexMgr::SharePause(""); }},
+      {"SharePause NUL", [] { return IndexMgr::SharePause(std::string("photo\0x", 7)); }},
+      {"ShareResume", [] { return IndexMgr::ShareResume(""); }},
+      {"CleanShareIndexData", [] { return IndexMgr::CleanShareIndexData(""); }},
+  };
+  for (const auto& [name, operation] : shareOperations) {
+    SCOPED_TRACE(name);
+    ErrorHandler::SetError(FILEINDEX_ERR_NONE);
+    log.Clear();
+    EXPECT_FALSE(operation());
+    EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_BAD_PARAM);
+    EXPECT_THAT(log.Lines(), ElementsAre(StartsWith("index_mgr:N Bad param: ")));
+  }
+  EXPECT_EQ(ReadFile(FolderConfPath()), before);
+
   EXPECT_THAT(Effects(), IsEmpty());
   EXPECT_THAT(Events("photo"), IsEmpty());
   EXPECT_THAT(daemon.Connections(1, std::chrono::milliseconds(200)), IsEmpty());
@@ -499,15 +533,10 @@ TEST_F(IndexOpsTest, ReindexQueuesNothingUnlessEveryElementIsAcceptable) {
        {},
        {"index_mgr:N Malformed jsArrPath: 3"}},
       {R"(["/photo/x","/music/y"])", false, FILEINDEX_ERR_NONE, {}, {}},
-      {R"(["/photo/x",""])",
-       false,
-       FILEINDEX_ERR_NONE,
-       {},
-       {"index_mgr:N Failed to get share name from path: "}},
-      {R"(["/photo/not-indexed","/photo"])",
+      {R"(["/photo/not-indexed","/photo","/photo/...a/.b"])",
        true,
        FILEINDEX_ERR_NONE,
-       {"65536 /photo/not-indexed null", "65536 /photo null"},
+       {"65536 /photo/not-indexed null", "65536 /photo null", "65536 /photo/...a/.b null"},
        {}},
   };
   for (const Case& c : cases) {
@@ -550,6 +579,17 @@ TEST_F(IndexOpsTest, UpdateQueuesOneEventWithThePayload) {
   EXPECT_FALSE(IndexMgr::Update("/music/a.mp3", Json::Value()));
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_PATH);
   EXPECT_THAT(log.Lines(), ElementsAre("index_mgr:N GetFullPath failed, path=/music/a.mp3"));
+
+  const std::string paths[] = {"/photo/../../etc", "", "photo/a", "/photo/a/",
+                               std::string("/photo/a\0/../../etc", 19)};
+  for (const std::string& path : paths) {
+    SCOPED_TRACE(path);
+    log.Clear();
+    EXPECT_FALSE(IndexMgr::Update(path, Json::Value()));
+    EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_BAD_PARAM);
+    EXPECT_THAT(log.Lines(), ElementsAre("index_mgr:N Bad param: " + JsonToString(path)));
+  }
+  EXPECT_EQ(Events("photo").size(), 1U);
 }
 
 TEST_F(IndexOpsTest, ShareRemoveAndRenameChangeOnlyTheList) {
@@ -574,6 +614,43 @@ TEST_F(IndexOpsTest, ShareRemoveAndRenameChangeOnlyTheList) {
   ASSERT_TRUE(IndexMgr::ShareRemove("video"));
   EXPECT_EQ(FolderConf(), Json::Value(Json::objectValue));
   EXPECT_THAT(Effects(), ElementsAre("Stop fileindexd", "Spotlight 0", "Restart samba"));
+  EXPECT_THAT(log.Lines(), IsEmpty());
+}
+
+TEST_F(IndexOpsTest, FoldersStoredByEarlierVersionsAreTakenAsTheyAre) {
+  // Earlier versions stored paths that a request may no longer name, such as a trailing slash.
+  FakeDaemon daemon;
+  std::filesystem::create_directories(volume + "/pictures");
+  fake::Get().AddShare("pictures", volume + "/pictures");
+  WriteFile(FolderConfPath(), R"({"/photo/a/":{},"/video/v":{}})");
+  const struct {
+    const char* name;
+    std::function<bool()> operation;
+    std::vector<std::string> saved;
+  } steps[] = {
+      {"migration", Updater_hxo60_beta2, {"/photo/a/", "/video/v"}},
+      {"change",
+       [] { return IndexMgr::Set(ParseJson(R"([{"path":"/photo/a/","name":"A"}])")); },
+       {"/photo/a/", "/video/v"}},
+      {"update",
+       [] { return IndexMgr::Update("/photo/a/", Json::Value()); },
+       {"/photo/a/", "/video/v"}},
+      {"rename",
+       [] { return IndexMgr::ShareRename("photo", "pictures"); },
+       {"/pictures/a/", "/video/v"}},
+      {"reindex",
+       [] { return IndexMgr::Reindex(ParseJson(R"(["/pictures/a/"])")); },
+       {"/pictures/a/", "/video/v"}},
+      {"delete", [] { return IndexMgr::Delete(ParseJson(R"(["/pictures/a/"])")); }, {"/video/v"}},
+  };
+  for (const auto& step : steps) {
+    SCOPED_TRACE(step.name);
+    EXPECT_TRUE(step.operation());
+    EXPECT_EQ(FolderConf().getMemberNames(), step.saved);
+    if (step.saved[0] == "/pictures/a/") {
+      EXPECT_EQ(FolderConf()["/pictures/a/"]["name"], "A");
+    }
+  }
   EXPECT_THAT(log.Lines(), IsEmpty());
 }
 

@@ -38,6 +38,10 @@ class FILEINDEX_EXPORT Folder {
   // storing it; returns "" (logged) when the share path cannot be resolved.
   std::string GetFullPath() const;
 
+  // True when the full path was derived as the share path was last set. False for a folder whose
+  // share was gone then: it holds no full path, and GetFullPath would try again and log.
+  bool HasFullPath() const { return !m_fullPath.empty(); }
+
   const std::string& GetPath() const { return m_path; }
   const std::string& GetName() const { return m_name; }
   bool GetDocument() const { return m_document; }

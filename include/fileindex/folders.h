@@ -34,9 +34,9 @@ class FILEINDEX_EXPORT Folders : public Config {
   Folders& operator=(const Folders&) = delete;
 
   // Reads the file into the list. A missing file is an empty list. A folder whose share cannot be
-  // resolved is kept, with an empty full path. Returns false with FILEINDEX_ERR_LOAD_JSON when the
-  // file cannot be read, or FILEINDEX_ERR_MALFORMED_FOLDERS (logged, list unchanged) when it does
-  // not hold a JSON object.
+  // resolved is kept, with an empty full path, and sets no code. Returns false with
+  // FILEINDEX_ERR_LOAD_JSON when the file cannot be read, or FILEINDEX_ERR_MALFORMED_FOLDERS
+  // (logged, list unchanged) when it does not hold a JSON object.
   bool Load() override;
 
   // Replaces the file with the list, in key order, mode 0644. Returns false with
@@ -74,10 +74,11 @@ class FILEINDEX_EXPORT Folders : public Config {
   // as Folder::Reload does. On success `result` becomes the change report: {"document", "audio",
   // "video", "photo"}, each true when the setting that applies at the folder's location differs
   // from the one that applied before. Returns false with FILEINDEX_ERR_BAD_PARAM (logged) when the
-  // request has no string "path", the path is not a clean absolute share path (empty, "." or ".."
-  // components, a trailing slash) or its share is unknown; with FILEINDEX_ERR_EXCEED_MAX_FOLDER
+  // request has no string "path" or its share is unknown; with FILEINDEX_ERR_EXCEED_MAX_FOLDER
   // (logged) when a new folder would make more than kMaxFolders. After a false result the list in
-  // memory may hold the refused folder: do not save it.
+  // memory may hold the refused folder: do not save it. The path is otherwise taken as it is, so
+  // that stored records move unchanged (a share's rename); a path that a caller hands in is
+  // checked by the index manager (fileindex/index_mgr.h) before it gets here.
   bool Upsert(Json::Value& result, const Json::Value& request);
 
   // Removes the folder at `path` (a path not in the list removes nothing). On success `result`

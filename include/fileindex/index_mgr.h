@@ -12,7 +12,11 @@
 //
 // Requests are JSON values. A request of the wrong shape is refused with FILEINDEX_ERR_BAD_PARAM
 // and a "Bad param" log line, the folder list left as it was; no exception leaves these
-// operations.
+// operations. Every share path a request names must be clean: it starts with "/", has no empty,
+// "." or ".." component (so no doubled or trailing slash) and holds no NUL byte. A path that is
+// already the key of a folder in the list is taken as it is stored, since earlier versions stored
+// paths that this rule refuses. Every share name must be the name a share can have: not empty,
+// no "/", no NUL byte, not "." or "..".
 #ifndef FILEINDEX_INDEX_MGR_H_
 #define FILEINDEX_INDEX_MGR_H_
 
@@ -56,7 +60,8 @@ class FILEINDEX_EXPORT IndexMgr {
   // True when the share path `path` is an indexed folder or lies in one.
   static bool IsPathIndexed(const std::string& path, const std::vector<Folder>& folders);
   static bool IsPathIndexed(const std::string& path);
-  // The same for a full path ("/volume1/photo/2016"), compared with each folder's full path.
+  // The same for a full path ("/volume1/photo/2016"), compared with each folder's full path. A
+  // folder whose share is gone holds no full path and is passed over without a log line.
   static bool IsFullPathIndexed(const std::string& fullPath, const std::vector<Folder>& folders);
   static bool IsFullPathIndexed(const std::string& fullPath);
   // True when an indexed folder is the share path `path` or lies below it ("/photo" asks whether
@@ -75,7 +80,8 @@ class FILEINDEX_EXPORT IndexMgr {
   // when it was off (a failure there is only logged); the daemon gets one "upsert_folder_setting"
   // command per element; and each distinct path gets one update event, carrying its change
   // report, in its share's queue (ascending by path). An empty array still starts the service.
-  // False with FILEINDEX_ERR_BAD_PARAM when `folders` is not an array or an element is refused,
+  // False with FILEINDEX_ERR_BAD_PARAM when `folders` is not an array, an element's path is not
+  // clean (see above) or an element is refused by Folders::Upsert,
   // FILEINDEX_ERR_EXCEED_MAX_FOLDER when the list would grow past Folders::kMaxFolders (nothing
   // saved in both cases), FILEINDEX_ERR_PATH when a full path cannot be formed for an event;
   // otherwise with the code of the step that failed.
@@ -91,32 +97,36 @@ class FILEINDEX_EXPORT IndexMgr {
   // element, and the setting that now applies at the last path is queued as its update event.
   // Then each share concerned is registered again with its remaining folders, or, when it has
   // none left, has its index data removed (CleanShareIndexData) and its registration dropped.
-  // False with FILEINDEX_ERR_BAD_PARAM, nothing changed, when `paths` is not an array of strings;
-  // otherwise with the code of the step that failed.
+  // False with FILEINDEX_ERR_BAD_PARAM, nothing changed, when `paths` is not an array of strings
+  // or one of them is not clean (see above); otherwise with the code of the step that failed.
   static bool Delete(const Json::Value& paths);
 
   // Queues a full reindex (kEventReindex) of each share path of the array `paths`, in order.
   // Nothing is queued unless every element is a string in a share that has at least one indexed
   // folder (the path itself need not be indexed). Shares flagged out of space are revived first;
   // a revive that fails is logged and does not stop the reindex. False with
-  // FILEINDEX_ERR_BAD_PARAM for a non-array or a non-string element, FILEINDEX_ERR_PATH when a full
-  // path cannot be formed; events queued for earlier elements then stay queued.
+  // FILEINDEX_ERR_BAD_PARAM, nothing queued, for a non-array, or an element that is not a string or
+  // not clean (see above); FILEINDEX_ERR_PATH when a full path cannot be formed; events queued for
+  // earlier elements then stay queued.
   static bool Reindex(const Json::Value& paths);
 
   // Queues an update event (kEventUpdate) of the share path `path` with `data` as its payload.
-  // False with FILEINDEX_ERR_PATH when the path's full path cannot be formed, or when the queue
-  // refuses the event (logged by the queue).
+  // False with FILEINDEX_ERR_BAD_PARAM, nothing queued, when `path` is not clean (see above); with
+  // FILEINDEX_ERR_PATH when the path's full path cannot be formed, or when the queue refuses the
+  // event (logged by the queue).
   static bool Update(const std::string& path, const Json::Value& data);
 
-  // The share lifecycle. Each takes share names, not paths, and sets no code of its own: after a
-  // failure the code is the failing step's.
+  // The share lifecycle. Each takes share names, not paths. A name that no share can have (see
+  // above; "" in particular, which the folder list reads as every share) is refused with
+  // FILEINDEX_ERR_BAD_PARAM and a "Bad param" line before anything is touched. Otherwise they set
+  // no code of their own: after a failure the code is the failing step's.
   //
   // The share was removed: its folders leave the list. When the list becomes empty, the service
   // fileindexd is stopped and Spotlight switched off (failures only logged). The monitor
   // registration, the index data and the daemon are left alone.
   static bool ShareRemove(const std::string& share);
   // The share was renamed: each of its folders moves to the same place under `newShare`, with
-  // its name and settings. Only the list changes.
+  // its name and settings and the rest of its path as stored. Only the list changes.
   static bool ShareRename(const std::string& oldShare, const std::string& newShare);
   // The share went offline: the daemon stops the share's worker ("delete_share_worker"), then the
   // share's monitor registration is removed. False, with the registration kept, when the daemon
