@@ -191,11 +191,6 @@ TEST_F(EventQueueTest, AnEventThatCannotBeQueuedFlagsItsShareForAFullReindex) {
        },
        "photo",
        {refused + "No such device or address"}},
-      {"a directory",
-       folder,
-       [&] { std::filesystem::create_directory(queue); },
-       "photo",
-       {refused + "Is a directory"}},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
@@ -219,8 +214,7 @@ TEST_F(EventQueueTest, AnEventThatCannotBeQueuedFlagsItsShareForAFullReindex) {
 TEST_F(EventQueueTest, TheQueueStaysLineAlignedWhenAWriteFallsShort) {
   const std::string line = Line(kEventUpdate, folder);
   // Long enough that the status file, written by the same process, stays below the limit.
-  const std::string partial(4000, 'x');
-  const std::string whole = partial + "\n";
+  const std::string whole = std::string(4000, 'x') + "\n";
   struct Case {
     const char* name;
     std::string before;
@@ -232,8 +226,6 @@ TEST_F(EventQueueTest, TheQueueStaysLineAlignedWhenAWriteFallsShort) {
        std::string(R"({"event":655)") + "\n" + line},
       {"a short write is cut off again and flags the share", whole, whole.size() + line.size() / 2,
        false, whole},
-      {"also after ending a partial line", partial, partial.size() + line.size() / 2, false,
-       partial},
   };
   for (const Case& c : cases) {
     SCOPED_TRACE(c.name);
@@ -243,7 +235,7 @@ TEST_F(EventQueueTest, TheQueueStaysLineAlignedWhenAWriteFallsShort) {
     const pid_t child = fork();
     ASSERT_GE(child, 0);
     if (child == 0) {
-      signal(SIGXFSZ, SIG_IGN);
+      (void)signal(SIGXFSZ, SIG_IGN);
       const rlimit limit{c.sizeLimit, c.sizeLimit};
       if (c.sizeLimit != 0 && setrlimit(RLIMIT_FSIZE, &limit) != 0) {
         _exit(2);
