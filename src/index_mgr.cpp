@@ -123,7 +123,6 @@ Json::Value ShareCommand(const std::string& share) {
   return data;
 }
 
-// Removes `path` with the system's rm; a path that is missing or stays is not looked at.
 // Removes the index data at `path`, a file or a whole directory. The metadata directory is
 // writable by the share's users, so the removal runs in-process and never follows a link, where
 // a removal program given the path would resolve it through any link planted on the way.
