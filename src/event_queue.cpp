@@ -3,6 +3,7 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 #include <wezo/platform.h>
 #include <cerrno>
@@ -24,22 +25,50 @@ namespace {
 
 constexpr int kLockAttempts = 3;
 
-// The queue lies in a share that users can write to: a symbolic link planted at its name must
-// not turn the appends into writes to another file.
-UniqueFd OpenQueueForAppend(const std::string& queuePath) {
-  return UniqueFd(
-      open(queuePath.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_NOFOLLOW | O_CLOEXEC, 0644));
+// Writes `line` at the end of the locked queue `fd` in one call. A last line without its "\n",
+// left by a writer that failed part-way, is ended first, so that the event never joins it; a
+// write of our own that falls short is cut off again, since the next writer's line would
+// otherwise be glued to the torn one and both events lost. False when the event is not in the
+// queue whole.
+bool WriteLineAligned(int fd, const std::string& line) {
+  struct stat st {};
+  if (fstat(fd, &st) != 0) {
+    return false;
+  }
+  char last = '\n';
+  if (st.st_size > 0 && pread(fd, &last, 1, st.st_size - 1) != 1) {
+    return false;
+  }
+  std::string ended;
+  const std::string* data = &line;
+  if (last != '\n') {
+    ended = '\n' + line;
+    data = &ended;
+  }
+  const ssize_t written = write(fd, data->data(), data->size());
+  if (written == static_cast<ssize_t>(data->size())) {
+    return true;
+  }
+  FILEINDEX_LOG_DEBUG("write fail, (%ld, %ld)", static_cast<long>(written),
+                      static_cast<long>(data->size()));
+  if (written > 0) {
+    (void)ftruncate(fd, st.st_size);
+  }
+  return false;
 }
 
-// Appends `line` under an exclusive lock of the queue file; false when the queue cannot be opened
-// or locked. Contention that outlasts the attempts drops the line and still counts as appended:
-// the monitor and the daemon hold the lock only briefly, and a caller that is told otherwise
-// flags the whole share for reindexing.
+// Appends `line` under an exclusive lock of the queue file; false when the queue cannot be
+// opened or locked or the line not written whole. Contention that outlasts the attempts drops
+// the line and still counts as appended: the monitor and the daemon hold the lock only briefly,
+// and a caller that is told otherwise flags the whole share for reindexing.
 bool AppendLine(const std::string& queuePath, const std::string& line) {
   UniqueFd fd;
   for (int attempt = 1;; ++attempt) {
-    fd = OpenQueueForAppend(queuePath);
+    // Read as well as write: the last byte tells whether the file ends with a whole line.
+    fd = OpenLocationFile(queuePath, O_RDWR | O_CREAT | O_APPEND, 0644);
     if (!fd) {
+      FILEINDEX_LOG("Failed to open queue=%s, reason=%s", queuePath.c_str(),
+                    detail::ErrnoText().c_str());
       return false;
     }
     if (flock(fd.get(), LOCK_EX | LOCK_NB) == 0) {
@@ -61,25 +90,21 @@ bool AppendLine(const std::string& queuePath, const std::string& line) {
 
   // One write on an O_APPEND descriptor under the lock: lines of concurrent writers never
   // interleave.
-  const ssize_t written = write(fd.get(), line.data(), line.size());
-  if (written < static_cast<ssize_t>(line.size())) {
-    FILEINDEX_LOG_DEBUG("write fail, (%ld, %ld)", static_cast<long>(written),
-                        static_cast<long>(line.size()));
-  }
+  const bool written = WriteLineAligned(fd.get(), line);
   flock(fd.get(), LOCK_UN);
-  return true;
+  return written;
 }
 
 // Appends the event to the share's queue; false, logged, when it cannot be queued.
 bool AppendEvent(const std::string& share, int event, const std::string& path,
-                const Json::Value& data) {
+                 const Json::Value& data) {
   std::string queue;
   if (!ShareQueuePath(share, queue)) {
     FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", share.c_str());
     return false;
   }
   // A queued reindex of the path covers every other event for it.
-  if (IsReindexQueued(path, queue) || IsReindexQueued(path, queue + ".tmp")) {
+  if (IsReindexQueued(path, queue) || IsReindexQueued(path, queue + kQueueTmpSuffix)) {
     return true;
   }
   Json::Value entry(Json::objectValue);

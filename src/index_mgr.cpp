@@ -183,9 +183,15 @@ Json::Value ShareCommand(const std::string& share) {
   return data;
 }
 
-// Removes `path` with the system's rm; a path that is missing or stays is not looked at.
-void RemoveTree(const std::string& path) {
-  (void)WLIBCExec("/bin/rm", "-rf", path.c_str(), nullptr, nullptr);
+// Removes the index data at `path`, a file or a whole directory. The metadata directory is
+// writable by the share's users, so the removal runs in-process and never follows a link, where
+// a removal program given the path would resolve it through any link planted on the way.
+bool RemoveTree(const std::string& path) {
+  if (RemoveLocation(path)) {
+    return true;
+  }
+  FILEINDEX_LOG("Failed to remove %s, reason=%s", path.c_str(), detail::ErrnoText().c_str());
+  return false;
 }
 
 // After folders of the share `share` left the list: the monitor goes on watching the share's
@@ -586,14 +592,14 @@ bool IndexMgr::CleanShareIndexData(const std::string& share) {
     return false;
   }
   const std::string queue = location;
-  RemoveTree(queue);
-  RemoveTree(queue + ".tmp");
+  // Each location is tried even when another could not be removed.
+  bool removed = RemoveTree(queue);
+  removed = RemoveTree(queue + kQueueTmpSuffix) && removed;
   if (FILEIDXDBPathGet(share.c_str(), location, kLocationSize) < 0) {
     FILEINDEX_LOG("FILEIDXDBPathGet failed, share=%s", share.c_str());
     return false;
   }
-  RemoveTree(location);
-  return true;
+  return RemoveTree(location) && removed;
 }
 
 bool IndexMgr::UpsertWEZotifydCfg(const std::string& share) {

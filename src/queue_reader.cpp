@@ -17,6 +17,7 @@
 #include "fileindex/utils.h"
 #include "json_io.h"
 #include "log.h"
+#include "storage.h"
 #include "unique_fd.h"
 
 namespace WEZO {
@@ -484,7 +485,7 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile, size
   if (!IsFileExist(queueFile)) {
     return false;
   }
-  const UniqueFd fd(open(queueFile.c_str(), O_RDONLY | O_CLOEXEC));
+  const UniqueFd fd = OpenLocationFile(queueFile, O_RDONLY);
   if (!fd) {
     FILEINDEX_LOG("Failed to open queue=%s, reason=%s", queueFile.c_str(), ErrnoText().c_str());
     return false;
@@ -511,7 +512,7 @@ bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile
     WriteLog(false, kFolderUnit, __LINE__, "Cannot get full path: %s", folder.c_str());
     return false;
   }
-  const UniqueFd fd(open(queueFile.c_str(), O_RDONLY | O_CLOEXEC));
+  const UniqueFd fd = OpenLocationFile(queueFile, O_RDONLY);
   if (!fd) {
     WriteLog(false, kFolderUnit, __LINE__, "Failed to open queue=%s, reason=%s", queueFile.c_str(),
              ErrnoText().c_str());

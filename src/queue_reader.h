@@ -6,7 +6,9 @@
 // text cannot settle. Their answers are exactly those of parsing every line: a line that does not
 // parse, is not an object, lacks "event" or "path", has an "event" that is not convertible to an
 // unsigned integer or a "path" that is not a string counts as no event. A last line without "\n"
-// (a writer still busy) is read like any other line. Neither reader locks the file. Reentrant.
+// (a writer still busy) is read like any other line. Neither reader locks the file. The file is
+// opened as OpenLocationFile (storage.h) opens it: a link below the share, or anything but a
+// regular file, counts as a file that cannot be opened. Reentrant.
 #ifndef FILEINDEX_SRC_QUEUE_READER_H_
 #define FILEINDEX_SRC_QUEUE_READER_H_
 

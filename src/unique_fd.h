@@ -29,6 +29,9 @@ class UniqueFd {
   int get() const { return m_fd; }
   explicit operator bool() const { return m_fd >= 0; }
 
+  // Gives the descriptor up without closing it; the caller owns it from now on.
+  int Release() { return std::exchange(m_fd, -1); }
+
   // Closes now; returns close()'s result, 0 when nothing was open.
   int Close() {
     if (m_fd < 0) {

@@ -1,13 +1,22 @@
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <json/value.h>
+#include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <chrono>
+#include <csignal>
 #include <filesystem>
+#include <functional>
+#include <future>
 #include <sstream>
 #include <string>
+#include <thread>
+#include <utility>
+#include <vector>
 
 #include "fake_platform.h"
 #include "fileindex/error.h"
@@ -122,42 +131,127 @@ TEST_F(EventQueueTest, AQueueKeptLockedByAnotherProcessDropsTheEventAndSucceeds)
   EXPECT_FALSE(std::filesystem::exists(StatusConfPath())) << "nothing flagged";
 }
 
+// AddCustomEvent on a thread, waited for at most 5 s. A call still blocked then fails the test;
+// opening the queue for reading releases a writer stuck on a FIFO, so the thread can end.
+bool AddWithinBound(const std::string& path, const std::string& queue) {
+  std::packaged_task<bool()> task(
+      [&] { return AddCustomEvent(kEventUpdate, path, Json::Value()); });
+  std::future<bool> done = task.get_future();
+  std::thread thread(std::move(task));
+  if (done.wait_for(std::chrono::seconds(5)) != std::future_status::ready) {
+    ADD_FAILURE() << "still blocked after 5 s";
+    const int reader = open(queue.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+    thread.join();
+    close(reader);
+  } else {
+    thread.join();
+  }
+  return done.get();
+}
+
 TEST_F(EventQueueTest, AnEventThatCannotBeQueuedFlagsItsShareForAFullReindex) {
   const std::string target = volume + "/photo/victim";
   WriteFile(target, "keep");
+  int reader = -1;
+  const std::string video = volume + "/video/@eaDir/WEZO@file_index_queue";
+  const std::string refused = "utils:N Failed to open queue=" + queue + ", reason=";
   struct Case {
     const char* name;
     std::string path;
-    void (*arrange)(const std::string& queue, const std::string& target);
+    std::function<void()> arrange;
     const char* share;
-    std::string line;
+    std::vector<std::string> lines;
   } cases[] = {
-      {"outside every share", "/elsewhere/x", nullptr, "",
-       "utils:N WEZOShareNamePathGet failed, path=/elsewhere/x"},
-      {"a symbolic link planted as the queue", folder,
-       [](const std::string& q, const std::string& t) { std::filesystem::create_symlink(t, q); },
-       "photo", ""},
-      {"the metadata directory is missing", volume + "/video/a", nullptr, "video", ""},
+      {"outside every share",
+       "/elsewhere/x",
+       [] {},
+       "",
+       {"utils:N WEZOShareNamePathGet failed, path=/elsewhere/x"}},
+      {"a symbolic link planted as the queue",
+       folder,
+       [&] { std::filesystem::create_symlink(target, queue); },
+       "photo",
+       {refused + "Too many levels of symbolic links"}},
+      {"the metadata directory is missing",
+       volume + "/video/a",
+       [] { fake::Get().ea_mkdir_fails = true; },
+       "video",
+       {"utils:N WEZOEAMKDir failed, path=" + volume + "/video/@eaDir, code=3585",
+        "utils:N Failed to open queue=" + video + ", reason=No such file or directory"}},
+      {"a FIFO that nobody reads",
+       folder,
+       [&] { mkfifo(queue.c_str(), 0644); },
+       "photo",
+       {refused + "No such device or address"}},
+      {"a FIFO with a reader",
+       folder,
+       [&] {
+         mkfifo(queue.c_str(), 0644);
+         reader = open(queue.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+       },
+       "photo",
+       {refused + "No such device or address"}},
   };
   for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
     std::filesystem::remove(StatusConfPath());
+    std::filesystem::remove(queue);
     log.Clear();
-    if (c.arrange != nullptr) {
-      c.arrange(queue, target);
-    }
-    if (std::string(c.share) == "video") {
-      fake::Get().ea_mkdir_fails = true;
-    }
-    EXPECT_FALSE(AddCustomEvent(kEventUpdate, c.path, Json::Value())) << c.name;
+    c.arrange();
+    EXPECT_FALSE(AddWithinBound(c.path, queue));
     fake::Get().ea_mkdir_fails = false;
+    if (reader >= 0) {
+      close(std::exchange(reader, -1));
+    }
     Json::Value flagged(Json::objectValue);
     flagged[c.share] = true;
-    EXPECT_EQ(StatusFile()["need_reindex"], flagged) << c.name;
-    if (!c.line.empty()) {
-      EXPECT_THAT(log.Lines(), ElementsAre(c.line)) << c.name;
-    }
+    EXPECT_EQ(StatusFile()["need_reindex"], flagged);
+    EXPECT_EQ(log.Lines(), c.lines);
   }
   EXPECT_EQ(ReadFile(target), "keep");
+}
+
+TEST_F(EventQueueTest, TheQueueStaysLineAlignedWhenAWriteFallsShort) {
+  const std::string line = Line(kEventUpdate, folder);
+  // Long enough that the status file, written by the same process, stays below the limit.
+  const std::string whole = std::string(4000, 'x') + "\n";
+  struct Case {
+    const char* name;
+    std::string before;
+    rlim_t sizeLimit;  // 0: none
+    bool result;
+    std::string after;
+  } cases[] = {
+      {"another writer's partial line is ended first", R"({"event":655)", 0, true,
+       std::string(R"({"event":655)") + "\n" + line},
+      {"a short write is cut off again and flags the share", whole, whole.size() + line.size() / 2,
+       false, whole},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    std::filesystem::remove(StatusConfPath());
+    WriteFile(queue, c.before);
+    // The size limit binds the writing process, so the write runs in a child.
+    const pid_t child = fork();
+    ASSERT_GE(child, 0);
+    if (child == 0) {
+      (void)signal(SIGXFSZ, SIG_IGN);
+      const rlimit limit{c.sizeLimit, c.sizeLimit};
+      if (c.sizeLimit != 0 && setrlimit(RLIMIT_FSIZE, &limit) != 0) {
+        _exit(2);
+      }
+      _exit(AddCustomEvent(kEventUpdate, folder, Json::Value()) ? 0 : 1);
+    }
+    int status = 0;
+    ASSERT_EQ(waitpid(child, &status, 0), child);
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), c.result ? 0 : 1);
+    EXPECT_EQ(ReadFile(queue), c.after);
+    EXPECT_EQ(std::filesystem::exists(StatusConfPath()), !c.result);
+    if (!c.result) {
+      EXPECT_EQ(StatusFile()["need_reindex"], ParseJson(R"({"photo":true})"));
+    }
+  }
 }
 
 TEST_F(EventQueueTest, AFlagThatCannotBeSetIsLogged) {

@@ -3,10 +3,17 @@
 #include <sys/stat.h>
 
 #include <filesystem>
+#include <functional>
+#include <map>
 #include <string>
+#include <vector>
 
 #include "fake_platform.h"
 #include "fileindex/fileindex_c.h"
+#include "fileindex/index_mgr.h"
+#include "fileindex/queue.h"
+#include "queue_reader.h"
+#include "storage.h"
 #include "test_support.h"
 
 namespace WEZO {
@@ -66,15 +73,33 @@ TEST_F(StorageTest, WritesTheLocationsAndCreatesOnlyTheirDirectories) {
   EXPECT_EQ(buffer, queue);
   EXPECT_TRUE(std::filesystem::is_directory(volume + "/photo/@eaDir"));
   EXPECT_FALSE(std::filesystem::exists(queue));
+  EXPECT_EQ(fake::Get().openShareRecords, 0);
+}
 
-  const mode_t oldMask = umask(022);
+// Made when missing; an existing one is no error and loses only its group and world write bits.
+TEST_F(StorageTest, TheDatabaseDirectoryIsWritableByItsOwnerOnlyWhateverTheUmask) {
   const std::string db = volume + "/photo/@eaDir/WEZO@.fileindexdb";
-  EXPECT_EQ(FILEIDXDBPathGet("photo", buffer, sizeof buffer), static_cast<int>(db.size()));
-  EXPECT_EQ(FILEIDXDBPathGet("photo", buffer, sizeof buffer), static_cast<int>(db.size()));
-  umask(oldMask);
-  EXPECT_EQ(buffer, db);
-  EXPECT_EQ(testsupport::ModeOf(db), 0755) << "0777 less the umask";
-  EXPECT_THAT(log.Lines(), IsEmpty()) << "an existing directory is not an error";
+  struct Case {
+    mode_t umask;
+    int existing;  // the mode of a directory already there, or -1
+    int mode;
+  } cases[] = {
+      {0, -1, 0755}, {077, -1, 0755}, {0, 0777, 0755}, {0, 0775, 0755}, {0, 0700, 0700},
+  };
+  for (const Case& c : cases) {
+    std::filesystem::remove_all(db);
+    if (c.existing >= 0) {
+      std::filesystem::create_directories(db);
+      chmod(db.c_str(), static_cast<mode_t>(c.existing));
+    }
+    char buffer[4096];
+    const mode_t oldMask = umask(c.umask);
+    EXPECT_EQ(FILEIDXDBPathGet("photo", buffer, sizeof buffer), static_cast<int>(db.size()));
+    umask(oldMask);
+    EXPECT_EQ(buffer, db);
+    EXPECT_EQ(testsupport::ModeOf(db), c.mode) << std::oct << c.umask << " " << c.existing;
+  }
+  EXPECT_THAT(log.Lines(), IsEmpty());
   EXPECT_EQ(fake::Get().openShareRecords, 0);
 }
 
@@ -95,6 +120,98 @@ TEST_F(StorageTest, DirectoriesThatCannotBeCreatedAreLoggedAndThePathStillReturn
       log.Lines(),
       ElementsAre("utils:N WEZOEAMKDir failed, path=" + volume + "/photo/@eaDir, code=3585",
                   "utils:N mkdir failed, path=" + db + ", reason=No such file or directory"));
+}
+
+// Every file and directory below `dir` (links not followed) with its content, "<dir>" or
+// "<link>".
+std::map<std::string, std::string> Tree(const std::string& dir) {
+  std::map<std::string, std::string> tree;
+  for (const auto& entry : std::filesystem::recursive_directory_iterator(dir)) {
+    const std::string path = entry.path().string().substr(dir.size());
+    tree[path] = entry.is_symlink()     ? "<link>"
+                 : entry.is_directory() ? "<dir>"
+                                        : testsupport::ReadFile(entry.path().string());
+  }
+  return tree;
+}
+
+TEST_F(StorageTest, NothingBelowTheShareIsReachedThroughALinkInTheMetadataDirectory) {
+  const std::string metadata = volume + "/photo/@eaDir";
+  const std::string queue = metadata + "/WEZO@file_index_queue";
+  const std::string db = metadata + "/WEZO@.fileindexdb";
+  const std::string folder = volume + "/photo/a";
+  const std::string out = sandbox.Path("/out");
+  const std::string linked = "reason=Too many levels of symbolic links";
+  struct Case {
+    const char* name;
+    std::function<bool()> run;
+    bool result;
+    std::string lastLine;
+  } cases[] = {
+      {"queue writer", [&] { return AddCustomEvent(kEventUpdate, folder + "/x", Json::Value()); },
+       false, "utils:N Failed to open queue=" + queue + ", " + linked},
+      {"database directory",
+       [&] {
+         char buffer[4096];
+         return FILEIDXDBPathGet("photo", buffer, sizeof buffer) == static_cast<int>(db.size());
+       },
+       true, "utils:N mkdir failed, path=" + db + ", " + linked},
+      {"duplicate check", [&] { return IsReindexQueued(folder, queue); }, false,
+       "utils:N Failed to open queue=" + queue + ", " + linked},
+      {"progress", [&] { return QueueHasFolderEvent("/photo/a", queue); }, false,
+       "status_mgr:N Failed to open queue=" + queue + ", " + linked},
+      {"index data removal", [&] { return IndexMgr::CleanShareIndexData("photo"); }, false,
+       "index_mgr:N Failed to remove " + db + ", " + linked},
+  };
+  for (const Case& c : cases) {
+    SCOPED_TRACE(c.name);
+    std::filesystem::remove_all(metadata);
+    std::filesystem::remove_all(out);
+    std::filesystem::create_directories(out);
+    testsupport::WriteFile(out + "/WEZO@file_index_queue",
+                           R"({"event":65536,"path":")" + folder + "\"}\n");
+    testsupport::WriteFile(out + "/WEZO@file_index_queue.tmp", "tmp");
+    std::filesystem::create_symlink(out, metadata);
+    const auto before = Tree(out);
+    log.Clear();
+
+    EXPECT_EQ(c.run(), c.result);
+    EXPECT_EQ(Tree(out), before);
+    ASSERT_FALSE(log.Lines().empty());
+    EXPECT_EQ(log.Lines().back(), c.lastLine);
+  }
+}
+
+TEST_F(StorageTest, RemovingIndexDataTakesWholeTreesAndLinksButNeverWhatALinkPointsTo) {
+  const std::string metadata = volume + "/photo/@eaDir";
+  const std::string db = metadata + "/WEZO@.fileindexdb";
+  const std::string out = sandbox.Path("/out");
+  std::filesystem::create_directories(out);
+  std::filesystem::create_directories(db + "/a");
+  testsupport::WriteFile(out + "/file", "keep");
+  testsupport::WriteFile(metadata + "/WEZO@file_index_queue", "q");
+  std::filesystem::create_symlink(out + "/file", metadata + "/WEZO@file_index_queue.tmp");
+  std::filesystem::create_directory_symlink(out, db + "/a/out");
+  std::string deepest = db;
+  for (int depth = 0; depth < kMaxRemovalDepth; ++depth) {
+    deepest += "/d";
+  }
+  std::filesystem::create_directories(deepest);
+
+  // One level too deep: that tree stays, the other locations go all the same.
+  EXPECT_FALSE(IndexMgr::CleanShareIndexData("photo"));
+  EXPECT_THAT(log.Lines(),
+              ElementsAre("index_mgr:N Failed to remove " + db + ", reason=File name too long"));
+  EXPECT_EQ(Tree(metadata).count("/WEZO@file_index_queue.tmp"), 0U);
+  EXPECT_EQ(Tree(metadata).count("/WEZO@file_index_queue"), 0U);
+
+  std::filesystem::remove(deepest);
+  log.Clear();
+  EXPECT_TRUE(IndexMgr::CleanShareIndexData("photo"));
+  EXPECT_THAT(log.Lines(), IsEmpty());
+  EXPECT_THAT(Tree(metadata), IsEmpty());
+  EXPECT_EQ(Tree(out), (std::map<std::string, std::string>{{"/file", "keep"}}));
+  EXPECT_TRUE(IndexMgr::CleanShareIndexData("photo")) << "nothing left to remove";
 }
 
 }  // namespace

@@ -27,8 +27,11 @@ FILEINDEX_EXPORT int FILEIDXQueuePathGet(const char* szName, char* szOutQueuePat
 
 /* Where the share named szName keeps its index database: writes the database directory's full
  * path ("<share path>/@eaDir/WEZO@.fileindexdb") into szOutDBPath and creates the directory
- * (mode 0777 less the process umask) when it is missing. Results, truncation and failures as
- * FILEIDXQueuePathGet; a directory that cannot be created is logged and does not fail the call. */
+ * with mode 0755, whatever the process umask, when it is missing (an existing one loses any
+ * group or world write bit). A symbolic link in the place of "@eaDir" or of the directory is not
+ * followed: the directory then counts as one that cannot be created. Results, truncation and
+ * failures as FILEIDXQueuePathGet; a directory that cannot be created is logged and does not
+ * fail the call. */
 FILEINDEX_EXPORT int FILEIDXDBPathGet(const char* szName, char* szOutDBPath, int cbOutLen);
 
 /* The questions whether something is indexed. Each reads the folder list afresh and answers 1 or

@@ -136,8 +136,10 @@ class FILEINDEX_EXPORT IndexMgr {
   // worker ("revive_share_worker").
   static bool ShareResume(const std::string& share);
   // Removes the share's event queue, its ".tmp" companion and its index database directory with
-  // the system's rm. What is already missing, or cannot be removed, counts as removed; false
-  // only when the share's storage locations cannot be formed.
+  // everything in it. A symbolic link on the way is never followed; a link in one of their places
+  // is removed itself. What is already missing counts as removed. False when the share's storage
+  // locations cannot be formed, or when a location could not be removed (each such location is
+  // logged, and the others are still removed).
   static bool CleanShareIndexData(const std::string& share);
 
   // Registers the indexed folders of the share `share` with the file-change monitor, replacing

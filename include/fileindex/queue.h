@@ -30,11 +30,13 @@ inline constexpr int kEventUpdate = 131072;  // update what is indexed for "path
 // holds the full path `path`. Writes nothing and returns true when a reindex of exactly `path`
 // is already queued (in the queue or its ".tmp" companion), whatever `event` is: the reindex
 // covers it. Also returns true, with nothing written, when other writers keep the queue locked
-// through three short attempts, and when the line could be written only in part.
-// Returns false when the share or its queue cannot be resolved, the queue cannot be opened or
-// locking fails for another reason; the share (an empty name when `path` lies in no share) is
-// then flagged for a full reindex in the status file, so that the change is not lost. Logs each
-// failure; sets no error code.
+// through three short attempts.
+// Returns false when the share or its queue cannot be resolved, the queue cannot be opened (a
+// symbolic link below the share, or anything but a regular file, is refused), locking fails for
+// another reason, or the line could not be written whole (what was written of it is cut off
+// again); the share (an empty name when `path` lies in no share) is then flagged for a full
+// reindex in the status file, so that the change is not lost. Logs each failure; sets no error
+// code.
 FILEINDEX_EXPORT bool AddCustomEvent(const int& event, const std::string& path,
                                      const Json::Value& data);
 

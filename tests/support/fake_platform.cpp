@@ -212,7 +212,10 @@ int WEZOEAMKDir(int flags, const char* szPath) {
   if (Get().ea_mkdir_fails || szPath == nullptr) {
     return fake::Fail(__LINE__);
   }
-  if (mkdir(szPath, 0755) != 0 && errno != EEXIST) {
+  struct stat st {};
+  // As on the appliance, a symbolic link in the directory's place is not the directory.
+  if ((mkdir(szPath, 0755) != 0 && errno != EEXIST) || lstat(szPath, &st) != 0 ||
+      !S_ISDIR(st.st_mode)) {
     return fake::Fail(__LINE__);
   }
   return 0;

@@ -102,7 +102,7 @@ int WEZOEAIsHiddenDir(const char* szName);
 
 /* Creates the hidden metadata directory szPath (a share's root followed by "/@eaDir") with the
  * platform's ownership and mode; flags is 0. Returns 0 when it exists afterwards (an existing
- * directory is success), negative on failure. */
+ * directory is success), negative on failure; a symbolic link in its place is a failure. */
 int WEZOEAMKDir(int flags, const char* szPath);
 
 /* Non-zero when the volume holding szPath has room for cbNeeded more bytes (flags is 0). Zero
