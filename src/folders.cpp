@@ -251,9 +251,9 @@ Json::Value GetMostSuitableCfg(std::vector<Folder> folders, const std::string& f
   const std::string target = fullPath + "/";
   const Folder* match = nullptr;
   for (const Folder& folder : folders) {
-    const std::string folderPath = folder.GetFullPath();
+    // A folder whose share is gone holds no place; asking it for one would log and set a code.
     // The last match wins: in share-path order that is the deepest folder enclosing the target.
-    if (!folderPath.empty() && StringStartWith(target, folderPath + "/")) {
+    if (folder.HasFullPath() && StringStartWith(target, folder.GetFullPath() + "/")) {
       match = &folder;
     }
   }

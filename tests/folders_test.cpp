@@ -386,12 +386,16 @@ TEST_F(FoldersTest, MostSuitableSettingIsTheLastEnclosingFolder) {
   folders[1].Load("/photo", ParseJson(R"({"name":"outer"})"));
   folders[2].Load("/photo/2019", ParseJson(R"({"name":"inner"})"));
   log.Clear();
+  ErrorHandler::SetError(FILEINDEX_ERR_NONE);
   EXPECT_EQ(GetMostSuitableCfg(folders, volume + "/photo/2019/x")["name"], "inner");
   EXPECT_EQ(GetMostSuitableCfg(folders, volume + "/photo/2019")["name"], "inner");
   EXPECT_EQ(GetMostSuitableCfg(folders, volume + "/photo/20")["name"], "outer");
   EXPECT_EQ(GetMostSuitableCfg(folders, volume + "/photos"), Json::Value(Json::objectValue));
   std::swap(folders[1], folders[2]);
   EXPECT_EQ(GetMostSuitableCfg(folders, volume + "/photo/2019/x")["name"], "outer");
+  // The folder whose share is gone is passed over without a word.
+  EXPECT_THAT(log.Lines(), IsEmpty());
+  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_NONE);
 }
 
 }  // namespace
