@@ -57,9 +57,7 @@ void CheckIndexable(Output& out, const std::string& path) {
   std::string share;
   if (!fi::GetFullPath(fullPath, path)) {
     (void)fi::GetShareNameByPath(share, path);
-    out.Warn("unknown_share", path,
-             shown + ": no share named " + Printable(share) +
-                 "; the folder is listed but not valid, and nothing is indexed");
+    out.Warn("unknown_share", path, shown + ": no share named " + Printable(share));
     return;
   }
   struct stat st {};
@@ -79,7 +77,8 @@ void CheckIndexable(Output& out, const std::string& path) {
 
 // Warns when an event for `path` would concern nothing indexed: the path is in no indexed folder
 // and holds none. A share without any indexed folder is left to the library, which refuses it.
-void CheckEventTarget(Output& out, const std::string& path, const std::vector<fi::Folder>& folders) {
+void CheckEventTarget(Output& out, const std::string& path,
+                      const std::vector<fi::Folder>& folders) {
   std::string share;
   if (!fi::GetShareNameByPath(share, path) || !fi::IndexMgr::IsShareIndexed(share) ||
       fi::IndexMgr::IsPathIndexed(path, folders) ||
@@ -218,8 +217,8 @@ int RunAdd(const Context& ctx, const AddArgs& args) {
   std::vector<Change> changes;
   for (const std::string& path : paths) {
     const bool listed = IsListed(path, before);
-    changes.push_back({listed ? "updated" : "added", path,
-                       (listed ? "updated " : "added ") + Printable(path)});
+    changes.push_back(
+        {listed ? "updated" : "added", path, (listed ? "updated " : "added ") + Printable(path)});
   }
   return RunCall(
       ctx, "add", {"monitor", "service", "daemon", "queue"},
@@ -238,10 +237,10 @@ int RunRemove(const Context& ctx, const std::vector<std::string>& paths) {
       continue;
     }
     const std::string holder = Holder(path, before);
-    ctx.out.Warn("not_listed", path,
-                 Printable(path) + " is not in the list of indexed folders; nothing removed" +
-                     (holder.empty() ? "" : " (it lies in the indexed folder " +
-                                                Printable(holder) + ")"));
+    ctx.out.Warn(
+        "not_listed", path,
+        Printable(path) + " is not in the list of indexed folders; nothing removed" +
+            (holder.empty() ? "" : " (it lies in the indexed folder " + Printable(holder) + ")"));
   }
   if (ctx.out.RefusedByStrict("remove")) {
     return kExitFailed;

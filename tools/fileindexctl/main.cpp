@@ -32,16 +32,14 @@ class Tool {
     } catch (const CLI::ParseError& e) {
       return ParseFailure(e);
     }
-    if (!m_root.empty()) {
-      struct stat st {};
-      if (stat(m_root.c_str(), &st) != 0 || !S_ISDIR(st.st_mode)) {
-        std::cerr << "fileindexctl: --root must name an existing directory: " << Printable(m_root)
-                  << '\n';
-        return kExitUsage;
-      }
-    }
     if (!fi::SetRootPrefix(m_root)) {
       std::cerr << "fileindexctl: --root must be an absolute path: " << Printable(m_root) << '\n';
+      return kExitUsage;
+    }
+    struct stat st {};
+    if (!m_root.empty() && (stat(m_root.c_str(), &st) != 0 || !S_ISDIR(st.st_mode))) {
+      std::cerr << "fileindexctl: --root must name an existing directory: " << Printable(m_root)
+                << '\n';
       return kExitUsage;
     }
     m_ctx.verbose = m_verbose;
@@ -229,8 +227,7 @@ class Tool {
     CLI::App* isIndexed = m_app.add_subcommand(
         "is-indexed", "ask the C interface what is indexed (-q: answer by exit status)");
     isIndexed->require_subcommand(1);
-    isIndexed->add_flag("-q,--quiet", m_quiet,
-                        "print nothing; exit 0 when indexed, 1 when not");
+    isIndexed->add_flag("-q,--quiet", m_quiet, "print nothing; exit 0 when indexed, 1 when not");
     for (const auto& [name, argument] : {
              std::pair{"path", "share path (/photo/2019)"},
              std::pair{"full-path", "full path (/volume1/photo/2019)"},

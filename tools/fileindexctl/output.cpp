@@ -86,10 +86,18 @@ std::string Printable(const std::string& text) {
       continue;
     }
     switch (codePoint) {
-      case '\n': shown += "\\n"; break;
-      case '\t': shown += "\\t"; break;
-      case '\r': shown += "\\r"; break;
-      case '\\': shown += "\\\\"; break;
+      case '\n':
+        shown += "\\n";
+        break;
+      case '\t':
+        shown += "\\t";
+        break;
+      case '\r':
+        shown += "\\r";
+        break;
+      case '\\':
+        shown += "\\\\";
+        break;
       default:
         // C1 controls (U+0080 to U+009F) steer some terminals as ESC sequences do.
         if (codePoint < 0x20 || codePoint == 0x7F) {
@@ -156,8 +164,7 @@ Json::Value ChangesJson(const std::vector<Change>& changes) {
 
 }  // namespace
 
-void Output::Warn(const std::string& key, const std::string& subject,
-                  const std::string& message) {
+void Output::Warn(const std::string& key, const std::string& subject, const std::string& message) {
   std::cerr << "fileindexctl: warning: " << message << '\n';
   Json::Value warning(Json::objectValue);
   warning["warning"] = key;
@@ -216,7 +223,8 @@ int Output::Fail(const std::string& what, const std::string& detail,
       std::cerr << "fileindexctl: saved all the same: " << change.text << '\n';
     }
     if (!aftermath->failedStep.empty()) {
-      std::cerr << "fileindexctl: the step that failed: " << Printable(aftermath->failedStep) << '\n';
+      std::cerr << "fileindexctl: the step that failed: " << Printable(aftermath->failedStep)
+                << '\n';
     }
     for (const std::string& step : aftermath->notDone) {
       std::cerr << "fileindexctl: not done: " << Printable(step) << '\n';
@@ -230,7 +238,8 @@ int Output::Fail(const std::string& what, const std::string& detail,
   }
   if (m_json) {
     Json::Value result(Json::objectValue);
-    result["changes"] = ChangesJson(aftermath != nullptr ? aftermath->saved : std::vector<Change>());
+    result["changes"] =
+        ChangesJson(aftermath != nullptr ? aftermath->saved : std::vector<Change>());
     result["warnings"] = m_warnings;
     Json::Value& error = result["error"];
     error["code"] = code;

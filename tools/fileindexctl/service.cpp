@@ -62,9 +62,9 @@ int RunStatus(const Context& ctx, const std::vector<std::string>& paths) {
   }
   for (const std::string& path : paths) {
     if (!IsListed(path, folders)) {
-      ctx.out.Warn("not_listed", path,
-                   Printable(path) +
-                       " is not in the list of indexed folders; its status says nothing");
+      ctx.out.Warn(
+          "not_listed", path,
+          Printable(path) + " is not in the list of indexed folders; its status says nothing");
     }
   }
   if (ctx.out.RefusedByStrict("status")) {
@@ -141,7 +141,9 @@ int RunResume(const Context& ctx) {
 int RunMigrate(const Context& ctx) {
   return RunCall(
       ctx, "migrate", {}, [] { return fi::Updater_hxo60_beta2(); },
-      [] { return std::vector<Change>{{"migrated", "configuration", "migration done"}}; });
+      [] {
+        return std::vector<Change>{{"migrated", "configuration", "migration done"}};
+      });
 }
 
 }  // namespace fileindexctl

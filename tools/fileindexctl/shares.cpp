@@ -104,7 +104,9 @@ int RunShareOperation(const Context& ctx, const std::string& operation, const st
     }
     return RunCall(
         ctx, what, entry.steps, [&] { return entry.call(share); },
-        [&] { return std::vector<Change>{{entry.action, share, shown + ": " + entry.done}}; });
+        [&] {
+          return std::vector<Change>{{entry.action, share, shown + ": " + entry.done}};
+        });
   }
   return ctx.out.Fail(what, "no such share operation");
 }
@@ -118,8 +120,9 @@ int RunShareRename(const Context& ctx, const std::string& oldShare, const std::s
   }
   // The old name has usually left the share database already; the new one should be in it.
   if (paths.empty()) {
-    ctx.out.Warn("no_folders", oldShare,
-                 "no folder of the share " + Printable(oldShare) + " is in the list; nothing moved");
+    ctx.out.Warn(
+        "no_folders", oldShare,
+        "no folder of the share " + Printable(oldShare) + " is in the list; nothing moved");
   }
   CheckShare(ctx.out, newShare);
   if (ctx.out.RefusedByStrict("share rename")) {
