@@ -242,7 +242,7 @@ TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
       {{"is-indexed", "-q", "path", "/photo/2019/a.jpg"}, 0, "", ""},
       {{"is-indexed", "--quiet", "share", "music"}, 1, "", ""},
       // Paths and names are shown escaped, and JSON stays valid UTF-8.
-      {{"get", "/photo/a\nb\x1b[2J\\"}, 1, "get /photo/a\\nb\\x1b[2J\\\\ failed", ""},
+      {{"get", "/photo/a\nb\x1b[2J\\"}, 1, R"(get /photo/a\nb\x1b[2J\\ failed)", ""},
       {{"--json", "share", "no-space", "ph\xff"},
        0,
        "no share named ph\\xff",

@@ -71,7 +71,7 @@ void CheckIndexable(Output& out, const std::string& path) {
   if (rule != fi::IndexRule::kIndexable) {
     out.Warn("not_indexable", path,
              shown + " cannot be indexed: " + fi::DescribeIndexRule(rule) + " (" +
-                 fi::IndexRuleKey(rule) + "); the folder is listed, but nothing is indexed");
+                 fi::IndexRuleKey(rule) + "); listing it indexes nothing");
   }
 }
 
@@ -87,8 +87,8 @@ void CheckEventTarget(Output& out, const std::string& path,
   }
   out.Warn("not_indexed", path,
            Printable(path) +
-               " is in no indexed folder and holds none; the event is queued, but the daemon "
-               "indexes nothing there");
+               " is in no indexed folder and holds none; an event for it makes the daemon index "
+               "nothing");
 }
 
 }  // namespace

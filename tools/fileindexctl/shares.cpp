@@ -88,6 +88,7 @@ int RunShareOperation(const Context& ctx, const std::string& operation, const st
       return kExitFailed;
     }
     std::vector<Change> changes;
+    changes.reserve(paths.size());
     for (const std::string& path : paths) {
       changes.push_back({"removed", path, "removed " + Printable(path)});
     }
