@@ -382,7 +382,7 @@ TEST_F(FileindexctlTest, ChangeCommandsPrintWhatChangedAsJson) {
   }
 }
 
-TEST_F(FileindexctlTest, ADaemonThatIsDownIsNamedWithWhatWasSavedAndHowToFinish) {
+TEST_F(FileindexctlTest, AStepThatFailsAfterTheSaveIsNamedWithWhatWasSavedAndHowToFinish) {
   EXPECT_NE(Run({"status"}).out.find("service fileindexd.service: inactive"), std::string::npos);
   AddFolders();
   const Result up = Run({"status", "/photo/2019"});
@@ -421,6 +421,19 @@ TEST_F(FileindexctlTest, ADaemonThatIsDownIsNamedWithWhatWasSavedAndHowToFinish)
   EXPECT_NE(
       WaitFor(At("daemon.log"), "upsert_folder_setting", seen).find("upsert_folder_setting", seen),
       std::string::npos);
+
+  // A service that does not start: named, and nothing after it claimed.
+  Write("usr/bin/systemctl",
+        "#!/bin/sh\n[ \"$1\" = is-active ] && echo failed\necho failing >&2\nexit 3\n", 0755);
+  const Result unstarted = Run({"add", "/video/movies", "--video"});
+  EXPECT_EQ(unstarted.status, 1);
+  for (const char* text :
+       {"saved all the same: updated /video/movies",
+        "the step that failed: starting the service fileindexd", "WLIBServiceStart failed",
+        "not done: telling the daemon", "service fileindexd.service: failed",
+        "start the service (systemctl start fileindexd.service)", "failing\n"}) {
+    EXPECT_NE(unstarted.err.find(text), std::string::npos) << text << " in:\n" << unstarted.err;
+  }
 }
 
 TEST_F(FileindexctlTest, OperationsReachTheDaemonServicesAndFiles) {

@@ -100,7 +100,6 @@ class Tool {
     m_app.description(
         "Administer the file-index service: indexed folders, pausing, share flags and "
         "questions.");
-    m_app.footer(kFooter);
     m_app.require_subcommand(1);
     // Subcommands pass the options they do not know to the tool, so --json may follow them.
     m_app.fallthrough();
@@ -119,6 +118,8 @@ class Tool {
     BuildServiceCommands();
     BuildShareCommands();
     BuildQuestions();
+    // Set last, so that the subcommands' help does not repeat it.
+    m_app.footer(kFooter);
   }
 
   void BuildFolderCommands() {
