@@ -212,9 +212,15 @@ int Output::Fail(const std::string& what, const std::string& detail,
   if (code != fi::FILEINDEX_ERR_NONE) {
     description = fi::ErrorHandler::Describe(code);
   } else if (description.empty()) {
-    description = aftermath != nullptr && !aftermath->failedLine.empty()
-                      ? "no code recorded; the library logged: " + aftermath->failedLine
-                      : "no code recorded; -v shows the library's log";
+    // Without a known step, the library's last line is still the best account of the failure.
+    std::string line;
+    if (aftermath != nullptr) {
+      line = !aftermath->failedLine.empty() ? aftermath->failedLine
+             : !aftermath->logLines.empty() ? aftermath->logLines.back()
+                                            : "";
+    }
+    description = line.empty() ? "no code recorded; -v shows the library's log"
+                               : "no code recorded; the library logged: " + line;
   }
   std::cerr << "fileindexctl: " << Printable(what) << " failed: error " << code << " ("
             << Printable(description) << ")\n";
