@@ -55,14 +55,16 @@ step() {
   printf '\n=== %s. %s ===\n' "$step_no" "$1"
 }
 
-# Runs fileindexctl with the sandbox root, showing the command and its output.
+# Runs fileindexctl with the sandbox root, showing the command and its output (stderr too). It
+# must exit with $expect_status, 0 unless set for the call (expect_status=1 ctl ...).
 ctl() {
-  local shown="" arg out
+  local shown="" arg out status want=${expect_status:-0}
   for arg in "$@"; do
     if [[ $arg =~ ^[][A-Za-z0-9_./@:=,+-]+$ ]]; then shown+=" $arg"; else shown+=" '$arg'"; fi
   done
   printf '$ fileindexctl%s\n' "$shown" | short
-  out=$("$ctl_bin" --root "$root" "$@" 2>&1) || fail "fileindexctl $* exited with $?: $out"
+  out=$("$ctl_bin" --root "$root" "$@" 2>&1) && status=0 || status=$?
+  [ "$status" -eq "$want" ] || fail "fileindexctl $* exited with $status, not $want: $out"
   if [ -n "$out" ]; then printf '%s\n' "$out" | indent; fi
   last_output=$out
 }
@@ -215,7 +217,13 @@ touch -d '-5 seconds' "$root/etc/samba/smb.conf"
 
 cat >"$root/usr/bin/systemctl" <<EOF
 #!/bin/sh
-# Stand-in service manager: records the call and keeps each unit's state in a file.
+# Stand-in service manager: records each change and keeps each unit's state in a file.
+if [ "\$1" = is-active ]; then
+  state=\$(cat "$demo/units/\$2" 2>/dev/null || echo inactive)
+  echo "\$state"
+  [ "\$state" = active ]
+  exit
+fi
 echo "systemctl \$*" >>"$demo/services.log"
 case "\$1" in
   start | restart) echo active >"$demo/units/\$2" ;;
@@ -230,9 +238,12 @@ echo "\$*" >>"$demo/notify.log"
 EOF
 chmod +x "$root/usr/bin/systemctl" "$root/usr/wezo/bin/wezohxonotify"
 
-"$daemon_bin" --socket "$root/var/run/fileindexd.sock" --log "$daemon_log" &
-daemon_pid=$!
-expect_daemon "listening on"
+start_daemon() {
+  "$daemon_bin" --socket "$root/var/run/fileindexd.sock" --log "$daemon_log" &
+  daemon_pid=$!
+  expect_daemon "listening on"
+}
+start_daemon
 changes >/dev/null  # what the walkthrough shows is measured from here
 echo "Shares photo, video, music, archive (read-only) and surveillance; daemon pid $daemon_pid."
 
@@ -287,6 +298,34 @@ expect_daemon "pause {\"resume_time\":$resume_time}"
 ctl resume
 expect_daemon 'resume {}'
 expect_output status -- "paused: no"
+changes
+
+step "The daemon goes away: status says so; a change says what was saved and how to finish"
+kill -TERM "$daemon_pid"
+wait "$daemon_pid" || true
+daemon_pid=""
+expect_output status -- "daemon: does not answer on $root/var/run/fileindexd.sock" \
+  "service fileindexd.service: active"
+expect_status=1 expect_output pause 1 -- "saved all the same: paused until" \
+  "the step that failed: telling the daemon" "SendCammandToDaemon failed" "to finish:"
+start_daemon
+ctl resume
+expect_daemon 'resume {}'
+expect_output status -- "daemon: answers" "paused: no"
+changes
+
+step "What the library would accept but not act on: the tool warns, and --strict refuses"
+expect_output remove /photo/2019/trip -- "warning: /photo/2019/trip is not in the list" \
+  "(it lies in the indexed folder /photo/2019)"
+expect_output add /photo/2021 --photo -- "warning: /photo/2021: the directory" "does not exist"
+ctl remove /photo/2021
+expect_status=1 expect_output --strict add /archive/2018 --photo -- \
+  "cannot be indexed: the share is read-only (read_only_share)" "not run: --strict"
+expect_output share no-space nosuch -- "warning: no share named nosuch"
+printf '$ fileindexctl is-indexed -q path /photo/2019/a.jpg && echo yes\n'
+if "$ctl_bin" --root "$root" is-indexed -q path /photo/2019/a.jpg; then echo "    yes"; else
+  fail "is-indexed -q: expected exit status 0"
+fi
 changes
 
 step "A share runs out of room: the administrators are told once; reviving clears it"

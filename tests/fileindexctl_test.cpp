@@ -67,10 +67,11 @@ Json::Value Parse(const std::string& text) {
   return value;
 }
 
-// Waits up to five seconds for `text` to appear in the file at `path`; returns the file.
-std::string WaitFor(const std::string& path, const std::string& text) {
+// Waits up to five seconds for `text` to appear in the file at `path` at or after the byte
+// `from`; returns the file.
+std::string WaitFor(const std::string& path, const std::string& text, size_t from = 0) {
   std::string content = Slurp(path);
-  for (int i = 0; i < 500 && content.find(text) == std::string::npos; ++i) {
+  for (int i = 0; i < 500 && content.find(text, from) == std::string::npos; ++i) {
     std::this_thread::sleep_for(std::chrono::milliseconds(10));
     content = Slurp(path);
   }
@@ -89,24 +90,37 @@ class FileindexctlTest : public SandboxTest {
     root_ = fs::canonical(root_).string();
     ASSERT_TRUE(fi::SetRootPrefix(root_));
     for (const char* folder : {"tmp", "var/run", "usr/wezo/etc/fileindex", "volume1/photo/2019",
-                               "volume1/video/movies"}) {
+                               "volume1/video/movies", "volume1/archive/2018"}) {
       fs::create_directories(At(folder));
     }
     Write("etc/samba/smb.conf",
           "[global]\n\tspotlight = no\n[photo]\n\tpath = " + At("volume1/photo") +
               "\n\tread only = no\n[video]\n\tpath = " + At("volume1/video") +
-              "\n\tread only = no\n");
-    Write("usr/bin/systemctl", "#!/bin/sh\necho \"$@\" >> " + At("services.log") + "\n", 0755);
+              "\n\tread only = no\n[archive]\n\tpath = " + At("volume1/archive") +
+              "\n\tread only = yes\n");
+    // The service manager: logs each change and keeps the unit's state for is-active.
+    Write("usr/bin/systemctl",
+          "#!/bin/sh\ncase \"$1\" in\n"
+          "is-active) s=$(cat " +
+              At("unit.state") +
+              " 2>/dev/null || echo inactive); echo $s; "
+              "[ \"$s\" = active ]; exit;;\n"
+              "start) echo active > " +
+              At("unit.state") +
+              ";;\n"
+              "stop) echo inactive > " +
+              At("unit.state") +
+              ";;\nesac\n"
+              "echo \"$@\" >> " +
+              At("services.log") + "\n",
+          0755);
     Write("usr/wezo/bin/wezohxonotify", "#!/bin/sh\necho \"$@\" >> " + At("notify.log") + "\n",
           0755);
     StartDaemon();
   }
 
   void TearDown() override {
-    if (m_daemon > 0) {
-      kill(m_daemon, SIGTERM);
-      waitpid(m_daemon, nullptr, 0);
-    }
+    StopDaemon();
     SandboxTest::TearDown();
   }
 
@@ -115,9 +129,18 @@ class FileindexctlTest : public SandboxTest {
     const std::string log = At("daemon.log");
     std::vector<std::string> args = {FILEINDEXD_STANDIN, "--socket", socket, "--log", log};
     std::vector<char*> argv = Argv(args);
+    const size_t seen = Slurp(log).size();
     ASSERT_EQ(posix_spawn(&m_daemon, argv[0], nullptr, nullptr, argv.data(), environ), 0);
-    ASSERT_NE(WaitFor(log, "listening on").find("listening on"), std::string::npos)
+    ASSERT_NE(WaitFor(log, "listening on", seen).find("listening on", seen), std::string::npos)
         << "the stand-in daemon did not start";
+  }
+
+  void StopDaemon() {
+    if (m_daemon > 0) {
+      kill(m_daemon, SIGTERM);
+      waitpid(m_daemon, nullptr, 0);
+      m_daemon = -1;
+    }
   }
 
   // Runs the tool with `--root <sandbox>` and `args`, collecting its output and exit status.
@@ -169,59 +192,98 @@ class FileindexctlTest : public SandboxTest {
   pid_t m_daemon = -1;
 };
 
-TEST_F(FileindexctlTest, ExitStatusTellsSuccessFailureAndUsage) {
+std::string Joined(const std::vector<std::string>& args) {
+  std::string line;
+  for (const std::string& arg : args) {
+    line += " " + arg;
+  }
+  return line;
+}
+
+TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
   AddFolders();
+  const std::string deep = std::string(2000, '[') + std::string(2000, ']');
   struct Case {
     std::vector<std::string> args;
     int status;
-    std::string err;  // expected in stderr
+    std::string err;  // expected in stderr; a case expecting "" wants stderr empty
+    std::string out;  // expected in stdout
   };
   const std::vector<Case> cases = {
-      {{"list"}, 0, ""},
-      {{"get", "/photo/2019"}, 0, ""},
-      {{"share", "no-space", "photo"}, 0, ""},
+      {{"list"}, 0, "", "2 of 2"},
+      {{"share", "no-space", "photo"}, 0, "", "no-space: no"},
+      {{"--version"}, 0, "", "fileindexctl 0."},
       // The library refuses: its code and the code's meaning.
-      {{"get", "/photo/none"}, 1, "get /photo/none failed: error 4 (no such indexed folder)"},
-      {{"add", "--request", "{}"}, 1, "add failed: error 1 (bad parameter)"},
-      {{"add", "/photo/../etc", "--photo"}, 1, "add failed: error 1 (bad parameter)"},
+      {{"get", "/photo/none"}, 1, "get /photo/none failed: error 4 (no such indexed folder)", ""},
+      {{"add", "--request", "{}"}, 1, "add failed: error 1 (bad parameter)", ""},
+      {{"add", "/photo/../etc", "--photo"}, 1, "add failed: error 1 (bad parameter)", ""},
       {{"reindex", "/music"},
        1,
-       "reindex failed: error 0 (a path lies in a share without indexed folders)"},
-      {{"storage", "music"}, 1, "storage music failed: error 0 (no share named music)"},
-      {{"pause", "99999999"}, 1, "pause failed: error 1 (bad parameter)"},
+       "reindex failed: error 0 (a path lies in a share without indexed folders)",
+       ""},
+      {{"storage", "music"}, 1, "storage music failed: error 0 (no share named music)", ""},
+      {{"pause", "99999999"}, 1, "pause failed: error 1 (bad parameter)", ""},
+      // Accepted by the library, but not what the user expects: a warning, or a refusal under
+      // --strict before the library is called.
+      {{"remove", "/photo/none"}, 0, "warning: /photo/none is not in the list", ""},
+      {{"remove", "/photo/2019/x"}, 0, "(it lies in the indexed folder /photo/2019)", ""},
+      {{"--strict", "remove", "/photo/none"}, 1, "remove: not run: --strict and 1 warning(s)", ""},
+      {{"reindex", "/photo/2020"}, 0, "/photo/2020 is in no indexed folder and holds none", ""},
+      {{"status", "/nosuch"}, 0, "/nosuch is not in the list", ""},
+      {{"share", "rename", "nosuch", "other"}, 0, "share nosuch is in the list; nothing moved", ""},
+      {{"share", "remove", "nosuch"}, 0, "share nosuch is in the list; nothing dropped", ""},
+      {{"share", "no-space", "nosuch", "on"}, 0, "warning: no share named nosuch", ""},
+      {{"--strict", "share", "pause", "nosuch"}, 1, "not run: --strict", ""},
+      {{"--strict", "add", "/archive/2018", "--photo"}, 1, "(read_only_share)", ""},
+      {{"add", "/archive/2018", "--photo"}, 0, "the share is read-only (read_only_share)", ""},
+      {{"add", "/photo/missingdir"}, 0, "photo/missingdir does not exist", "added /photo/"},
+      {{"add", "/music/x"}, 1, "warning: /music/x: no share named music", ""},
+      // Questions answered by exit status.
+      {{"is-indexed", "-q", "path", "/photo/2019/a.jpg"}, 0, "", ""},
+      {{"is-indexed", "--quiet", "share", "music"}, 1, "", ""},
+      // Paths and names are shown escaped, and JSON stays valid UTF-8.
+      {{"get", "/photo/a\nb\x1b[2J\\"}, 1, R"(get /photo/a\nb\x1b[2J\\ failed)", ""},
+      {{"--json", "share", "no-space", "ph\xff"},
+       0,
+       "no share named ph\\xff",
+       "\"share\" : \"ph\xEF\xBF\xBD\""},
       // Usage errors never reach the library.
-      {{}, 2, "A subcommand is required"},
-      {{"frobnicate"}, 2, "A subcommand is required"},
-      {{"list", "--sort-by", "size"}, 2, "--sort-by"},
-      {{"list", "--additional", "status,colour"}, 2, "--additional"},
-      {{"pause", "two"}, 2, "HOURS"},
-      {{"add"}, 2, "give a share path or --request"},
-      {{"add", "--request", "[{"}, 2, "--request: not JSON"},
-      {{"add", "/photo/x", "--request", "[]"}, 2, "excludes"},
-      {{"add", "--photo"}, 2, "requires PATH"},
-      {{"update", "/photo/2019", "--data", "nope"}, 2, "--data: not JSON"},
-      {{"share", "rename", "photo"}, 2, "NEW is required"},
-      {{"share", "no-space", "photo", "maybe"}, 2, "VALUE"},
-      {{"is-indexed"}, 2, "A subcommand is required"},
+      {{}, 2, "A subcommand is required", ""},
+      {{"frobnicate"}, 2, "unknown command \"frobnicate\"", ""},
+      {{"share", "frob", "x"}, 2, "unknown command \"share frob\"", ""},
+      {{"list", "--sort-by", "size"}, 2, "--sort-by", ""},
+      {{"list", "--additional", "status,colour"}, 2, "--additional", ""},
+      {{"pause", "two"}, 2, "HOURS", ""},
+      {{"add"}, 2, "give a share path or --request", ""},
+      {{"add", "--request", "[{"}, 2, "--request: not JSON", ""},
+      {{"add", "--request", deep}, 2, "--request: JSON nested deeper than", ""},
+      {{"update", "/photo/2019", "--data", deep}, 2, "--data: JSON nested deeper than", ""},
+      {{"add", "/photo/x", "--request", "[]"}, 2, "excludes", ""},
+      {{"add", "--photo"}, 2, "requires PATH", ""},
+      {{"update", "/photo/2019", "--data", "nope"}, 2, "--data: not JSON", ""},
+      {{"share", "rename", "photo"}, 2, "NEW is required", ""},
+      {{"share", "no-space", "photo", "maybe"}, 2, "VALUE", ""},
+      {{"is-indexed"}, 2, "A subcommand is required", ""},
+      {{"--root", "relative/dir", "list"}, 2, "--root must be an absolute path", ""},
+      {{"--root", "/nonexistent/fileindexctl-root", "list"}, 2, "an existing directory", ""},
+      {{"--root", At("etc/samba/smb.conf"), "list"}, 2, "must name an existing directory", ""},
   };
   for (const Case& c : cases) {
-    std::string line;
-    for (const std::string& arg : c.args) {
-      line += " " + arg;
+    const Result result = Run(c.args, c.args.empty() || c.args[0] != "--root");
+    EXPECT_EQ(result.status, c.status) << Joined(c.args) << "\n" << result.err;
+    EXPECT_NE(result.err.find(c.err), std::string::npos)
+        << Joined(c.args) << "\nstderr: " << result.err;
+    EXPECT_NE(result.out.find(c.out), std::string::npos)
+        << Joined(c.args) << "\nstdout: " << result.out;
+    if (c.err.empty()) {
+      EXPECT_EQ(result.err, "") << Joined(c.args);
     }
-    const Result result = Run(c.args);
-    EXPECT_EQ(result.status, c.status) << line << "\n" << result.err;
-    EXPECT_NE(result.err.find(c.err), std::string::npos) << line << "\nstderr: " << result.err;
-    if (c.status == 0) {
-      EXPECT_EQ(result.err, "") << line;
+    if (c.status != 0) {
+      EXPECT_EQ(result.out, "") << Joined(c.args);
     }
   }
-  const Result relative = Run({"--root", "relative/dir", "list"}, false);
-  EXPECT_EQ(relative.status, 2);
-  EXPECT_NE(relative.err.find("--root must be an absolute path"), std::string::npos);
-
-  // Usage errors changed nothing.
-  EXPECT_EQ(RunJson({"list"})["total"], 2);
+  // Only the two adds that warned without --strict changed the list.
+  EXPECT_EQ(RunJson({"list"})["total"], 4);
 }
 
 TEST_F(FileindexctlTest, HelpOnEveryLevel) {
@@ -251,8 +313,11 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResult) {
   for (const Case& c : {
            Case{{"list"}, 0, ULONG_MAX, "path", "ASC"},
            Case{{"list", "--sort-by", "name", "--desc"}, 0, ULONG_MAX, "name", "DESC"},
-           Case{{"list", "--limit", "1"}, 0, 1, "path", "ASC"},
-           Case{{"list", "--offset", "1", "--sort-by", "video"}, 1, ULONG_MAX, "video", "ASC"},
+           Case{{"list", "--offset", "1", "--limit", "1", "--sort-by", "video"},
+                1,
+                1,
+                "video",
+                "ASC"},
        }) {
     std::vector<std::string> args = c.args;
     args.insert(args.end(), {"--additional", "status,is_valid"});
@@ -263,8 +328,6 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResult) {
 
   Json::Value folder;
   ASSERT_TRUE(fi::IndexMgr::Get(folder, "/video/movies"));
-  EXPECT_EQ(RunJson({"get", "/video/movies"}), ReadBack(folder));
-
   // --json may follow the subcommand as well.
   EXPECT_EQ(Parse(Run({"get", "/video/movies", "--json"}).out), ReadBack(folder));
 
@@ -278,30 +341,107 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResult) {
   EXPECT_EQ(shown["status"], status);
   EXPECT_EQ(shown["resume_time"].asInt64(), resumeTime);
   EXPECT_EQ(shown["folders"]["/photo/2019"], fi::StatusMgr::GetFolderStatus("/photo/2019"));
+  EXPECT_EQ(shown["daemon"]["answers"], true);
+  EXPECT_EQ(shown["service"]["state"], "active");
 
   const Result failed = Run({"--json", "get", "/photo/none"});
   EXPECT_EQ(failed.status, 1);
   EXPECT_EQ(Parse(failed.out)["error"]["code"], fi::FILEINDEX_ERR_NO_SUCH_FOLDER);
 }
 
-TEST_F(FileindexctlTest, OperationsReachTheDaemonServicesAndFiles) {
+// The documented shape of what each change command did.
+TEST_F(FileindexctlTest, ChangeCommandsPrintWhatChangedAsJson) {
   AddFolders();
-  EXPECT_EQ(Run({"list", "--additional", "status", "-a", "is_valid"}).out,
-            "PATH           NAME    KINDS           STATUS      VALID\n"
-            "/photo/2019    Summer  photo           processing  yes\n"
-            "/video/movies          document,video  processing  yes\n"
-            "2 of 2 folder(s)\n");
-  EXPECT_EQ(Run({"is-indexed", "path", "/photo/2019/a.jpg"}).out,
-            "FILEIDXIsPathIndexed(\"/photo/2019/a.jpg\") = 1  (indexed)\n");
-  EXPECT_EQ(Run({"is-indexed", "full-path", At("volume1/photo/2020")}).out,
-            "FILEIDXIsFullPathIndexed(\"" + At("volume1/photo/2020") + "\") = 0  (not indexed)\n");
-  EXPECT_EQ(RunJson({"is-indexed", "share", "video"})["indexed"], true);
+  struct Case {
+    std::vector<std::string> args;
+    const char* changes;
+  };
+  for (const Case& c : {
+           Case{{"add", "/photo/2019", "--photo"},
+                R"([{"action": "updated", "target": "/photo/2019"}])"},
+           Case{{"pause", "0"},
+                R"([{"action": "paused", "target": "indexing", "resume_time": 0}])"},
+           Case{{"resume"}, R"([{"action": "resumed", "target": "indexing"}])"},
+           Case{{"reindex", "/photo"}, R"([{"action": "reindex_queued", "target": "/photo"}])"},
+           Case{{"share", "need-reindex", "video", "on"},
+                R"([{"action": "flag_set", "target": "video", "flag": "need_reindex"}])"},
+           Case{{"share", "rename", "video", "archive"},
+                R"([{"action": "moved", "target": "/video/movies", "to": "/archive/movies"}])"},
+           Case{{"remove", "/archive/movies", "/photo/none"},
+                R"([{"action": "removed", "target": "/archive/movies"}])"},
+       }) {
+    const Json::Value shown = RunJson(c.args);
+    EXPECT_EQ(shown["changes"], Parse(c.changes)) << Joined(c.args);
+    EXPECT_EQ(shown["warnings"].size(), c.args[0] == "remove" ? 1U : 0U) << Joined(c.args);
+  }
+}
 
-  EXPECT_EQ(Run({"share", "no-space", "photo", "on"}).status, 0);
-  EXPECT_EQ(Run({"share", "no-space", "photo", "on"}).status, 0);
-  EXPECT_EQ(RunJson({"share", "no-space", "photo"})["no_space"], true);
-  EXPECT_EQ(Read("notify.log").size(), Read("notify.log").find('\n') + 1)
-      << "the notification runs once per transition";
+TEST_F(FileindexctlTest, AStepThatFailsAfterTheSaveIsNamedWithWhatWasSavedAndHowToFinish) {
+  EXPECT_NE(Run({"status"}).out.find("service fileindexd.service: inactive"), std::string::npos);
+  AddFolders();
+  const Result up = Run({"status", "/photo/2019"});
+  EXPECT_NE(up.out.find("indexing: processing\n"), std::string::npos) << up.out;
+  EXPECT_NE(up.out.find("daemon: answers on " + At("var/run/fileindexd.sock")), std::string::npos);
+  EXPECT_NE(up.out.find("service fileindexd.service: active"), std::string::npos);
+
+  StopDaemon();
+  const Result added = Run({"add", "/photo/2019", "--name", "Again", "--photo"});
+  EXPECT_EQ(added.status, 1);
+  for (const char* text :
+       {"add failed: error 0 (no code recorded; the library logged: index_mgr:",
+        "saved all the same: updated /photo/2019", "the step that failed: telling the daemon",
+        "SendCammandToDaemon failed", "not done: queueing the update events",
+        "the daemon does not answer on", "run the same command again"}) {
+    EXPECT_NE(added.err.find(text), std::string::npos) << text << " in:\n" << added.err;
+  }
+  Json::Value folder;
+  ASSERT_TRUE(fi::IndexMgr::Get(folder, "/photo/2019"));
+  EXPECT_EQ(folder["name"], "Again");
+
+  const Result down = Run({"status", "/photo/2019"});
+  EXPECT_EQ(down.out.find("processing"), std::string::npos) << down.out;
+  EXPECT_NE(down.out.find("indexing: stalled"), std::string::npos) << down.out;
+  EXPECT_NE(down.out.find("/photo/2019: stalled"), std::string::npos) << down.out;
+
+  const Result paused = Run({"--json", "pause", "0"});
+  EXPECT_EQ(paused.status, 1);
+  const Json::Value report = Parse(paused.out);
+  EXPECT_EQ(report["changes"][0]["action"], "paused");
+  EXPECT_NE(report["error"]["step"].asString().find("telling the daemon"), std::string::npos);
+
+  StartDaemon();
+  const size_t seen = Read("daemon.log").size();
+  EXPECT_EQ(Run({"add", "/photo/2019", "--name", "Again", "--photo"}).status, 0);
+  EXPECT_NE(
+      WaitFor(At("daemon.log"), "upsert_folder_setting", seen).find("upsert_folder_setting", seen),
+      std::string::npos);
+
+  // A service that does not start: named, and nothing after it claimed.
+  Write("usr/bin/systemctl",
+        "#!/bin/sh\n[ \"$1\" = is-active ] && echo failed\necho failing >&2\nexit 3\n", 0755);
+  const Result unstarted = Run({"add", "/video/movies", "--video"});
+  EXPECT_EQ(unstarted.status, 1);
+  for (const char* text :
+       {"saved all the same: updated /video/movies",
+        "the step that failed: starting the service fileindexd", "WLIBServiceStart failed",
+        "not done: telling the daemon", "service fileindexd.service: failed",
+        "start the service (systemctl start fileindexd.service)", "failing\n"}) {
+    EXPECT_NE(unstarted.err.find(text), std::string::npos) << text << " in:\n" << unstarted.err;
+  }
+}
+
+TEST_F(FileindexctlTest, OperationsReachTheDaemonServicesAndFiles) {
+  const Result added = Run({"add", "--request",
+                            R"([{"path": "/photo/2019", "name": "Été", "photo": true},
+                 {"path": "/video/movies", "video": true, "document": true}])"});
+  ASSERT_EQ(added.status, 0) << added.err;
+  EXPECT_EQ(added.out, "added /photo/2019\nadded /video/movies\n");
+  // Columns count characters, not bytes.
+  EXPECT_EQ(Run({"list", "--additional", "status", "-a", "is_valid"}).out,
+            "PATH           NAME  KINDS           STATUS      VALID\n"
+            "/photo/2019    Été   photo           processing  yes\n"
+            "/video/movies        document,video  processing  yes\n"
+            "2 of 2 folder(s)\n");
 
   ASSERT_EQ(Run({"remove", "/photo/2019", "/video/movies"}).status, 0);
   EXPECT_EQ(Read("services.log"),
