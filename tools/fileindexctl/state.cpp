@@ -2,6 +2,8 @@
 
 #include <fcntl.h>
 #include <fileindex/root.h>
+#include <poll.h>
+#include <signal.h>
 #include <spawn.h>
 #include <sys/mman.h>
 #include <sys/socket.h>
@@ -12,6 +14,7 @@
 
 #include <array>
 #include <cerrno>
+#include <chrono>
 #include <cstring>
 #include <utility>
 
@@ -48,6 +51,32 @@ std::string ReadAll(int fd) {
     }
     if (got <= 0) {
       return text;
+    }
+    text.append(buffer, static_cast<size_t>(got));
+  }
+}
+
+// Reads `fd` to its end into `text`, for at most `milliseconds`; false when time ran out first.
+bool ReadWithin(int fd, int milliseconds, std::string& text) {
+  const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(milliseconds);
+  char buffer[4096];
+  for (;;) {
+    const auto left = std::chrono::duration_cast<std::chrono::milliseconds>(
+        deadline - std::chrono::steady_clock::now());
+    pollfd ready{fd, POLLIN, 0};
+    const int polled = left.count() > 0 ? poll(&ready, 1, static_cast<int>(left.count())) : 0;
+    if (polled < 0 && errno == EINTR) {
+      continue;
+    }
+    if (polled <= 0) {
+      return false;
+    }
+    const ssize_t got = read(fd, buffer, sizeof buffer);
+    if (got < 0 && errno == EINTR) {
+      continue;
+    }
+    if (got <= 0) {
+      return true;
     }
     text.append(buffer, static_cast<size_t>(got));
   }
@@ -155,10 +184,19 @@ std::string ServiceState() {
     close(pipeFds[0]);
     return "unknown (cannot run " + systemctl + ": " + std::strerror(spawned) + ")";
   }
-  std::string text = ReadAll(pipeFds[0]);
+  std::string text;
+  const bool answered = ReadWithin(pipeFds[0], kServiceQuerySeconds * 1000, text);
   close(pipeFds[0]);
+  // A systemctl that hangs (a bus that does not answer) must not hang the status report.
+  if (!answered) {
+    (void)kill(pid, SIGKILL);
+  }
   int status = 0;
   while (waitpid(pid, &status, 0) < 0 && errno == EINTR) {
+  }
+  if (!answered) {
+    return "unknown (" + systemctl + " gave no answer within " +
+           std::to_string(kServiceQuerySeconds) + " s)";
   }
   text = text.substr(0, text.find('\n'));
   if (!text.empty()) {

@@ -47,6 +47,8 @@ std::string ServiceState();
 
 // The service's systemd unit.
 constexpr char kServiceUnit[] = "fileindexd.service";
+// How long the status report waits for systemctl to name the service's state.
+constexpr int kServiceQuerySeconds = 5;
 
 // The steps a library operation runs after its save, in order, named by key: "monitor",
 // "service", "daemon", "queue", "clean", "unregister".
