@@ -1,8 +1,9 @@
 #!/usr/bin/env bash
-# Fails when the dynamic symbol table of the shared library holds anything but the public
-# interface: every defined symbol must carry the version node and name a C function, or a
-# declaration of the namespace WEZO::FILEINDEX (with its classes' type information), whose
-# names all appear in the public headers.
+# Fails when the dynamic symbol table of the shared library is not the public interface: every
+# defined symbol must carry the version node and name a C function, or a declaration of the
+# namespace WEZO::FILEINDEX (with its classes' type information), whose names all appear in the
+# public headers; and every class and function that the headers mark FILEINDEX_EXPORT must be
+# there.
 #
 # usage: check-exports.sh LIBRARY HEADER_DIR VERSION_NODE
 set -euo pipefail
@@ -49,6 +50,19 @@ while IFS= read -r sym; do
     fi
   done
 done <<<"$symbols"
+
+# The other way round: each exported class has members in the table, each exported function or
+# variable is there by name.
+exported=$(cat "$headers"/*.h | grep -v '#define' |
+  sed -nE 's/.*class FILEINDEX_EXPORT ([A-Za-z_][A-Za-z0-9_]*).*/\1::/p;
+            s/^FILEINDEX_EXPORT [^(;]*[^A-Za-z0-9_]([A-Za-z_][A-Za-z0-9_]*)[(;].*/\1/p')
+[ -n "$exported" ] || { echo "no FILEINDEX_EXPORT declaration in $headers" >&2; exit 1; }
+for name in $exported; do
+  if ! grep -qE "(^|::)${name}([(@]|$)|::${name}" <<<"$symbols"; then
+    echo "declared FILEINDEX_EXPORT but not exported: $name"
+    bad=1
+  fi
+done
 
 if [ "$bad" -ne 0 ]; then
   echo "$lib exports more than its public headers declare" >&2

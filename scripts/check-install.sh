@@ -24,7 +24,8 @@ if [ "$interface" != "JsonCpp::JsonCpp" ]; then
 fi
 
 # C through pkg-config; jsoncpp's own .pc is found on the system's search path.
-export PKG_CONFIG_PATH=$(dirname "$(find "$prefix" -name fileindex.pc)")
+PKG_CONFIG_PATH=$(dirname "$(find "$prefix" -name fileindex.pc)")
+export PKG_CONFIG_PATH
 libdir=$(pkg-config --variable=libdir fileindex)
 # shellcheck disable=SC2046  # pkg-config's output is a list of flags
 cc -std=c99 -Wall -Wextra -Wpedantic -Werror tests/consumers/c/main.c \
