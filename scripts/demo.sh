@@ -226,7 +226,7 @@ if [ "\$1" = is-active ]; then
 fi
 echo "systemctl \$*" >>"$demo/services.log"
 case "\$1" in
-  start | restart) echo active >"$demo/units/\$2" ;;
+  start | restart | reload-or-restart) echo active >"$demo/units/\$2" ;;
   stop) echo inactive >"$demo/units/\$2" ;;
 esac
 exit 0
@@ -257,7 +257,7 @@ expect_daemon 'upsert_folder_setting {"folder_path":"/photo/2019"}'
 expect_daemon 'upsert_folder_setting {"folder_path":"/video/movies"}'
 changes
 expect_contains "$demo/services.log" "systemctl start fileindexd.service"
-expect_contains "$demo/services.log" "systemctl restart smbd.service"
+expect_contains "$demo/services.log" "systemctl reload-or-restart smbd.service"
 expect_contains "$demo/units/fileindexd.service" active
 expect_contains "$root/etc/samba/smb.conf" "spotlight = yes"
 for share in photo video; do

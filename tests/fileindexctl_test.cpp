@@ -445,8 +445,8 @@ TEST_F(FileindexctlTest, OperationsReachTheDaemonServicesAndFiles) {
 
   ASSERT_EQ(Run({"remove", "/photo/2019", "/video/movies"}).status, 0);
   EXPECT_EQ(Read("services.log"),
-            "start fileindexd.service\nrestart smbd.service\n"
-            "stop fileindexd.service\nrestart smbd.service\n");
+            "start fileindexd.service\nreload-or-restart smbd.service\n"
+            "stop fileindexd.service\nreload-or-restart smbd.service\n");
   EXPECT_NE(Read("etc/samba/smb.conf").find("spotlight = no"), std::string::npos);
   const std::string daemon = WaitFor(At("daemon.log"), "upsert_folder_setting");
   EXPECT_NE(daemon.find("upsert_folder_setting"), std::string::npos) << daemon;

@@ -1,7 +1,8 @@
-// Symbol visibility of the library's public interface.
-//
-// The library is built with hidden visibility; only declarations marked FILEINDEX_EXPORT are part
-// of the shared library's dynamic symbol table.
+/// \file
+/// Symbol visibility of the library's public interface.
+///
+/// The library is built with hidden visibility; only declarations marked FILEINDEX_EXPORT are part
+/// of the shared library's dynamic symbol table.
 #ifndef FILEINDEX_EXPORT_H_
 #define FILEINDEX_EXPORT_H_
 

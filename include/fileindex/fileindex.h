@@ -1,8 +1,9 @@
-// The library's class interface, all of it: include this one header.
-//
-// Every operation is a static function or a short-lived object that runs to completion on the
-// caller's thread; requests and results are JSON values. Failures return false and leave a code
-// in ErrorHandler (fileindex/error.h); nothing is thrown across the library boundary.
+/// \file
+/// The library's class interface, all of it: include this one header.
+///
+/// Every operation is a static function or a short-lived object that runs to completion on the
+/// caller's thread; requests and results are JSON values. Failures return false and leave a code
+/// in ErrorHandler (fileindex/error.h); nothing is thrown across the library boundary.
 #ifndef FILEINDEX_FILEINDEX_H_
 #define FILEINDEX_FILEINDEX_H_
 

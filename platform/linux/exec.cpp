@@ -52,29 +52,43 @@ int Spawn(const char* path, const char* const argv[]) {
   return 0;
 }
 
-// The systemd unit of each service the library controls.
-const char* UnitOf(const char* service) {
+// The systemd unit of each service the library controls, and the verb that brings a running
+// unit to its current configuration. smbd re-reads smb.conf when reloaded and keeps its clients'
+// sessions, which a restart would drop, so Samba is reloaded; reload-or-restart still starts a
+// unit that is not running and restarts one that cannot reload.
+struct Unit {
+  const char* service;
+  const char* unit;
+  const char* restartVerb;
+};
+constexpr Unit kUnits[] = {
+    {"samba", "smbd.service", "reload-or-restart"},
+    {"fileindexd", "fileindexd.service", "restart"},
+};
+
+const Unit* UnitOf(const char* service) {
   if (service == nullptr) {
     return nullptr;
   }
-  if (std::strcmp(service, "samba") == 0) {
-    return "smbd.service";
-  }
-  if (std::strcmp(service, "fileindexd") == 0) {
-    return "fileindexd.service";
+  for (const Unit& unit : kUnits) {
+    if (std::strcmp(service, unit.service) == 0) {
+      return &unit;
+    }
   }
   return nullptr;
 }
 
-// systemctl's start and stop leave a running or stopped unit as it is, and restart starts a
-// unit that is not running: each verb already has the meaning the service operations promise.
+// systemctl's start and stop leave a running or stopped unit as it is, and the restart verbs
+// start a unit that is not running: each verb already has the meaning the service operations
+// promise. A null verb is the unit's own restart verb.
 int Systemctl(const char* verb, const char* service) {
-  const char* unit = UnitOf(service);
+  const Unit* unit = UnitOf(service);
   if (unit == nullptr) {
     return PLATFORM_FAIL(WLIBC_ERR_BAD_PARAMETERS);
   }
   const std::string systemctl = WEZO::PLATFORM::Rooted("/usr/bin/systemctl");
-  const char* const argv[] = {systemctl.c_str(), verb, unit, nullptr};
+  const char* const argv[] = {systemctl.c_str(), verb != nullptr ? verb : unit->restartVerb,
+                              unit->unit, nullptr};
   return Spawn(systemctl.c_str(), argv) == 0 ? 0 : -1;
 }
 
@@ -112,6 +126,6 @@ int WLIBServiceStart(const char* szService, int /*flags*/) { return Systemctl("s
 
 int WLIBServiceStop(const char* szService, int /*flags*/) { return Systemctl("stop", szService); }
 
-int WLIBServiceRestart(const char* szService) { return Systemctl("restart", szService); }
+int WLIBServiceRestart(const char* szService) { return Systemctl(nullptr, szService); }
 
 }  // extern "C"

@@ -52,11 +52,13 @@ TEST_F(ExecTest, ControlsServicesThroughSystemctl) {
   EXPECT_EQ(WLIBServiceStart("fileindexd", 1), 0);
   EXPECT_EQ(WLIBServiceStop("samba", 1), 0);
   EXPECT_EQ(WLIBServiceRestart("samba"), 0);
+  EXPECT_EQ(WLIBServiceRestart("fileindexd"), 0);
   EXPECT_LT(WLIBServiceStart("nfs", 1), 0);
   EXPECT_EQ(WLIBCErrGet(), WLIBC_ERR_BAD_PARAMETERS);
   EXPECT_LT(WLIBServiceRestart(nullptr), 0);
   EXPECT_EQ(Read("usr/bin/calls"),
-            "start fileindexd.service\nstop smbd.service\nrestart smbd.service\n");
+            "start fileindexd.service\nstop smbd.service\nreload-or-restart smbd.service\n"
+            "restart fileindexd.service\n");
 
   Write("usr/bin/status", "1\n");
   EXPECT_LT(WLIBServiceStart("fileindexd", 1), 0);
