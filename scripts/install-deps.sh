@@ -1,6 +1,8 @@
 #!/usr/bin/env bash
 # Installs what the library needs to build and test, from Debian's packages.
 # Safe to run again: it asks apt only for packages that are not installed yet.
+# With --packaging it also installs what the Debian packages, the manual page and the API
+# reference need (scripts/package.sh).
 set -euo pipefail
 
 packages=(
@@ -20,6 +22,10 @@ packages=(
   clang
   libclang-rt-14-dev
 )
+
+if [ "${1:-}" = "--packaging" ]; then
+  packages+=(debhelper dpkg-dev fakeroot lintian help2man doxygen)
+fi
 
 missing=()
 for p in "${packages[@]}"; do

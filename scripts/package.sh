@@ -5,7 +5,7 @@
 # usage: scripts/package.sh [dpkg-buildpackage options]   (e.g. -Pnocheck to skip the tests)
 set -euo pipefail
 cd "$(dirname "$0")/.."
-./scripts/install-package-deps.sh
+./scripts/install-deps.sh --packaging
 
 out=$PWD/build-deb
 work=$(mktemp -d)
