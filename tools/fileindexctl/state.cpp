@@ -3,7 +3,6 @@
 #include <fcntl.h>
 #include <fileindex/root.h>
 #include <poll.h>
-#include <signal.h>
 #include <spawn.h>
 #include <sys/mman.h>
 #include <sys/socket.h>
@@ -15,6 +14,7 @@
 #include <array>
 #include <cerrno>
 #include <chrono>
+#include <csignal>
 #include <cstring>
 #include <utility>
 
