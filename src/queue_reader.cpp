@@ -475,6 +475,18 @@ bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile
   return detail::QueueHasFolderEvent(folder, queueFile, kBlockSize);
 }
 
+namespace {
+
+// True when nothing that could be a queue is at `queueFile`: it is missing, or it is not a regular
+// file. Anything else that keeps it from being looked at (a link on the way, no descriptor left)
+// is for the open to report.
+bool NoQueueAt(const std::string& queueFile) {
+  return !LocationFileExists(queueFile) &&
+         (errno == ENOENT || errno == ENOTDIR || errno == EISDIR || errno == ENXIO);
+}
+
+}  // namespace
+
 namespace detail {
 
 bool ScanQueueLine(const char* line, size_t size, ScannedEvent& out) {
@@ -482,7 +494,7 @@ bool ScanQueueLine(const char* line, size_t size, ScannedEvent& out) {
 }
 
 bool IsReindexQueued(const std::string& path, const std::string& queueFile, size_t blockSize) {
-  if (!IsFileExist(queueFile)) {
+  if (NoQueueAt(queueFile)) {
     return false;
   }
   const UniqueFd fd = OpenLocationFile(queueFile, O_RDONLY);
@@ -504,7 +516,7 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile, size
 
 bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile,
                          size_t blockSize) {
-  if (!IsFileExist(queueFile)) {
+  if (NoQueueAt(queueFile)) {
     return false;
   }
   std::string full;

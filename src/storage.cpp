@@ -208,6 +208,20 @@ UniqueFd OpenLocationFile(const std::string& location, int flags, mode_t mode) {
   return fd;
 }
 
+bool LocationFileExists(const std::string& location) {
+  std::string name;
+  const UniqueFd dir = OpenLocationDir(location, name);
+  struct stat st {};
+  if (!dir || fstatat(dir.get(), name.c_str(), &st, AT_SYMLINK_NOFOLLOW) != 0) {
+    return false;
+  }
+  if (!S_ISREG(st.st_mode)) {
+    errno = S_ISDIR(st.st_mode) ? EISDIR : ENXIO;
+    return false;
+  }
+  return true;
+}
+
 bool RemoveLocation(const std::string& location) {
   std::string name;
   const UniqueFd dir = OpenLocationDir(location, name);

@@ -53,6 +53,10 @@ UniqueFd OpenLocationDir(const std::string& location, std::string& name);
 // descriptor is close-on-exec and non-blocking.
 UniqueFd OpenLocationFile(const std::string& location, int flags, mode_t mode = 0);
 
+// True when `location` (as for OpenLocationDir) is a regular file, reached without following a
+// link. Sets errno when it is not.
+bool LocationFileExists(const std::string& location);
+
 // Removes `location` (as for OpenLocationDir), a directory with everything below it. A link
 // anywhere is removed itself, never what it points to. True when nothing is left, also when
 // nothing was there; false, errno set, when something could not be removed or a tree is

@@ -211,6 +211,15 @@ TEST_F(ProgressTest, TheServiceIsFinishedWhenNoIndexableShareHasAQueueFile) {
   ASSERT_TRUE(StatusMgr::GetStatus(word));
   EXPECT_EQ(word, "paused") << "an empty .tmp file is pending work";
 
+  // A queue reached only through a link planted as the metadata directory is not the share's.
+  const std::string metadata = volume + "/photo/@eaDir";
+  std::filesystem::rename(metadata, volume + "/out");
+  std::filesystem::create_directory_symlink(volume + "/out", metadata);
+  ASSERT_TRUE(StatusMgr::GetStatus(word));
+  EXPECT_EQ(word, "finished");
+  std::filesystem::remove(metadata);
+  std::filesystem::rename(volume + "/out", metadata);
+
   std::filesystem::remove(volume + "/photo/a");
   ASSERT_TRUE(StatusMgr::GetStatus(word));
   EXPECT_EQ(word, "finished") << "a folder that cannot be indexed does not count";
