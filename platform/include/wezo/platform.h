@@ -143,7 +143,9 @@ int WLIBServiceStart(const char* szService, int flags);
 /* Stops the named service; flags is 1. A stopped service counts as stopped. Same results. */
 int WLIBServiceStop(const char* szService, int flags);
 
-/* Restarts the named service (starts it when it is not running). Same results. */
+/* Restarts the named service (starts it when it is not running), so that it runs with its current
+ * configuration. A platform may have a service that can re-read its configuration in place
+ * reload it instead, keeping its clients connected. Same results. */
 int WLIBServiceRestart(const char* szService);
 
 /* ---- SMB --------------------------------------------------------------------------------- */
@@ -152,7 +154,7 @@ int WLIBServiceRestart(const char* szService);
 int WEZOSMBIsEnableSpotlight(void);
 
 /* Switches Spotlight over SMB on (non-zero) or off (0) in the SMB configuration; the SMB service
- * must be restarted for it to take effect. Returns 0 on success, negative with the last error
+ * takes it up once restarted (WLIBServiceRestart). Returns 0 on success, negative with the last error
  * set on failure. */
 int WEZOSMBSetSpotlight(int fEnable);
 
