@@ -41,21 +41,6 @@ void WriteAll(int fd, const std::string& text) {
   }
 }
 
-std::string ReadAll(int fd) {
-  std::string text;
-  char buffer[4096];
-  for (;;) {
-    const ssize_t got = read(fd, buffer, sizeof buffer);
-    if (got < 0 && errno == EINTR) {
-      continue;
-    }
-    if (got <= 0) {
-      return text;
-    }
-    text.append(buffer, static_cast<size_t>(got));
-  }
-}
-
 // Reads `fd` to its end into `text`, for at most `milliseconds`; false when time ran out first.
 bool ReadWithin(int fd, int milliseconds, std::string& text) {
   const auto deadline = std::chrono::steady_clock::now() + std::chrono::milliseconds(milliseconds);
@@ -111,8 +96,10 @@ void LibraryCall::Stop() {
   close(m_savedStderr);
   m_savedStderr = -1;
   std::string captured;
+  // The capture is a file in memory: it is always ready, so the bound is never reached.
   if (lseek(m_capture, 0, SEEK_SET) == 0) {
-    captured = ReadAll(m_capture);
+    constexpr int kAlwaysReadyMs = 1000;
+    (void)ReadWithin(m_capture, kAlwaysReadyMs, captured);
   }
   close(m_capture);
   m_capture = -1;
