@@ -16,8 +16,8 @@
 #include <string>
 
 #include "fake_platform.h"
-#include "log.h"
-#include "queue_reader.h"
+#include "utils/log.h"
+#include "utils/queue_reader.h"
 
 namespace {
 

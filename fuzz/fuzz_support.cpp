@@ -14,7 +14,7 @@
 
 #include "fake_platform.h"
 #include "fileindex/root.h"
-#include "log.h"
+#include "utils/log.h"
 #include "paths.h"
 
 namespace fuzzsupport {

@@ -16,7 +16,7 @@
 #include "fileindex/utils.h"
 #include "fuzz_support.h"
 #include "json_io.h"
-#include "queue_reader.h"
+#include "utils/queue_reader.h"
 
 namespace {
 

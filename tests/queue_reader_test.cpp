@@ -1,4 +1,4 @@
-#include "queue_reader.h"
+#include "utils/queue_reader.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>

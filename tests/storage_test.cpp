@@ -12,8 +12,8 @@
 #include "fileindex/fileindex_c.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/queue.h"
-#include "queue_reader.h"
-#include "storage.h"
+#include "utils/queue_reader.h"
+#include "utils/storage.h"
 #include "test_support.h"
 
 namespace WEZO {

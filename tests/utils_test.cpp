@@ -10,7 +10,7 @@
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
-#include "log.h"
+#include "utils/log.h"
 #include "test_support.h"
 
 #define FILEINDEX_LOG_UNIT "utils"

@@ -25,7 +25,7 @@
 #include "fileindex/error.h"
 #include "fileindex/root.h"
 #include "json_io.h"
-#include "log.h"
+#include "utils/log.h"
 #include "paths.h"
 
 namespace testsupport {

@@ -1,6 +1,6 @@
 // Share records of the platform's share database, released when they go out of scope.
-#ifndef FILEINDEX_SRC_SHARE_RECORD_H_
-#define FILEINDEX_SRC_SHARE_RECORD_H_
+#ifndef FILEINDEX_SRC_UTILS_SHARE_RECORD_H_
+#define FILEINDEX_SRC_UTILS_SHARE_RECORD_H_
 
 #include <wezo/platform.h>
 
@@ -33,4 +33,4 @@ inline std::string SharePathOf(const WEZOSHARE& share) {
 }  // namespace FILEINDEX
 }  // namespace WEZO
 
-#endif  // FILEINDEX_SRC_SHARE_RECORD_H_
+#endif  // FILEINDEX_SRC_UTILS_SHARE_RECORD_H_

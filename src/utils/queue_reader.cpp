@@ -1,6 +1,6 @@
 #define FILEINDEX_LOG_UNIT "utils"
 
-#include "queue_reader.h"
+#include "utils/queue_reader.h"
 
 #include <fcntl.h>
 #include <json/value.h>
@@ -16,8 +16,8 @@
 #include "fileindex/queue.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
-#include "log.h"
-#include "storage.h"
+#include "utils/log.h"
+#include "utils/storage.h"
 #include "unique_fd.h"
 
 namespace WEZO {

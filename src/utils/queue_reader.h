@@ -9,8 +9,8 @@
 // (a writer still busy) is read like any other line. Neither reader locks the file. The file is
 // opened as OpenLocationFile (storage.h) opens it: a link below the share, or anything but a
 // regular file, counts as a file that cannot be opened. Reentrant.
-#ifndef FILEINDEX_SRC_QUEUE_READER_H_
-#define FILEINDEX_SRC_QUEUE_READER_H_
+#ifndef FILEINDEX_SRC_UTILS_QUEUE_READER_H_
+#define FILEINDEX_SRC_UTILS_QUEUE_READER_H_
 
 #include <cstddef>
 #include <string>
@@ -68,4 +68,4 @@ bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile
 }  // namespace FILEINDEX
 }  // namespace WEZO
 
-#endif  // FILEINDEX_SRC_QUEUE_READER_H_
+#endif  // FILEINDEX_SRC_UTILS_QUEUE_READER_H_

@@ -14,7 +14,7 @@
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
-#include "log.h"
+#include "utils/log.h"
 
 namespace WEZO {
 namespace FILEINDEX {

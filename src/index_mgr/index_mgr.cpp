@@ -22,9 +22,9 @@
 #include "fileindex/status_mgr.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
-#include "log.h"
-#include "path_rules.h"
-#include "storage.h"
+#include "utils/log.h"
+#include "utils/path_rules.h"
+#include "utils/storage.h"
 
 namespace WEZO {
 namespace FILEINDEX {

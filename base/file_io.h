@@ -1,7 +1,7 @@
 // Whole-file reading and atomic replacement, shared by the library's configuration files and the
 // generic-Linux platform's own files. Nothing here logs; on failure errno tells why.
-#ifndef FILEINDEX_SRC_FILE_IO_H_
-#define FILEINDEX_SRC_FILE_IO_H_
+#ifndef FILEINDEX_BASE_FILE_IO_H_
+#define FILEINDEX_BASE_FILE_IO_H_
 
 #include <sys/types.h>
 
@@ -39,4 +39,4 @@ void RemoveStaleTemporaries(const std::string& path, time_t minAgeSeconds);
 }  // namespace FILEINDEX
 }  // namespace WEZO
 
-#endif  // FILEINDEX_SRC_FILE_IO_H_
+#endif  // FILEINDEX_BASE_FILE_IO_H_

@@ -2,7 +2,7 @@
 // share's hidden metadata directory.
 #define FILEINDEX_LOG_UNIT "utils"
 
-#include "storage.h"
+#include "utils/storage.h"
 
 #include <dirent.h>
 #include <fcntl.h>
@@ -15,8 +15,8 @@
 #include <cstring>
 
 #include "fileindex/fileindex_c.h"
-#include "log.h"
-#include "share_record.h"
+#include "utils/log.h"
+#include "utils/share_record.h"
 
 namespace WEZO {
 namespace FILEINDEX {

@@ -7,7 +7,7 @@
 #include "fileindex/status_mgr.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
-#include "log.h"
+#include "utils/log.h"
 
 namespace WEZO {
 namespace FILEINDEX {

@@ -1,6 +1,6 @@
 // A file descriptor that closes itself.
-#ifndef FILEINDEX_SRC_UNIQUE_FD_H_
-#define FILEINDEX_SRC_UNIQUE_FD_H_
+#ifndef FILEINDEX_BASE_UNIQUE_FD_H_
+#define FILEINDEX_BASE_UNIQUE_FD_H_
 
 #include <unistd.h>
 
@@ -47,4 +47,4 @@ class UniqueFd {
 }  // namespace FILEINDEX
 }  // namespace WEZO
 
-#endif  // FILEINDEX_SRC_UNIQUE_FD_H_
+#endif  // FILEINDEX_BASE_UNIQUE_FD_H_

@@ -14,9 +14,9 @@
 #include "fileindex/queue.h"
 #include "fileindex/status_mgr.h"
 #include "json_io.h"
-#include "log.h"
-#include "queue_reader.h"
-#include "storage.h"
+#include "utils/log.h"
+#include "utils/queue_reader.h"
+#include "utils/storage.h"
 #include "unique_fd.h"
 
 namespace WEZO {

@@ -4,8 +4,8 @@
 // and the library queues events for, all with root's rights; a share name selects the share whose
 // folders, registration, worker and index data an operation changes. Both are checked here, in
 // one place, before they are used. Pure string work: nothing is looked up.
-#ifndef FILEINDEX_SRC_PATH_RULES_H_
-#define FILEINDEX_SRC_PATH_RULES_H_
+#ifndef FILEINDEX_SRC_UTILS_PATH_RULES_H_
+#define FILEINDEX_SRC_UTILS_PATH_RULES_H_
 
 #include <string>
 
@@ -43,4 +43,4 @@ inline bool IsShareName(const std::string& name) {
 }  // namespace FILEINDEX
 }  // namespace WEZO
 
-#endif  // FILEINDEX_SRC_PATH_RULES_H_
+#endif  // FILEINDEX_SRC_UTILS_PATH_RULES_H_

@@ -12,7 +12,7 @@
 #include "fileindex/folders.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/utils.h"
-#include "log.h"
+#include "utils/log.h"
 
 namespace WEZO {
 namespace FILEINDEX {

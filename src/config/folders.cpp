@@ -12,7 +12,7 @@
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
-#include "log.h"
+#include "utils/log.h"
 #include "paths.h"
 
 namespace WEZO {

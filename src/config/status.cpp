@@ -7,7 +7,7 @@
 #include <exception>
 
 #include "fileindex/utils.h"
-#include "log.h"
+#include "utils/log.h"
 #include "paths.h"
 
 namespace WEZO {

@@ -17,9 +17,9 @@
 #include "fileindex/index_mgr.h"
 #include "fileindex/status.h"
 #include "fileindex/utils.h"
-#include "log.h"
-#include "queue_reader.h"
-#include "storage.h"
+#include "utils/log.h"
+#include "utils/queue_reader.h"
+#include "utils/storage.h"
 
 namespace WEZO {
 namespace FILEINDEX {

@@ -6,8 +6,8 @@
 // mkdir or a removal outside the share. The share's own full path comes from the platform and is
 // trusted; every component below it is walked with openat and O_NOFOLLOW. Nothing here logs;
 // on failure errno says why (ELOOP for a link in the way). Reentrant.
-#ifndef FILEINDEX_SRC_STORAGE_H_
-#define FILEINDEX_SRC_STORAGE_H_
+#ifndef FILEINDEX_SRC_UTILS_STORAGE_H_
+#define FILEINDEX_SRC_UTILS_STORAGE_H_
 
 #include <sys/types.h>
 
@@ -66,4 +66,4 @@ bool RemoveLocation(const std::string& location);
 }  // namespace FILEINDEX
 }  // namespace WEZO
 
-#endif  // FILEINDEX_SRC_STORAGE_H_
+#endif  // FILEINDEX_SRC_UTILS_STORAGE_H_

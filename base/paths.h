@@ -1,7 +1,7 @@
 // Every fixed location of the library, built in one place from the root prefix
 // (fileindex/root.h). Call sites never write these paths themselves.
-#ifndef FILEINDEX_SRC_PATHS_H_
-#define FILEINDEX_SRC_PATHS_H_
+#ifndef FILEINDEX_BASE_PATHS_H_
+#define FILEINDEX_BASE_PATHS_H_
 
 #include <string>
 
@@ -29,4 +29,4 @@ inline std::string NotifyToolPath() { return RootedPath(kNotifyToolPath); }
 }  // namespace FILEINDEX
 }  // namespace WEZO
 
-#endif  // FILEINDEX_SRC_PATHS_H_
+#endif  // FILEINDEX_BASE_PATHS_H_

@@ -8,9 +8,9 @@
 #include <cstring>
 
 #include "fileindex/error.h"
-#include "log.h"
+#include "utils/log.h"
 #include "paths.h"
-#include "share_record.h"
+#include "utils/share_record.h"
 
 namespace WEZO {
 namespace FILEINDEX {

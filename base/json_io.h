@@ -4,8 +4,8 @@
 // comments, trailing commas, duplicate keys or text after the value) and keeps one reader per
 // thread, so parsing many short texts, such
 // as the lines of an event queue, costs no allocation of a reader per call.
-#ifndef FILEINDEX_SRC_JSON_IO_H_
-#define FILEINDEX_SRC_JSON_IO_H_
+#ifndef FILEINDEX_BASE_JSON_IO_H_
+#define FILEINDEX_BASE_JSON_IO_H_
 
 #include <json/value.h>
 #include <sys/types.h>
@@ -47,4 +47,4 @@ std::string JsonToString(const Json::Value& value);
 }  // namespace FILEINDEX
 }  // namespace WEZO
 
-#endif  // FILEINDEX_SRC_JSON_IO_H_
+#endif  // FILEINDEX_BASE_JSON_IO_H_

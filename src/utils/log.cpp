@@ -1,4 +1,4 @@
-#include "log.h"
+#include "utils/log.h"
 
 #include <syslog.h>
 #include <wezo/platform.h>

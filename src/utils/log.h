@@ -7,8 +7,8 @@
 //
 // Formats are checked at compile time, which refuses syslog's %m; a line that names the reason
 // of a failed call writes "reason=%s" with ErrnoText(), which prints what %m would.
-#ifndef FILEINDEX_SRC_LOG_H_
-#define FILEINDEX_SRC_LOG_H_
+#ifndef FILEINDEX_SRC_UTILS_LOG_H_
+#define FILEINDEX_SRC_UTILS_LOG_H_
 
 #include <string>
 
@@ -47,4 +47,4 @@ void WritePlatformFailure(const char* unit, int line, const char* what);
 #define FILEINDEX_LOG_PLATFORM_FAILURE(what) \
   ::WEZO::FILEINDEX::detail::WritePlatformFailure(FILEINDEX_LOG_UNIT, __LINE__, what)
 
-#endif  // FILEINDEX_SRC_LOG_H_
+#endif  // FILEINDEX_SRC_UTILS_LOG_H_

@@ -12,8 +12,8 @@
 
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
-#include "log.h"
-#include "share_record.h"
+#include "utils/log.h"
+#include "utils/share_record.h"
 
 namespace WEZO {
 namespace FILEINDEX {
