@@ -22,6 +22,7 @@
 #include "fileindex/status_mgr.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
+#include "layout.h"
 #include "utils/log.h"
 #include "utils/path_rules.h"
 #include "utils/storage.h"
@@ -34,9 +35,6 @@ constexpr char kMonitorClient[] = "fileindex";
 // Every event class of the monitor except three that indexing has no use for (0x0001, 0x0010
 // and 0x0020).
 constexpr int kMonitorMask = 0xFFCE;
-constexpr char kMetadataDir[] = "@eaDir";
-constexpr char kIndexService[] = "fileindexd";
-constexpr char kSmbService[] = "samba";
 constexpr int kServiceFlags = 1;
 constexpr int kLocationSize = 4096;
 
@@ -594,7 +592,7 @@ bool IndexMgr::CleanShareIndexData(const std::string& share) {
   const std::string queue = location;
   // Each location is tried even when another could not be removed.
   bool removed = RemoveTree(queue);
-  removed = RemoveTree(queue + kQueueTmpSuffix) && removed;
+  removed = RemoveTree(QueueTmpOf(queue)) && removed;
   if (FILEIDXDBPathGet(share.c_str(), location, kLocationSize) < 0) {
     FILEINDEX_LOG("FILEIDXDBPathGet failed, share=%s", share.c_str());
     return false;
@@ -615,7 +613,7 @@ bool IndexMgr::UpsertWEZotifydCfg(const std::string& share) {
   }
 
   Json::Value ignore(Json::arrayValue);
-  ignore.append(kMetadataDir);
+  ignore.append(kMetadataDirName);
   Json::Value config(Json::arrayValue);
   for (const Folder& folder : folders) {
     std::string fullPath;

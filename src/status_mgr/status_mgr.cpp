@@ -150,7 +150,7 @@ bool StatusMgr::GetStatus(std::string& status) {
       return false;
     }
     // Existence alone counts: the daemon removes a queue it has worked through.
-    if (LocationFileExists(queue) || LocationFileExists(queue + kQueueTmpSuffix)) {
+    if (LocationFileExists(queue) || LocationFileExists(QueueTmpOf(queue))) {
       pending = true;
       break;
     }
@@ -190,7 +190,7 @@ std::string StatusMgr::GetFolderStatus(const std::string& path) {
   if (!GetPauseInfo(resumeTime)) {
     resumeTime = kNotPaused;
   }
-  if (!QueueHasFolderEvent(path, queue) && !QueueHasFolderEvent(path, queue + kQueueTmpSuffix)) {
+  if (!QueueHasFolderEvent(path, queue) && !QueueHasFolderEvent(path, QueueTmpOf(queue))) {
     return kFinished;
   }
   return RunningOrPaused(resumeTime);
