@@ -14,15 +14,16 @@
 #include <string>
 #include <vector>
 
+#include "config/transaction.h"
 #include "fileindex/daemon.h"
 #include "fileindex/error.h"
 #include "fileindex/fileindex_c.h"
 #include "fileindex/folders.h"
 #include "fileindex/queue.h"
-#include "fileindex/status_mgr.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
 #include "layout.h"
+#include "status_mgr/status_change.h"
 #include "utils/log.h"
 #include "utils/path_rules.h"
 #include "utils/storage.h"
@@ -37,19 +38,6 @@ constexpr char kMonitorClient[] = "fileindex";
 constexpr int kMonitorMask = 0xFFCE;
 constexpr int kServiceFlags = 1;
 constexpr int kLocationSize = 4096;
-
-// Releases the folder list's lock on the way out of a scope, whichever way that is: Config's
-// destructor leaves the lock alone, and an exception must not leave it held.
-class UnlockOnExit {
- public:
-  explicit UnlockOnExit(Config& config) : m_config(config) {}
-  ~UnlockOnExit() { m_config.Unlock(); }
-  UnlockOnExit(const UnlockOnExit&) = delete;
-  UnlockOnExit& operator=(const UnlockOnExit&) = delete;
-
- private:
-  Config& m_config;
-};
 
 void RefuseRequest(int line, const Json::Value& request) {
   detail::WriteLog(false, FILEINDEX_LOG_UNIT, line, "Bad param: %s", JsonToString(request).c_str());
@@ -231,8 +219,8 @@ bool UpsertFolders(const Json::Value& request) {
     return false;
   }
   Folders list;
-  const UnlockOnExit unlock(list);
-  if (!list.Lock(true) || !list.Load()) {
+  ConfigTransaction transaction(list);
+  if (!transaction.Begin()) {
     return false;
   }
   // An element without a string "path" is left to Folders::Upsert, which refuses it in its own
@@ -262,7 +250,7 @@ bool UpsertFolders(const Json::Value& request) {
     }
     paths.push_back(path);
   }
-  if (!list.Save()) {
+  if (!transaction.Commit()) {
     return false;
   }
 
@@ -296,8 +284,8 @@ bool DeleteFolders(const Json::Value& request) {
     return false;
   }
   Folders list;
-  const UnlockOnExit unlock(list);
-  if (!list.Lock(true) || !list.Load()) {
+  ConfigTransaction transaction(list);
+  if (!transaction.Begin()) {
     return false;
   }
   PathCheck check(list);
@@ -320,7 +308,7 @@ bool DeleteFolders(const Json::Value& request) {
       return false;
     }
   }
-  if (!list.Save()) {
+  if (!transaction.Commit()) {
     return false;
   }
 
@@ -368,14 +356,14 @@ bool ReindexPaths(const Json::Value& request) {
     if (!IndexMgr::IsShareIndexed(share)) {
       return false;
     }
-    if (StatusMgr::ShareIsNoSpace(share)) {
+    if (QueryStatus([&](const Status& s) { return s.ShareIsNoSpace(share); })) {
       noSpace.insert(share);
     }
   }
   // A share out of room gets its worker back so that the reindex can run; if that fails the
   // events are queued all the same and wait for the share.
   for (const std::string& share : noSpace) {
-    if (!StatusMgr::ShareRevive(share)) {
+    if (!ReviveShare(share)) {
       FILEINDEX_LOG("ShareRevice failed, share=%s", share.c_str());
     }
   }
@@ -413,8 +401,8 @@ bool IndexMgr::List(Json::Value& result, unsigned long offset, unsigned long lim
 
 bool IndexMgr::Get(Json::Value& result, const std::string& path) {
   Folders list;
-  const UnlockOnExit unlock(list);
-  return list.Lock(true) && list.Load() && list.Get(result, path);
+  ConfigTransaction transaction(list);
+  return transaction.Begin() && list.Get(result, path);
 }
 
 bool IndexMgr::IsPathIndexed(const std::string& path, const std::vector<Folder>& folders) {
@@ -502,9 +490,9 @@ bool IndexMgr::ShareRemove(const std::string& share) {
     return false;
   }
   Folders list;
-  const UnlockOnExit unlock(list);
+  ConfigTransaction transaction(list);
   std::vector<Folder> folders;
-  if (!list.Lock(true) || !list.Load() || !list.List(folders, share)) {
+  if (!transaction.Begin() || !list.List(folders, share)) {
     return false;
   }
   Json::Value report;
@@ -513,7 +501,7 @@ bool IndexMgr::ShareRemove(const std::string& share) {
       return false;
     }
   }
-  if (!list.Save()) {
+  if (!transaction.Commit()) {
     return false;
   }
   if (HoldsNoFolder(list)) {
@@ -531,9 +519,9 @@ bool IndexMgr::ShareRename(const std::string& oldShare, const std::string& newSh
     return false;
   }
   Folders list;
-  const UnlockOnExit unlock(list);
+  ConfigTransaction transaction(list);
   std::vector<Folder> folders;
-  if (!list.Lock(true) || !list.Load() || !list.List(folders, oldShare)) {
+  if (!transaction.Begin() || !list.List(folders, oldShare)) {
     return false;
   }
   Json::Value report;
@@ -549,7 +537,7 @@ bool IndexMgr::ShareRename(const std::string& oldShare, const std::string& newSh
       return false;
     }
   }
-  return list.Save();
+  return transaction.Commit();
 }
 
 bool IndexMgr::SharePause(const std::string& share) {

@@ -10,9 +10,9 @@
 #include <string>
 
 #include "fileindex/queue.h"
-#include "fileindex/status_mgr.h"
 #include "flock.h"
 #include "json_io.h"
+#include "status_mgr/status_change.h"
 #include "unique_fd.h"
 #include "utils/log.h"
 #include "utils/queue_reader.h"
@@ -120,7 +120,7 @@ bool AddCustomEvent(const int& event, const std::string& path, const Json::Value
   }
 
   // The event is lost; indexing the whole share again from scratch makes up for it.
-  if (!StatusMgr::ShareSetNeedReindex(shareName, true)) {
+  if (!ChangeStatus([&](Status& s) { return s.ShareSetNeedReindex(shareName, true); })) {
     FILEINDEX_LOG("ShareSetNeedReindex failed, share=%s", shareName);
   }
   return false;
