@@ -11,9 +11,12 @@
 #include <vector>
 
 #include "internal.h"
+#include "layout.h"
 
 namespace {
 
+using WEZO::FILEINDEX::kIndexService;
+using WEZO::FILEINDEX::kSmbService;
 using WEZO::PLATFORM::kErrNotFound;
 using WEZO::PLATFORM::kErrProgram;
 
@@ -62,8 +65,8 @@ struct Unit {
   const char* restartVerb;
 };
 constexpr Unit kUnits[] = {
-    {"samba", "smbd.service", "reload-or-restart"},
-    {"fileindexd", "fileindexd.service", "restart"},
+    {kSmbService, "smbd.service", "reload-or-restart"},
+    {kIndexService, "fileindexd.service", "restart"},
 };
 
 const Unit* UnitOf(const char* service) {

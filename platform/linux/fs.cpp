@@ -22,6 +22,7 @@
 
 #include "file_io.h"
 #include "internal.h"
+#include "layout.h"
 #include "unique_fd.h"
 
 namespace {
@@ -297,7 +298,7 @@ int WEZOFSDirIsMntPoint(const char* szPath) {
 }
 
 int WEZOEAIsHiddenDir(const char* szName) {
-  return szName != nullptr && std::strcmp(szName, "@eaDir") == 0 ? 1 : 0;
+  return szName != nullptr && std::strcmp(szName, WEZO::FILEINDEX::kMetadataDirName) == 0 ? 1 : 0;
 }
 
 // The folder belongs to root with mode 0755: the platform's services write it, everyone reads.

@@ -7,20 +7,18 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
-#include <cerrno>
-#include <cstdlib>
-
 #include "file_io.h"
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
+#include "flock.h"
 #include "json_io.h"
+#include "unique_fd.h"
 #include "utils/log.h"
 
 namespace WEZO {
 namespace FILEINDEX {
 namespace {
 
-constexpr int kLockAttempts = 3;
 constexpr mode_t kFileMode = 0644;
 // Only the library's user may open a lock file: flock needs no more than a read-only descriptor,
 // so a lock file that others can read is one that any local user can hold to block every change.
@@ -89,34 +87,26 @@ bool Config::SaveJson() {
 
 bool Config::Lock(bool exclusive) {
   const std::string path = GetLockPath();
-  const int operation = (exclusive ? LOCK_EX : LOCK_SH) | LOCK_NB;
-  for (int attempt = 1; attempt <= kLockAttempts; ++attempt) {
+  const auto open = [&path] {
     // The lock files live in world-writable /tmp: never follow a link planted there.
-    const int fd = open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, kLockFileMode);
-    if (fd < 0) {
-      break;
+    UniqueFd fd(::open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC | O_NOFOLLOW, kLockFileMode));
+    if (!fd) {
+      return fd;
     }
-    const LockFileCheck check = MakePrivate(fd);
+    const LockFileCheck check = MakePrivate(fd.get());
     if (check != LockFileCheck::kPrivate) {
-      close(fd);
+      fd.Close();
       if (check == LockFileCheck::kForeign) {
         FILEINDEX_LOG("Lock file refused, not a regular file of uid %u with one link, path=%s",
                       static_cast<unsigned>(geteuid()), path.c_str());
       }
-      break;
     }
-    if (flock(fd, operation) == 0) {
-      m_lockFd = fd;
-      return true;
-    }
-    const int reason = errno;
-    close(fd);
-    if (reason != EINTR && reason != EWOULDBLOCK) {
-      break;
-    }
-    if (attempt < kLockAttempts) {
-      usleep(static_cast<useconds_t>(rand() % 10) * 1000);  // NOLINT(cert-msc30-c,cert-msc50-cpp)
-    }
+    return fd;
+  };
+  UniqueFd locked;
+  if (FlockRetrying(open, exclusive ? LOCK_EX : LOCK_SH, locked) == FlockResult::kLocked) {
+    m_lockFd = locked.Release();
+    return true;
   }
   FILEINDEX_LOG("Failed to lock folder");
   ErrorHandler::SetError(FILEINDEX_ERR_LOCK);

@@ -4,9 +4,9 @@
 
 #include "fileindex/eligibility.h"
 #include "fileindex/error.h"
-#include "fileindex/status_mgr.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
+#include "status_mgr/progress.h"
 #include "utils/log.h"
 
 namespace WEZO {
@@ -78,7 +78,7 @@ bool Folder::GetAdditional(Json::Value& out, const std::string& name) const {
     return true;
   }
   if (name == "status") {
-    out = StatusMgr::GetFolderStatus(m_path);
+    out = FolderProgress(m_path);
     return true;
   }
   FILEINDEX_LOG("Unknown additional: %s", name.c_str());

@@ -12,8 +12,8 @@
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
-#include "utils/log.h"
 #include "paths.h"
+#include "utils/log.h"
 
 namespace WEZO {
 namespace FILEINDEX {

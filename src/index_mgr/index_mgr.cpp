@@ -14,14 +14,16 @@
 #include <string>
 #include <vector>
 
+#include "config/transaction.h"
 #include "fileindex/daemon.h"
 #include "fileindex/error.h"
 #include "fileindex/fileindex_c.h"
 #include "fileindex/folders.h"
 #include "fileindex/queue.h"
-#include "fileindex/status_mgr.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
+#include "layout.h"
+#include "status_mgr/status_change.h"
 #include "utils/log.h"
 #include "utils/path_rules.h"
 #include "utils/storage.h"
@@ -34,24 +36,8 @@ constexpr char kMonitorClient[] = "fileindex";
 // Every event class of the monitor except three that indexing has no use for (0x0001, 0x0010
 // and 0x0020).
 constexpr int kMonitorMask = 0xFFCE;
-constexpr char kMetadataDir[] = "@eaDir";
-constexpr char kIndexService[] = "fileindexd";
-constexpr char kSmbService[] = "samba";
 constexpr int kServiceFlags = 1;
 constexpr int kLocationSize = 4096;
-
-// Releases the folder list's lock on the way out of a scope, whichever way that is: Config's
-// destructor leaves the lock alone, and an exception must not leave it held.
-class UnlockOnExit {
- public:
-  explicit UnlockOnExit(Config& config) : m_config(config) {}
-  ~UnlockOnExit() { m_config.Unlock(); }
-  UnlockOnExit(const UnlockOnExit&) = delete;
-  UnlockOnExit& operator=(const UnlockOnExit&) = delete;
-
- private:
-  Config& m_config;
-};
 
 void RefuseRequest(int line, const Json::Value& request) {
   detail::WriteLog(false, FILEINDEX_LOG_UNIT, line, "Bad param: %s", JsonToString(request).c_str());
@@ -233,8 +219,8 @@ bool UpsertFolders(const Json::Value& request) {
     return false;
   }
   Folders list;
-  const UnlockOnExit unlock(list);
-  if (!list.Lock(true) || !list.Load()) {
+  ConfigTransaction transaction(list);
+  if (!transaction.Begin()) {
     return false;
   }
   // An element without a string "path" is left to Folders::Upsert, which refuses it in its own
@@ -264,7 +250,7 @@ bool UpsertFolders(const Json::Value& request) {
     }
     paths.push_back(path);
   }
-  if (!list.Save()) {
+  if (!transaction.Commit()) {
     return false;
   }
 
@@ -298,8 +284,8 @@ bool DeleteFolders(const Json::Value& request) {
     return false;
   }
   Folders list;
-  const UnlockOnExit unlock(list);
-  if (!list.Lock(true) || !list.Load()) {
+  ConfigTransaction transaction(list);
+  if (!transaction.Begin()) {
     return false;
   }
   PathCheck check(list);
@@ -322,7 +308,7 @@ bool DeleteFolders(const Json::Value& request) {
       return false;
     }
   }
-  if (!list.Save()) {
+  if (!transaction.Commit()) {
     return false;
   }
 
@@ -370,14 +356,14 @@ bool ReindexPaths(const Json::Value& request) {
     if (!IndexMgr::IsShareIndexed(share)) {
       return false;
     }
-    if (StatusMgr::ShareIsNoSpace(share)) {
+    if (QueryStatus([&](const Status& s) { return s.ShareIsNoSpace(share); })) {
       noSpace.insert(share);
     }
   }
   // A share out of room gets its worker back so that the reindex can run; if that fails the
   // events are queued all the same and wait for the share.
   for (const std::string& share : noSpace) {
-    if (!StatusMgr::ShareRevive(share)) {
+    if (!ReviveShare(share)) {
       FILEINDEX_LOG("ShareRevice failed, share=%s", share.c_str());
     }
   }
@@ -415,8 +401,8 @@ bool IndexMgr::List(Json::Value& result, unsigned long offset, unsigned long lim
 
 bool IndexMgr::Get(Json::Value& result, const std::string& path) {
   Folders list;
-  const UnlockOnExit unlock(list);
-  return list.Lock(true) && list.Load() && list.Get(result, path);
+  ConfigTransaction transaction(list);
+  return transaction.Begin() && list.Get(result, path);
 }
 
 bool IndexMgr::IsPathIndexed(const std::string& path, const std::vector<Folder>& folders) {
@@ -504,9 +490,9 @@ bool IndexMgr::ShareRemove(const std::string& share) {
     return false;
   }
   Folders list;
-  const UnlockOnExit unlock(list);
+  ConfigTransaction transaction(list);
   std::vector<Folder> folders;
-  if (!list.Lock(true) || !list.Load() || !list.List(folders, share)) {
+  if (!transaction.Begin() || !list.List(folders, share)) {
     return false;
   }
   Json::Value report;
@@ -515,7 +501,7 @@ bool IndexMgr::ShareRemove(const std::string& share) {
       return false;
     }
   }
-  if (!list.Save()) {
+  if (!transaction.Commit()) {
     return false;
   }
   if (HoldsNoFolder(list)) {
@@ -533,9 +519,9 @@ bool IndexMgr::ShareRename(const std::string& oldShare, const std::string& newSh
     return false;
   }
   Folders list;
-  const UnlockOnExit unlock(list);
+  ConfigTransaction transaction(list);
   std::vector<Folder> folders;
-  if (!list.Lock(true) || !list.Load() || !list.List(folders, oldShare)) {
+  if (!transaction.Begin() || !list.List(folders, oldShare)) {
     return false;
   }
   Json::Value report;
@@ -551,7 +537,7 @@ bool IndexMgr::ShareRename(const std::string& oldShare, const std::string& newSh
       return false;
     }
   }
-  return list.Save();
+  return transaction.Commit();
 }
 
 bool IndexMgr::SharePause(const std::string& share) {
@@ -594,7 +580,7 @@ bool IndexMgr::CleanShareIndexData(const std::string& share) {
   const std::string queue = location;
   // Each location is tried even when another could not be removed.
   bool removed = RemoveTree(queue);
-  removed = RemoveTree(queue + kQueueTmpSuffix) && removed;
+  removed = RemoveTree(QueueTmpOf(queue)) && removed;
   if (FILEIDXDBPathGet(share.c_str(), location, kLocationSize) < 0) {
     FILEINDEX_LOG("FILEIDXDBPathGet failed, share=%s", share.c_str());
     return false;
@@ -615,7 +601,7 @@ bool IndexMgr::UpsertWEZotifydCfg(const std::string& share) {
   }
 
   Json::Value ignore(Json::arrayValue);
-  ignore.append(kMetadataDir);
+  ignore.append(kMetadataDirName);
   Json::Value config(Json::arrayValue);
   for (const Folder& folder : folders) {
     std::string fullPath;

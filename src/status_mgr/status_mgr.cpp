@@ -1,5 +1,5 @@
-#define FILEINDEX_LOG_UNIT "status_mgr"
-
+// The status manager's operations, each one step of the status file (status_change.h) or one
+// progress report (progress.h).
 #include "fileindex/status_mgr.h"
 
 #include <json/value.h>
@@ -7,63 +7,17 @@
 #include <cstdint>
 #include <ctime>
 #include <limits>
-#include <set>
+#include <string>
 #include <vector>
 
-#include "fileindex/daemon.h"
-#include "fileindex/eligibility.h"
 #include "fileindex/error.h"
-#include "fileindex/folder.h"
-#include "fileindex/index_mgr.h"
+#include "fileindex/folders.h"
 #include "fileindex/status.h"
-#include "fileindex/utils.h"
-#include "utils/log.h"
-#include "utils/queue_reader.h"
-#include "utils/storage.h"
+#include "status_mgr/progress.h"
+#include "status_mgr/status_change.h"
 
 namespace WEZO {
 namespace FILEINDEX {
-namespace {
-
-constexpr long long kNotPaused = -1;
-constexpr char kFinished[] = "finished";
-constexpr char kProcessing[] = "processing";
-constexpr char kPaused[] = "paused";
-constexpr char kNoSpace[] = "err_no_space";
-
-// A daemon command to send once the change is saved; an empty type sends nothing.
-struct Command {
-  std::string type;
-  Json::Value data;
-};
-
-// Lock, load, change, save, tell the daemon, unlock. The daemon hears of the change only after it
-// is on disk and before other writers may change it again.
-template <typename Change>
-bool ChangeStatus(Change change, const Command& command = {}) {
-  Status status;
-  bool ok = status.Lock(true) && status.Load() && change(status) && status.Save();
-  if (ok && !command.type.empty() && !SendCammandToDaemon(command.type, command.data)) {
-    FILEINDEX_LOG("SendCammandToDaemon failed");
-    ok = false;
-  }
-  status.Unlock();
-  return ok;
-}
-
-template <typename Query>
-bool QueryStatus(Query query) {
-  Status status;
-  return status.Load() && query(status);
-}
-
-// Indexing runs unless paused without end or until a time still to come.
-const char* RunningOrPaused(long long resumeTime) {
-  return resumeTime != 0 && static_cast<long long>(time(nullptr)) >= resumeTime ? kProcessing
-                                                                                : kPaused;
-}
-
-}  // namespace
 
 bool StatusMgr::SetUpdated(const std::string& key) {
   return ChangeStatus([&](Status& s) { return s.SetUpdated(key); });
@@ -89,12 +43,7 @@ bool StatusMgr::ShareIsNoSpace(const std::string& share) {
   return QueryStatus([&](const Status& s) { return s.ShareIsNoSpace(share); });
 }
 
-bool StatusMgr::ShareRevive(const std::string& share) {
-  Json::Value data(Json::objectValue);
-  data["share_name"] = share;
-  return ChangeStatus([&](Status& s) { return s.ShareSetNoSpace(share, false); },
-                      {"revive_share_worker", data});
-}
+bool StatusMgr::ShareRevive(const std::string& share) { return ReviveShare(share); }
 
 bool StatusMgr::GetPauseInfo(long long& resumeTime) {
   return QueryStatus([&](const Status& s) { return s.GetPauseInfo(resumeTime); });
@@ -126,75 +75,20 @@ bool StatusMgr::Pause(const int& hours) {
 }
 
 bool StatusMgr::GetStatus(std::string& status) {
+  Folders list;
   std::vector<Folder> folders;
-  if (!IndexMgr::List(folders)) {
+  if (!list.Load() || !list.List(folders)) {
     return false;
   }
-  std::set<std::string> shares;
+  std::vector<std::string> paths;
+  paths.reserve(folders.size());
   for (const Folder& folder : folders) {
-    std::string share;
-    if (!GetShareNameByPath(share, folder.GetPath())) {
-      FILEINDEX_LOG("Failed to get share name from path: %s", folder.GetPath().c_str());
-      return false;
-    }
-    if (CanPathBeIndexed(folder.GetPath())) {
-      shares.insert(share);
-    }
+    paths.push_back(folder.GetPath());
   }
-
-  bool pending = false;
-  for (const std::string& share : shares) {
-    std::string queue;
-    if (!ShareQueuePath(share, queue)) {
-      FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", share.c_str());
-      return false;
-    }
-    // Existence alone counts: the daemon removes a queue it has worked through.
-    if (LocationFileExists(queue) || LocationFileExists(queue + kQueueTmpSuffix)) {
-      pending = true;
-      break;
-    }
-  }
-  if (!pending) {
-    status = kFinished;
-    return true;
-  }
-
-  long long resumeTime = kNotPaused;
-  if (!GetPauseInfo(resumeTime)) {
-    return false;
-  }
-  status = RunningOrPaused(resumeTime);
-  return true;
+  return OverallProgress(paths, status);
 }
 
-std::string StatusMgr::GetFolderStatus(const std::string& path) {
-  if (!CanPathBeIndexed(path)) {
-    return kPaused;
-  }
-  std::string share;
-  if (!GetShareNameByPath(share, path)) {
-    FILEINDEX_LOG("Failed to get share name from path: %s", path.c_str());
-    return kFinished;
-  }
-  if (ShareIsNoSpace(share)) {
-    return kNoSpace;
-  }
-  std::string queue;
-  if (!ShareQueuePath(share, queue)) {
-    FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", share.c_str());
-    return kFinished;
-  }
-  // A pause state that cannot be read counts as not paused.
-  long long resumeTime = kNotPaused;
-  if (!GetPauseInfo(resumeTime)) {
-    resumeTime = kNotPaused;
-  }
-  if (!QueueHasFolderEvent(path, queue) && !QueueHasFolderEvent(path, queue + kQueueTmpSuffix)) {
-    return kFinished;
-  }
-  return RunningOrPaused(resumeTime);
-}
+std::string StatusMgr::GetFolderStatus(const std::string& path) { return FolderProgress(path); }
 
 }  // namespace FILEINDEX
 }  // namespace WEZO

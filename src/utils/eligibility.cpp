@@ -12,6 +12,7 @@
 
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
+#include "layout.h"
 #include "utils/log.h"
 #include "utils/share_record.h"
 
@@ -20,8 +21,8 @@ namespace FILEINDEX {
 namespace {
 
 // Names that are never indexed: the index's own database and queue, and system clutter.
-const std::array<std::string, 5> kSkipNames = {".TemporaryItems", "WEZO@.fileindexdb",
-                                               "WEZO@file_index_queue", ".WEZOPPSDB", ".DS_Store"};
+const std::array<std::string, 5> kSkipNames = {".TemporaryItems", kDatabaseName, kQueueName,
+                                               ".WEZOPPSDB", ".DS_Store"};
 // Shares whose contents belong to other services and are never indexed.
 const std::array<std::string, 2> kExcludedShares = {"surveillance", "NetBackup"};
 

@@ -6,24 +6,21 @@
 #include <sys/stat.h>
 #include <unistd.h>
 #include <wezo/platform.h>
-#include <cerrno>
 
-#include <cstdlib>
 #include <string>
 
 #include "fileindex/queue.h"
-#include "fileindex/status_mgr.h"
+#include "flock.h"
 #include "json_io.h"
+#include "status_mgr/status_change.h"
+#include "unique_fd.h"
 #include "utils/log.h"
 #include "utils/queue_reader.h"
 #include "utils/storage.h"
-#include "unique_fd.h"
 
 namespace WEZO {
 namespace FILEINDEX {
 namespace {
-
-constexpr int kLockAttempts = 3;
 
 // Writes `line` at the end of the locked queue `fd` in one call. A last line without its "\n",
 // left by a writer that failed part-way, is ended first, so that the event never joins it; a
@@ -62,30 +59,26 @@ bool WriteLineAligned(int fd, const std::string& line) {
 // the line and still counts as appended: the monitor and the daemon hold the lock only briefly,
 // and a caller that is told otherwise flags the whole share for reindexing.
 bool AppendLine(const std::string& queuePath, const std::string& line) {
-  UniqueFd fd;
-  for (int attempt = 1;; ++attempt) {
+  const auto open = [&queuePath] {
     // Read as well as write: the last byte tells whether the file ends with a whole line.
-    fd = OpenLocationFile(queuePath, O_RDWR | O_CREAT | O_APPEND, 0644);
-    if (!fd) {
+    return OpenLocationFile(queuePath, O_RDWR | O_CREAT | O_APPEND, 0644);
+  };
+  UniqueFd fd;
+  switch (FlockRetrying(open, LOCK_EX, fd)) {
+    case FlockResult::kLocked:
+      break;
+    case FlockResult::kOpenFailed:
       FILEINDEX_LOG("Failed to open queue=%s, reason=%s", queuePath.c_str(),
                     detail::ErrnoText().c_str());
       return false;
-    }
-    if (flock(fd.get(), LOCK_EX | LOCK_NB) == 0) {
-      break;
-    }
-    if (errno != EINTR && errno != EWOULDBLOCK) {
+    case FlockResult::kFailed:
       FILEINDEX_LOG_DEBUG("flock fail, path=%s, reason=%s", queuePath.c_str(),
                           detail::ErrnoText().c_str());
       return false;
-    }
-    if (attempt == kLockAttempts) {
+    case FlockResult::kBusy:
       FILEINDEX_LOG_DEBUG("try lock too many times, path=%s, reason=%s", queuePath.c_str(),
                           detail::ErrnoText().c_str());
       return true;
-    }
-    fd.Close();
-    usleep(static_cast<useconds_t>(rand() % 10) * 1000);  // NOLINT(cert-msc30-c,cert-msc50-cpp)
   }
 
   // One write on an O_APPEND descriptor under the lock: lines of concurrent writers never
@@ -104,7 +97,7 @@ bool AppendEvent(const std::string& share, int event, const std::string& path,
     return false;
   }
   // A queued reindex of the path covers every other event for it.
-  if (IsReindexQueued(path, queue) || IsReindexQueued(path, queue + kQueueTmpSuffix)) {
+  if (IsReindexQueued(path, queue) || IsReindexQueued(path, QueueTmpOf(queue))) {
     return true;
   }
   Json::Value entry(Json::objectValue);
@@ -127,7 +120,7 @@ bool AddCustomEvent(const int& event, const std::string& path, const Json::Value
   }
 
   // The event is lost; indexing the whole share again from scratch makes up for it.
-  if (!StatusMgr::ShareSetNeedReindex(shareName, true)) {
+  if (!ChangeStatus([&](Status& s) { return s.ShareSetNeedReindex(shareName, true); })) {
     FILEINDEX_LOG("ShareSetNeedReindex failed, share=%s", shareName);
   }
   return false;

@@ -1,9 +1,11 @@
 // The library's one way of writing a log line.
 //
 // Every line goes to the system log at LOG_ERR as "<unit>:<line> <message>", where <unit> is the
-// source file's name without extension. A source file defines FILEINDEX_LOG_UNIT before including
-// this header. Lines written with FILEINDEX_LOG_DEBUG appear only while LOG_LEVEL is exactly 7;
-// all others appear whatever LOG_LEVEL holds. Logging never changes errno.
+// source file's name without extension, or the name of its folder for a file that serves that
+// unit (src/status_mgr/progress.cpp logs as "status_mgr"). A source file defines
+// FILEINDEX_LOG_UNIT before including this header. Lines written with FILEINDEX_LOG_DEBUG appear
+// only while LOG_LEVEL is exactly 7; all others appear whatever LOG_LEVEL holds. Logging never
+// changes errno.
 //
 // Formats are checked at compile time, which refuses syslog's %m; a line that names the reason
 // of a failed call writes "reason=%s" with ErrnoText(), which prints what %m would.

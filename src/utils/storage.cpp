@@ -91,16 +91,14 @@ int StoragePathGet(Item item, const char* name, char* out, int outLen) {
   }
   const std::string sharePath = SharePathOf(*share);
 
-  char metadataDir[4096];
-  (void)std::snprintf(metadataDir, sizeof metadataDir, "%s/%s", sharePath.c_str(),
-                      kMetadataDirName);
-  if (WEZOEAMKDir(0, metadataDir) < 0) {
+  const std::string metadataDir = MetadataDirOf(sharePath);
+  if (WEZOEAMKDir(0, metadataDir.c_str()) < 0) {
     // The caller still gets the location: the daemon or a later call may yet create it.
-    FILEINDEX_LOG("WEZOEAMKDir failed, path=%s, code=%d", metadataDir, WLIBCErrGet());
+    FILEINDEX_LOG("WEZOEAMKDir failed, path=%s, code=%d", metadataDir.c_str(), WLIBCErrGet());
   }
 
-  (void)std::snprintf(out, static_cast<size_t>(outLen), "%s/%s/%s", sharePath.c_str(),
-                      kMetadataDirName, item == Item::kQueue ? kQueueName : kDatabaseName);
+  const std::string location = item == Item::kQueue ? QueueOf(sharePath) : DatabaseOf(sharePath);
+  (void)std::snprintf(out, static_cast<size_t>(outLen), "%s", location.c_str());
   if (item == Item::kDatabase) {
     const UniqueFd metadata = OpenMetadataDir(sharePath);
     if (!metadata || !MakeDatabaseDir(metadata.get())) {

@@ -13,20 +13,11 @@
 
 #include <string>
 
+#include "layout.h"  // the names of the places below a share
 #include "unique_fd.h"
 
 namespace WEZO {
 namespace FILEINDEX {
-
-// The layout below a share's full path S:
-//   S/@eaDir                                 the platform's metadata directory
-//   S/@eaDir/WEZO@file_index_queue           the event queue
-//   S/@eaDir/WEZO@file_index_queue.tmp       its companion, made and removed by others
-//   S/@eaDir/WEZO@.fileindexdb               the index database directory
-constexpr char kMetadataDirName[] = "@eaDir";
-constexpr char kQueueName[] = "WEZO@file_index_queue";
-constexpr char kQueueTmpSuffix[] = ".tmp";
-constexpr char kDatabaseName[] = "WEZO@.fileindexdb";
 
 // The mode the database directory is given, whatever the umask: only the daemon, as root,
 // writes in it.

@@ -12,6 +12,7 @@
 #include "fileindex/folders.h"
 #include "fileindex/index_mgr.h"
 #include "fileindex/utils.h"
+#include "layout.h"
 #include "utils/log.h"
 
 namespace WEZO {
@@ -25,7 +26,7 @@ bool Updater_hxo60_beta2() {  // NOLINT(readability-identifier-naming)
     return false;
   }
   if (folders.empty()) {
-    if (WLIBServiceStop("fileindexd", 1) < 0) {
+    if (WLIBServiceStop(kIndexService, 1) < 0) {
       // A failed stop is reported with the start message, as this step always has; keep it.
       FILEINDEX_LOG_PLATFORM_FAILURE("WLIBServiceStart");
       return false;
@@ -33,7 +34,7 @@ bool Updater_hxo60_beta2() {  // NOLINT(readability-identifier-naming)
     return true;
   }
 
-  if (WLIBServiceStart("fileindexd", 1) < 0) {
+  if (WLIBServiceStart(kIndexService, 1) < 0) {
     FILEINDEX_LOG_PLATFORM_FAILURE("WLIBServiceStart");
     return false;
   }
