@@ -44,6 +44,8 @@ void AddServiceCommands(CLI::App& app, Context& ctx);
 void AddShareCommands(CLI::App& app, Context& ctx);
 // is-indexed path|full-path|share, storage, explain.
 void AddQuestionCommands(CLI::App& app, Context& ctx);
+// check [--repair].
+void AddCheckCommand(CLI::App& app, Context& ctx);
 
 // Makes the one library call of a change command. `describe`, asked after the call, says what it
 // changed (on failure: what it saved, when the log names one of `steps` as the failing step).

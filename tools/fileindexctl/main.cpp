@@ -110,6 +110,7 @@ class Tool {
     AddServiceCommands(m_app, m_ctx);
     AddShareCommands(m_app, m_ctx);
     AddQuestionCommands(m_app, m_ctx);
+    AddCheckCommand(m_app, m_ctx);
     // Set last, so that the subcommands' help does not repeat it.
     m_app.footer(kFooter);
   }
