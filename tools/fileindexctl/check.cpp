@@ -459,8 +459,8 @@ void AddCheckCommand(CLI::App& app, Context& ctx) {
   const auto args = std::make_shared<CheckArgs>();
   CLI::App* check = AddCommand(
       app, ctx, "check",
-      "check that the monitor's registrations, the service, Spotlight, the share flags, the "
-      "configuration's temporary files and the folders' directories agree with the list",
+      "check that what derives from the folder list agrees with it: the monitor's registrations, "
+      "the service, Spotlight, share flags, temporary files, the folders' directories",
       [&ctx, args] { return RunCheck(ctx, *args); });
   check->add_flag("--repair", args->repair,
                   "bring what disagrees back in line and say what changed; exit 1 when "

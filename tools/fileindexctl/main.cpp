@@ -20,7 +20,8 @@ namespace {
 constexpr char kFooter[] =
     "Exit status: 0 done; 1 the library refused or failed the operation (the message names its "
     "error code), or --strict met a warning; 2 usage error. \"is-indexed -q\" answers by exit "
-    "status: 0 indexed, 1 not.";
+    "status: 0 indexed, 1 not. \"check\" exits 1 when something disagrees (with --repair: when "
+    "something is left).";
 
 class Tool {
  public:
@@ -90,8 +91,8 @@ class Tool {
 
   void Build() {
     m_app.description(
-        "Administer the file-index service: indexed folders, pausing, share flags and "
-        "questions.");
+        "Administer the file-index service: indexed folders, pausing, share flags, questions "
+        "and a consistency check.");
     m_app.require_subcommand(1);
     // Subcommands pass the options they do not know to the tool, so --json may follow them.
     m_app.fallthrough();
