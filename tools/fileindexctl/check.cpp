@@ -88,8 +88,9 @@ std::string Canonical(Json::Value value) {
 std::string DecodeName(const std::string& name) {
   std::string out;
   for (size_t i = 0; i < name.size(); ++i) {
-    if (name[i] == '%' && i + 2 < name.size() && std::isxdigit(name[i + 1]) != 0 &&
-        std::isxdigit(name[i + 2]) != 0) {
+    if (name[i] == '%' && i + 2 < name.size() &&
+        std::isxdigit(static_cast<unsigned char>(name[i + 1])) != 0 &&
+        std::isxdigit(static_cast<unsigned char>(name[i + 2])) != 0) {
       out += static_cast<char>(std::stoi(name.substr(i + 1, 2), nullptr, 16));
       i += 2;
     } else {
@@ -108,19 +109,21 @@ std::map<std::string, Json::Value> ReadRegistrations() {
   if (stream == nullptr) {
     return entries;
   }
+  const std::string prefix = dir + "/";
   const std::string suffix = ".json";
   while (const dirent* entry = readdir(stream)) {
     const std::string name = entry->d_name;
+    const std::string path = prefix + name;
     struct stat st {};
     if (name.size() <= suffix.size() ||
         name.compare(name.size() - suffix.size(), suffix.size(), suffix) != 0 ||
-        lstat((dir + "/" + name).c_str(), &st) != 0 || !S_ISREG(st.st_mode)) {
+        lstat(path.c_str(), &st) != 0 || !S_ISREG(st.st_mode)) {
       continue;
     }
     Json::Value value;
     Json::CharReaderBuilder builder;
     std::string errors;
-    std::ifstream in(dir + "/" + name, std::ios::binary);
+    std::ifstream in(path, std::ios::binary);
     if (!Json::parseFromStream(builder, in, &value, &errors)) {
       value = Json::Value();
     }
@@ -342,15 +345,18 @@ void CheckTemporaries(Findings& found) {
     if (!config->Lock(false)) {
       found.push_back({"lock_busy",
                        file,
-                       "the lock of " + file + " is busy; its temporary files were not looked at",
+                       "the lock of " + file +
+                           " cannot be taken (busy, or its file unusable); its temporary files "
+                           "were not looked at",
                        "--repair leaves it: run the check again",
                        {}});
       continue;
     }
     if (DIR* stream = opendir(dir.c_str())) {
+      const std::string prefix = dir + "/";
       while (const dirent* entry = readdir(stream)) {
         const std::string name = entry->d_name;
-        const std::string temporary = dir + "/" + name;
+        const std::string temporary = prefix + name;
         struct stat st {};
         if (IsTemporaryOf(name, file) && lstat(temporary.c_str(), &st) == 0 &&
             S_ISREG(st.st_mode)) {
