@@ -16,6 +16,7 @@
 #include <csignal>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <memory>
 #include <sstream>
 #include <string>
@@ -493,6 +494,107 @@ TEST_F(FileindexctlTest, ExplainNamesTheDecidingRule) {
             "path: /photo/link\nfull path: " + At("volume1/photo/link") + "\nmay be indexed: no, " +
                 fi::DescribeIndexRule(fi::IndexRule::kResolvesElsewhere) +
                 "\nin an indexed folder: no\n");
+}
+
+TEST_F(FileindexctlTest, CheckFindsEachDisagreementAndRepairBringsItBackInLine) {
+  AddFolders();
+  const std::string registry = At("var/lib/wezotifyd/fileindex");
+  const std::string config = "usr/wezo/etc/fileindex/";
+  // The registration file of the share `share`: its name is the encoded queue path.
+  const auto registration = [&](const std::string& share) {
+    for (const auto& entry : fs::directory_iterator(registry)) {
+      if (entry.path().filename().string().find("%2F" + share + "%2F") != std::string::npos) {
+        return entry.path().string();
+      }
+    }
+    return std::string();
+  };
+  const Result agree = Run({"check"});
+  EXPECT_EQ(agree.status, 0) << agree.out << agree.err;
+  EXPECT_EQ(agree.out, "everything agrees with the list of indexed folders\n");
+  ASSERT_FALSE(registration("photo").empty());
+
+  struct Case {
+    std::function<void()> plant;
+    std::string kind;
+    std::string line;               // expected in check's output
+    bool repaired;                  // check --repair leaves everything in agreement
+    std::function<void()> after{};  // between the repair and the last check
+  };
+  const std::vector<Case> cases = {
+      {[&] { fs::remove(registration("photo")); }, "registration_missing",
+       "registration_missing: share photo has 1 indexed folder but no monitor registration; "
+       "--repair would register the share's indexed folders with the monitor again",
+       true},
+      // Same queue, one folder more than the share has: compared by content, not by presence.
+      {[&] {
+         Json::Value entry = Parse(Slurp(registration("video")));
+         entry["config"].append(entry["config"][0]);
+         entry["config"][1]["path"] = At("volume1/video/other");
+         std::ofstream(registration("video"), std::ios::trunc) << entry.toStyledString();
+       },
+       "registration_differs", "the monitor registration of share video does not list", true},
+      {[&] { Write("var/lib/wezotifyd/fileindex/%2Fgone%2Fqueue.json", "{}"); },
+       "registration_extra",
+       "registration_extra: a monitor registration for the queue /gone/queue belongs to no share",
+       true},
+      {[&] { Write("unit.state", "inactive\n"); }, "service_stopped",
+       "2 folders are indexed, but the service fileindexd.service is inactive; --repair would "
+       "start",
+       true},
+      // The stand-in service manager cannot bring the stand-in daemon back: the test does.
+      {[&] { StopDaemon(); }, "daemon_silent",
+       "daemon_silent: the service is active, but the daemon does not answer on " +
+           At("var/run/fileindexd.sock"),
+       false,
+       [&] {
+         EXPECT_NE(Read("services.log").find("restart fileindexd.service"), std::string::npos);
+         StartDaemon();
+       }},
+      {[&] {
+         std::string conf = Read("etc/samba/smb.conf");
+         conf.replace(conf.find("spotlight = yes"), 15, "spotlight = no");
+         Write("etc/samba/smb.conf", conf);
+       },
+       "spotlight", "spotlight: Spotlight over SMB is off, but 2 folders are indexed", true},
+      {[&] { Write(config + "status.conf", R"({"need_reindex": {"photo": true, "gone": true}})"); },
+       "flag_of_gone_share",
+       "status.conf holds the need_reindex flag of gone, which is no share; --repair would clear",
+       true, [&] { EXPECT_TRUE(fi::StatusMgr::ShareIsNeedReindex("photo")); }},
+      // Only regular files of mkstemp's pattern are temporaries.
+      {[&] {
+         Write(config + "folder.conf.a1B2c3", "{");
+         Write(config + "status.conf.abcdefg", "{");
+         fs::create_directory(At(config + "status.conf.Zz9Zz9"));
+       },
+       "stale_temporary",
+       At(config + "folder.conf.a1B2c3") + " is a temporary file that a killed writer", true,
+       [&] {
+         EXPECT_TRUE(fs::exists(At(config + "status.conf.abcdefg")));
+         EXPECT_TRUE(fs::exists(At(config + "status.conf.Zz9Zz9")));
+       }},
+      {[&] { fs::remove_all(At("volume1/video/movies")); }, "no_directory",
+       "does not exist; --repair leaves it: create the directory, or stop indexing it", false,
+       [&] { fs::create_directories(At("volume1/video/movies")); }},
+  };
+  for (const Case& c : cases) {
+    c.plant();
+    const Result found = Run({"check"});
+    EXPECT_EQ(found.status, 1) << c.kind;
+    EXPECT_NE(found.out.find(c.line), std::string::npos) << c.kind << "\n" << found.out;
+    const Result json = Run({"--json", "check"});
+    const Json::Value findings = Parse(json.out)["findings"];
+    EXPECT_EQ(findings.size(), 1U) << json.out;
+    EXPECT_EQ(findings[0]["kind"], c.kind);
+    const Result repair = Run({"check", "--repair"});
+    EXPECT_EQ(repair.status, c.repaired ? 0 : 1) << c.kind << "\n" << repair.out << repair.err;
+    EXPECT_EQ(repair.out.find("left: ") != std::string::npos, !c.repaired) << repair.out;
+    if (c.after) {
+      c.after();
+    }
+    const Result last = Run({"check"});
+    EXPECT_EQ(last.status, 0) << c.kind << "\n" << last.out << last.err;
+  }
 }
 
 }  // namespace

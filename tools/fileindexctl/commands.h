@@ -1,5 +1,6 @@
-// The subcommands of fileindexctl, one function each, grouped as the help groups them: folders,
-// the service's state, shares, and questions. Each returns the tool's exit status.
+// The subcommands of fileindexctl, grouped as the help groups them: folders, the service's state,
+// shares, questions, and the consistency check. Each group registers its own subcommands and owns
+// their arguments; a subcommand's run returns the tool's exit status.
 //
 // A change command first checks what the library would accept without doing what the user
 // expects (a path not in the list, an unknown share, a folder that cannot be indexed) and warns;
@@ -10,7 +11,6 @@
 
 #include <fileindex/fileindex.h>
 
-#include <climits>
 #include <functional>
 #include <string>
 #include <vector>
@@ -18,13 +18,34 @@
 #include "output.h"
 #include "state.h"
 
+namespace CLI {
+class App;
+}  // namespace CLI
+
 namespace fileindexctl {
 
-// What every subcommand gets: where to print, and whether to pass the library's log on.
+// What every subcommand gets: where to print, and whether to pass the library's log on. `run` is
+// set by the subcommand the parse chose.
 struct Context {
   Output& out;
   bool verbose;
+  std::function<int()> run;
 };
+
+// Registers the subcommand `name` of `parent`; when the parse chooses it, `run` is what runs.
+CLI::App* AddCommand(CLI::App& parent, Context& ctx, const std::string& name,
+                     const std::string& description, std::function<int()> run);
+
+// list, get, add (set), remove, reindex, update.
+void AddFolderCommands(CLI::App& app, Context& ctx);
+// status, pause, resume, migrate.
+void AddServiceCommands(CLI::App& app, Context& ctx);
+// share remove|pause|resume|clean|revive|rename|no-space|need-reindex.
+void AddShareCommands(CLI::App& app, Context& ctx);
+// is-indexed path|full-path|share, storage, explain.
+void AddQuestionCommands(CLI::App& app, Context& ctx);
+// check [--repair].
+void AddCheckCommand(CLI::App& app, Context& ctx);
 
 // Makes the one library call of a change command. `describe`, asked after the call, says what it
 // changed (on failure: what it saved, when the log names one of `steps` as the failing step).
@@ -35,61 +56,6 @@ int RunCall(const Context& ctx, const std::string& what, const Steps& steps,
 
 // True when `path` is itself an entry of `folders`.
 bool IsListed(const std::string& path, const std::vector<WEZO::FILEINDEX::Folder>& folders);
-
-// ---- folders ----
-
-struct ListArgs {
-  unsigned long offset = 0;
-  unsigned long limit = ULONG_MAX;
-  std::string sortBy = "path";
-  bool descending = false;
-  std::vector<std::string> additional;
-};
-
-struct AddArgs {
-  std::string path;
-  std::string name;
-  bool document = false;
-  bool audio = false;
-  bool video = false;
-  bool photo = false;
-  std::string request;
-};
-
-int RunList(const Context& ctx, const ListArgs& args);
-int RunGet(const Context& ctx, const std::string& path);
-int RunAdd(const Context& ctx, const AddArgs& args);
-int RunRemove(const Context& ctx, const std::vector<std::string>& paths);
-int RunReindex(const Context& ctx, const std::vector<std::string>& paths);
-int RunUpdate(const Context& ctx, const std::string& path, const std::string& data);
-
-// Parses a JSON argument strictly; text that is not JSON, or JSON nested too deep, is a usage
-// error (CLI::ValidationError).
-Json::Value ParseJsonArgument(const std::string& option, const std::string& text);
-
-// ---- the service's state ----
-
-int RunStatus(const Context& ctx, const std::vector<std::string>& paths);
-int RunPause(const Context& ctx, int hours);
-int RunResume(const Context& ctx);
-int RunMigrate(const Context& ctx);
-
-// ---- shares ----
-
-// A share operation of the lifecycle or a per-share flag, by the name the tool gives it.
-int RunShareOperation(const Context& ctx, const std::string& operation, const std::string& share);
-int RunShareRename(const Context& ctx, const std::string& oldShare, const std::string& newShare);
-// Shows the flag ("no-space", "need-reindex") when `value` is empty, else sets ("on") or clears it.
-int RunShareFlag(const Context& ctx, const std::string& flag, const std::string& share,
-                 const std::string& value);
-
-// ---- questions ----
-
-// The C interface's answer; with `quiet` only the exit status says it (0 indexed, 1 not).
-int RunIsIndexed(const Context& ctx, const std::string& question, const std::string& argument,
-                 bool quiet);
-int RunStorage(const Context& ctx, const std::string& share);
-int RunExplain(const Context& ctx, const std::string& path, bool fullPathGiven);
 
 }  // namespace fileindexctl
 

@@ -4,6 +4,7 @@
 
 #include <CLI/CLI.hpp>
 #include <algorithm>
+#include <climits>
 #include <iostream>
 #include <memory>
 #include <set>
@@ -91,13 +92,6 @@ void CheckEventTarget(Output& out, const std::string& path,
                "nothing");
 }
 
-}  // namespace
-
-bool IsListed(const std::string& path, const std::vector<fi::Folder>& folders) {
-  return std::any_of(folders.begin(), folders.end(),
-                     [&](const fi::Folder& folder) { return folder.GetPath() == path; });
-}
-
 Json::Value ParseJsonArgument(const std::string& option, const std::string& text) {
   Json::CharReaderBuilder builder;
   Json::CharReaderBuilder::strictMode(&builder.settings_);
@@ -116,6 +110,33 @@ Json::Value ParseJsonArgument(const std::string& option, const std::string& text
   }
   return value;
 }
+
+// The folder commands' arguments.
+struct ListArgs {
+  unsigned long offset = 0;
+  unsigned long limit = ULONG_MAX;
+  std::string sortBy = "path";
+  bool descending = false;
+  std::vector<std::string> additional;
+};
+
+struct AddArgs {
+  std::string path;
+  std::string name;
+  bool document = false;
+  bool audio = false;
+  bool video = false;
+  bool photo = false;
+  std::string request;
+};
+
+struct FolderArgs {
+  ListArgs list;
+  AddArgs add;
+  std::string path;                // get, update
+  std::vector<std::string> paths;  // remove, reindex
+  std::string data = "{}";         // update
+};
 
 int RunList(const Context& ctx, const ListArgs& args) {
   Json::Value page;
@@ -284,6 +305,58 @@ int RunUpdate(const Context& ctx, const std::string& path, const std::string& da
         return std::vector<Change>{
             {"update_queued", path, "queued an update of " + Printable(path)}};
       });
+}
+
+}  // namespace
+
+void AddFolderCommands(CLI::App& app, Context& ctx) {
+  const auto args = std::make_shared<FolderArgs>();
+  CLI::App* list = AddCommand(app, ctx, "list", "list the indexed folders, one page at a time",
+                              [&ctx, args] { return RunList(ctx, args->list); });
+  list->add_option("--offset", args->list.offset, "skip this many folders")->capture_default_str();
+  list->add_option("--limit", args->list.limit, "show at most this many folders (default: all)");
+  list->add_option("--sort-by", args->list.sortBy, "sort key")
+      ->check(CLI::IsMember({"path", "name", "document", "audio", "video", "photo"}))
+      ->capture_default_str();
+  list->add_flag("--desc", args->list.descending,
+                 "descending: the ascending page at offset 0, reversed (the library's paging)");
+  list->add_option("-a,--additional", args->list.additional, "add a value per folder")
+      ->check(CLI::IsMember({"status", "is_valid"}))
+      ->delimiter(',');
+
+  CLI::App* get = AddCommand(app, ctx, "get", "show one indexed folder",
+                             [&ctx, args] { return RunGet(ctx, args->path); });
+  get->add_option("PATH", args->path, "share path of the folder (/photo/2019)")->required();
+
+  CLI::App* add = AddCommand(app, ctx, "add",
+                             "add a folder, or change a listed one (settings not given return to "
+                             "their defaults); warns when the folder cannot be indexed",
+                             [&ctx, args] { return RunAdd(ctx, args->add); });
+  add->alias("set");
+  CLI::Option* path = add->add_option("PATH", args->add.path, "share path of the folder");
+  CLI::Option* request = add->add_option("--request", args->add.request,
+                                         "a JSON array of folder descriptions instead of PATH");
+  path->excludes(request);
+  add->add_option("--name", args->add.name, "display name")->needs(path);
+  for (auto [flag, value] :
+       {std::pair{"--document", &args->add.document}, std::pair{"--audio", &args->add.audio},
+        std::pair{"--video", &args->add.video}, std::pair{"--photo", &args->add.photo}}) {
+    add->add_flag(flag, *value, std::string("index ") + (flag + 2) + " files")->needs(path);
+  }
+
+  CLI::App* remove =
+      AddCommand(app, ctx, "remove", "stop indexing folders; warns of unlisted paths",
+                 [&ctx, args] { return RunRemove(ctx, args->paths); });
+  remove->add_option("PATH", args->paths, "share paths of listed folders")->required();
+
+  CLI::App* reindex = AddCommand(app, ctx, "reindex", "queue a full reindex of paths",
+                                 [&ctx, args] { return RunReindex(ctx, args->paths); });
+  reindex->add_option("PATH", args->paths, "share paths in indexed shares")->required();
+
+  CLI::App* update = AddCommand(app, ctx, "update", "queue an update event for a path",
+                                [&ctx, args] { return RunUpdate(ctx, args->path, args->data); });
+  update->add_option("PATH", args->path, "share path")->required();
+  update->add_option("--data", args->data, "the event's JSON payload")->capture_default_str();
 }
 
 }  // namespace fileindexctl

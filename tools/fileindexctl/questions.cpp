@@ -1,8 +1,10 @@
 // Questions: is-indexed through the C interface, storage locations, and explain.
 #include <fileindex/fileindex_c.h>
 
+#include <CLI/CLI.hpp>
 #include <climits>
 #include <iostream>
+#include <memory>
 
 #include "commands.h"
 
@@ -39,8 +41,6 @@ void ResolveBoth(const std::string& path, bool fullPathGiven, std::string& share
     sharePath = "/" + shareName + path.substr(shareRoot.size());
   }
 }
-
-}  // namespace
 
 int RunIsIndexed(const Context& ctx, const std::string& question, const std::string& argument,
                  bool quiet) {
@@ -123,6 +123,48 @@ int RunExplain(const Context& ctx, const std::string& path, bool fullPathGiven) 
             << "\nin an indexed folder: "
             << (holder.empty() ? "no" : "yes (" + Printable(holder) + ")") << '\n';
   return 0;
+}
+
+}  // namespace
+
+void AddQuestionCommands(CLI::App& app, Context& ctx) {
+  struct QuestionArgs {
+    std::string argument;   // is-indexed, explain
+    std::string share;      // storage
+    bool quiet = false;     // is-indexed
+    bool fullPath = false;  // explain
+  };
+  const auto args = std::make_shared<QuestionArgs>();
+  CLI::App* isIndexed = app.add_subcommand(
+      "is-indexed", "ask the C interface what is indexed (-q: answer by exit status)");
+  isIndexed->require_subcommand(1);
+  isIndexed->add_flag("-q,--quiet", args->quiet, "print nothing; exit 0 when indexed, 1 when not");
+  for (const auto& [name, argument] : {
+           std::pair{"path", "share path (/photo/2019)"},
+           std::pair{"full-path", "full path (/volume1/photo/2019)"},
+           std::pair{"share", "share name (photo)"},
+       }) {
+    const std::string question = name;
+    CLI::App* command =
+        AddCommand(*isIndexed, ctx, name, std::string("is this ") + argument + " indexed",
+                   [&ctx, args, question] {
+                     return RunIsIndexed(ctx, question, args->argument, args->quiet);
+                   });
+    command->add_option("ARG", args->argument, argument)->required();
+  }
+
+  CLI::App* storage =
+      AddCommand(app, ctx, "storage", "show where a share keeps its queue and index",
+                 [&ctx, args] { return RunStorage(ctx, args->share); });
+  storage->add_option("NAME", args->share, "share name")->required();
+
+  CLI::App* explain =
+      AddCommand(app, ctx, "explain",
+                 "say whether a path may be indexed, which rule decides, "
+                 "and whether an indexed folder holds it",
+                 [&ctx, args] { return RunExplain(ctx, args->argument, args->fullPath); });
+  explain->add_option("PATH", args->argument, "share path, or full path")->required();
+  explain->add_flag("--full-path", args->fullPath, "PATH is a full path");
 }
 
 }  // namespace fileindexctl

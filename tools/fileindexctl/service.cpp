@@ -1,13 +1,36 @@
 // The service's state: status, pause, resume, migrate; and the one way a change command calls
 // the library.
+#include <CLI/CLI.hpp>
+#include <algorithm>
 #include <ctime>
 #include <iostream>
+#include <memory>
 
 #include "commands.h"
 
 namespace fi = WEZO::FILEINDEX;
 
 namespace fileindexctl {
+
+int RunCall(const Context& ctx, const std::string& what, const Steps& steps,
+            const std::function<bool()>& operation,
+            const std::function<std::vector<Change>()>& describe, const std::string& noCode) {
+  // The checks before the call may have left a code; a failure must show the call's own.
+  fi::ErrorHandler::SetError(fi::FILEINDEX_ERR_NONE);
+  LibraryCall call(ctx.verbose);
+  const bool ok = operation();
+  call.Stop();
+  if (ok) {
+    return ctx.out.Done(describe());
+  }
+  const Aftermath aftermath = Diagnose(call, steps, describe());
+  return ctx.out.Fail(what, noCode, &aftermath);
+}
+
+bool IsListed(const std::string& path, const std::vector<fi::Folder>& folders) {
+  return std::any_of(folders.begin(), folders.end(),
+                     [&](const fi::Folder& folder) { return folder.GetPath() == path; });
+}
 
 namespace {
 
@@ -36,23 +59,6 @@ std::string PauseText(long long resumeTime) {
 // Nothing is processed while the daemon is away, whatever the queues hold.
 std::string Shown(const std::string& status, bool daemonAnswers) {
   return status == "processing" && !daemonAnswers ? "stalled" : status;
-}
-
-}  // namespace
-
-int RunCall(const Context& ctx, const std::string& what, const Steps& steps,
-            const std::function<bool()>& operation,
-            const std::function<std::vector<Change>()>& describe, const std::string& noCode) {
-  // The checks before the call may have left a code; a failure must show the call's own.
-  fi::ErrorHandler::SetError(fi::FILEINDEX_ERR_NONE);
-  LibraryCall call(ctx.verbose);
-  const bool ok = operation();
-  call.Stop();
-  if (ok) {
-    return ctx.out.Done(describe());
-  }
-  const Aftermath aftermath = Diagnose(call, steps, describe());
-  return ctx.out.Fail(what, noCode, &aftermath);
 }
 
 int RunStatus(const Context& ctx, const std::vector<std::string>& paths) {
@@ -144,6 +150,32 @@ int RunMigrate(const Context& ctx) {
       [] {
         return std::vector<Change>{{"migrated", "configuration", "migration done"}};
       });
+}
+
+}  // namespace
+
+void AddServiceCommands(CLI::App& app, Context& ctx) {
+  struct ServiceArgs {
+    std::vector<std::string> paths;  // status
+    int hours = 0;                   // pause
+  };
+  const auto args = std::make_shared<ServiceArgs>();
+  CLI::App* status = AddCommand(app, ctx, "status",
+                                "show the indexing status, whether the daemon answers, the "
+                                "service's state, and the status of the folders given",
+                                [&ctx, args] { return RunStatus(ctx, args->paths); });
+  status->add_option("PATH", args->paths, "share paths of indexed folders");
+
+  CLI::App* pause = AddCommand(app, ctx, "pause", "pause indexing",
+                               [&ctx, args] { return RunPause(ctx, args->hours); });
+  pause->add_option("HOURS", args->hours, "resume by itself after this many hours (0: never)")
+      ->capture_default_str();
+
+  AddCommand(app, ctx, "resume", "resume indexing", [&ctx] { return RunResume(ctx); });
+
+  AddCommand(app, ctx, "migrate",
+             "run the upgrade step that brings everything in line with the list",
+             [&ctx] { return RunMigrate(ctx); });
 }
 
 }  // namespace fileindexctl

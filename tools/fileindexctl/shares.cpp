@@ -2,8 +2,10 @@
 // per-share flags.
 #include <fileindex/fileindex_c.h>
 
+#include <CLI/CLI.hpp>
 #include <climits>
 #include <iostream>
+#include <memory>
 
 #include "commands.h"
 
@@ -67,8 +69,6 @@ const Flag kFlags[] = {
     {"need-reindex", "need_reindex", fi::StatusMgr::ShareSetNeedReindex,
      fi::StatusMgr::ShareIsNeedReindex},
 };
-
-}  // namespace
 
 int RunShareOperation(const Context& ctx, const std::string& operation, const std::string& share) {
   const std::string what = "share " + operation + " " + share;
@@ -178,6 +178,50 @@ int RunShareFlag(const Context& ctx, const std::string& flag, const std::string&
         change.extra["flag"] = entry->key;
         return std::vector<Change>{change};
       });
+}
+
+}  // namespace
+
+void AddShareCommands(CLI::App& app, Context& ctx) {
+  struct ShareArgs {
+    std::string share;     // every share command
+    std::string newShare;  // rename
+    std::string flag;      // no-space, need-reindex
+  };
+  const auto args = std::make_shared<ShareArgs>();
+  CLI::App* share = app.add_subcommand("share", "share lifecycle and per-share flags");
+  share->require_subcommand(1);
+
+  for (const auto& [name, description] : {
+           std::pair{"remove", "the share was removed: drop its folders"},
+           std::pair{"pause", "the share went offline"},
+           std::pair{"resume", "the share is back"},
+           std::pair{"clean", "remove the share's queue and index database"},
+           std::pair{"revive", "clear the no-space flag and restart the share's worker"},
+       }) {
+    const std::string operation = name;
+    CLI::App* command = AddCommand(*share, ctx, name, description, [&ctx, args, operation] {
+      return RunShareOperation(ctx, operation, args->share);
+    });
+    command->add_option("NAME", args->share, "share name")->required();
+  }
+
+  CLI::App* rename = AddCommand(
+      *share, ctx, "rename",
+      "the share was renamed: move its folders (only the list changes; pause the share before "
+      "the rename and resume it under its new name)",
+      [&ctx, args] { return RunShareRename(ctx, args->share, args->newShare); });
+  rename->add_option("OLD", args->share, "old share name")->required();
+  rename->add_option("NEW", args->newShare, "new share name")->required();
+
+  for (const char* flag : {"no-space", "need-reindex"}) {
+    const std::string name = flag;
+    CLI::App* command =
+        AddCommand(*share, ctx, flag, "show, set (on) or clear (off) the flag",
+                   [&ctx, args, name] { return RunShareFlag(ctx, name, args->share, args->flag); });
+    command->add_option("NAME", args->share, "share name")->required();
+    command->add_option("VALUE", args->flag, "on or off")->check(CLI::IsMember({"on", "off"}));
+  }
 }
 
 }  // namespace fileindexctl
