@@ -14,6 +14,7 @@
 #include <thread>
 #include <vector>
 
+#include "json_io.h"
 #include "sandbox.h"
 
 namespace {
@@ -169,6 +170,34 @@ TEST_F(WezotifydTest, StopsWritingToAQueueOnceItsRegistrationIsRemoved) {
   Create(Folder(2) + "/y");
   ASSERT_TRUE(WaitFor([&] { return QueueText(2).find(Folder(2) + "/y") != std::string::npos; }));
   EXPECT_FALSE(std::filesystem::exists(Queue(1)));
+}
+
+TEST_F(WezotifydTest, FlagsTheShareForAReindexWhenTheKernelDropsEvents) {
+  Write("etc/samba/smb.conf", "[s1]\n\tpath = " + At("volume1/s1") + "\n");
+  const timespec old[2] = {{time(nullptr) - 10, 0}, {time(nullptr) - 10, 0}};
+  ASSERT_EQ(utimensat(AT_FDCWD, At("etc/samba/smb.conf").c_str(), old, 0), 0);
+  std::filesystem::create_directories(At("tmp"));
+  std::filesystem::create_directories(At("usr/wezo/etc/fileindex"));
+  Register(1);
+  Start();
+  ASSERT_TRUE(WaitForLog("for 1 queues"));
+  // Writes to two files in turn: the kernel merges only an event equal to the one before it.
+  int queued = 0;
+  std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> queued;
+  const int fds[] = {open((Folder(1) + "/a").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644),
+                     open((Folder(1) + "/b").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644)};
+  kill(pid_, SIGSTOP);
+  for (int i = 0; i <= queued; ++i) {
+    ASSERT_EQ(pwrite(fds[i % 2], "x", 1, 0), 1);
+  }
+  close(fds[0]);
+  close(fds[1]);
+  kill(pid_, SIGCONT);
+  Json::Value status;
+  EXPECT_TRUE(WaitFor([&] {
+    return WEZO::FILEINDEX::JsonFromFile(status, At("usr/wezo/etc/fileindex/status.conf")) &&
+           status["need_reindex"]["s1"] == true;
+  })) << Read("log");
 }
 
 TEST_F(WezotifydTest, RefusesAQueueThatIsNotARegularFileOfItsOwnFolder) {

@@ -20,7 +20,8 @@ namespace {
 
 void FlagForReindex(const std::string& queue, const std::string& /*why*/) {
   std::string share;
-  if (!WEZO::FILEINDEX::GetShareNameByPath(share, queue) ||
+  std::string sharePath;
+  if (!WEZO::FILEINDEX::GetShareNamePathByFullPath(share, sharePath, queue) ||
       !WEZO::FILEINDEX::StatusMgr::ShareSetNeedReindex(share, true)) {
     (void)std::fprintf(stderr, "wezotifyd: cannot flag the share of %s for a reindex\n",
                        queue.c_str());

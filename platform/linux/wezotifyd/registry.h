@@ -23,7 +23,7 @@ struct Registration {
   std::string file;   // the registration file, for the log
   std::string queue;  // where the events go
   std::vector<Tree> trees;
-  bool flagged = false;  // already sent for a full reindex since it was loaded
+  bool flagged = false;  // already sent for a full reindex in this batch of events
 
   // The first tree that holds `path` (a tree's own folder counts), or nullptr.
   const Tree* TreeOf(const std::string& path) const;

@@ -120,6 +120,7 @@ void Watcher::Reload() {
 // Brings the watches in line with the registrations: every folder of every tree is watched with
 // the union of the classes asked for; folders no tree holds any more are let go.
 void Watcher::Resync() {
+  ClearFlags();
   m_mask = kStructural;
   for (const Registration& registration : m_registrations) {
     for (const Tree& tree : registration.trees) {
@@ -271,6 +272,7 @@ void Watcher::ReadRegistryEvents() {
 }
 
 void Watcher::ReadTreeEvents() {
+  ClearFlags();
   alignas(inotify_event) char buffer[65536];
   for (;;) {
     const ssize_t got = read(m_tree.get(), buffer, sizeof buffer);
@@ -408,6 +410,14 @@ void Watcher::Emit(uint32_t event, const std::string& path, uint32_t filterBit) 
     if (tree != nullptr && (tree->mask & filterBit) != 0) {
       m_lines[registration.queue].push_back(Line(event, path, ""));
     }
+  }
+}
+
+// A share is flagged at most once per batch of events or resync: a watch limit reached fails
+// every folder that follows.
+void Watcher::ClearFlags() {
+  for (Registration& registration : m_registrations) {
+    registration.flagged = false;
   }
 }
 

@@ -55,6 +55,7 @@ class Watcher {
   void Renamed(const PendingMove& move, const std::string& to);
   void MovedIn(const std::string& path, bool isDir);
   void Emit(uint32_t event, const std::string& path, uint32_t filterBit);
+  void ClearFlags();
   void Flag(Registration& registration, const std::string& why);
   void Flush();
 
