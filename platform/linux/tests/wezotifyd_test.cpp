@@ -2,6 +2,7 @@
 // own sandbox root; registrations are written through the platform's client API.
 #include <fcntl.h>
 #include <spawn.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -170,6 +171,20 @@ TEST_F(WezotifydTest, StopsWritingToAQueueOnceItsRegistrationIsRemoved) {
   Create(Folder(2) + "/y");
   ASSERT_TRUE(WaitFor([&] { return QueueText(2).find(Folder(2) + "/y") != std::string::npos; }));
   EXPECT_FALSE(std::filesystem::exists(Queue(1)));
+}
+
+TEST_F(WezotifydTest, WritesToANewQueueWhenTheOneItWaitedForIsTaken) {
+  Register(1);
+  Start();
+  ASSERT_TRUE(WaitForLog("for 1 queues"));
+  // The consumer holds the queue's lock while the change comes, then takes the queue away.
+  const int taken = open(Queue(1).c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644);
+  ASSERT_EQ(flock(taken, LOCK_EX), 0);
+  Create(Folder(1) + "/x");
+  std::this_thread::sleep_for(std::chrono::milliseconds(100));  // lets the daemon reach the lock
+  ASSERT_EQ(unlink(Queue(1).c_str()), 0);
+  close(taken);
+  EXPECT_TRUE(WaitFor([&] { return QueueText(1).find(Folder(1) + "/x") != std::string::npos; }));
 }
 
 TEST_F(WezotifydTest, FlagsTheShareForAReindexWhenTheKernelDropsEvents) {

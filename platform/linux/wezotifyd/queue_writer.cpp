@@ -94,12 +94,25 @@ bool WriteLine(int fd, const std::string& line) {
 }  // namespace
 
 AppendResult AppendLines(const std::string& queuePath, const std::vector<std::string>& lines) {
-  const UniqueFd fd = OpenQueue(queuePath);
-  if (!fd) {
-    return AppendResult::kRefused;
-  }
-  if (!Lock(fd.get())) {
-    return AppendResult::kLost;
+  UniqueFd fd;
+  for (int attempt = 0;; ++attempt) {
+    fd = OpenQueue(queuePath);
+    if (!fd) {
+      return AppendResult::kRefused;
+    }
+    if (!Lock(fd.get())) {
+      return AppendResult::kLost;
+    }
+    // The daemon takes a queue by removing it under the lock; lines written to the file it took
+    // would never be read.
+    struct stat st {};
+    if (fstat(fd.get(), &st) == 0 && st.st_nlink > 0) {
+      break;
+    }
+    if (attempt == 3) {
+      errno = ESTALE;
+      return AppendResult::kLost;
+    }
   }
   bool whole = true;
   for (const std::string& line : lines) {
