@@ -10,7 +10,6 @@
 //   build/bench/monitor_bench [--benchmark_filter=...]
 #include <benchmark/benchmark.h>
 #include <fcntl.h>
-#include <signal.h>
 #include <spawn.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -18,6 +17,7 @@
 
 #include <algorithm>
 #include <chrono>
+#include <csignal>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -166,7 +166,7 @@ void BM_Burst(benchmark::State& state) {
     }
     const auto start = Clock::now();
     sandbox.Resume();
-    while (sandbox.QueueLines() < static_cast<size_t>(2 * files)) {
+    while (sandbox.QueueLines() < 2 * static_cast<size_t>(files)) {
       std::this_thread::sleep_for(std::chrono::microseconds(200));
     }
     state.SetIterationTime(std::chrono::duration<double>(Clock::now() - start).count());

@@ -101,7 +101,9 @@ void ConsumeQueues() {
     if (name.size() <= 5 || name.compare(name.size() - 5, 5, ".json") != 0) {
       continue;
     }
-    const int fd = open((g_registry + "/" + name).c_str(), O_RDONLY | O_CLOEXEC);
+    std::string file = g_registry + "/";
+    file += name;
+    const int fd = open(file.c_str(), O_RDONLY | O_CLOEXEC);
     if (fd < 0) {
       continue;
     }

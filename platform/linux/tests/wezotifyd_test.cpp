@@ -78,12 +78,15 @@ class WezotifydTest : public SandboxTest {
 
   // The queue line the daemon writes, with paths relative to folder 1.
   std::string Line(int event, const std::string& path, const std::string& old = "") const {
-    std::string line = "{\"event\":" + std::to_string(event) + ",\"path\":\"" + Folder(1) + path;
-    return line + (old.empty() ? "\"}\n" : "\",\"path_old\":\"" + Folder(1) + old + "\"}\n");
+    std::string line = R"({"event":)" + std::to_string(event) + R"(,"path":")" + Folder(1) + path;
+    return line + (old.empty() ? "\"}\n" : R"(","path_old":")" + Folder(1) + old + "\"}\n");
   }
 
   pid_t pid_ = -1;
 };
+
+void Move(const char* from, const char* to) { ASSERT_EQ(rename(from, to), 0) << from; }
+void Remove(const std::string& path) { ASSERT_EQ(unlink(path.c_str()), 0) << path; }
 
 void Create(const std::string& path) {
   const int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644);
@@ -107,15 +110,11 @@ TEST_F(WezotifydTest, WritesOneLinePerChangeInTheQueueFormat) {
        [&] { Create(f + "/a"); },
        {Line(256, "/a"), Line(2, "/a"), Line(8, "/a")}},
       {"rename within",
-       [&] { rename((f + "/a").c_str(), (f + "/b").c_str()); },
+       [&] { Move((f + "/a").c_str(), (f + "/b").c_str()); },
        {Line(256, "/b", "/a")}},
-      {"rename out",
-       [&] { rename((f + "/b").c_str(), At("outside/b").c_str()); },
-       {Line(64, "/b")}},
-      {"rename in",
-       [&] { rename(At("outside/b").c_str(), (f + "/c").c_str()); },
-       {Line(256, "/c")}},
-      {"remove", [&] { unlink((f + "/c").c_str()); }, {Line(512, "/c")}},
+      {"rename out", [&] { Move((f + "/b").c_str(), At("outside/b").c_str()); }, {Line(64, "/b")}},
+      {"rename in", [&] { Move(At("outside/b").c_str(), (f + "/c").c_str()); }, {Line(256, "/c")}},
+      {"remove", [&] { Remove(f + "/c"); }, {Line(512, "/c")}},
       {"ignored name",
        [&] {
          mkdir((f + "/@eaDir").c_str(), 0755);
@@ -133,8 +132,8 @@ TEST_F(WezotifydTest, WritesOneLinePerChangeInTheQueueFormat) {
        {Line(256, "/n"), Line(256, "/n/d"), Line(256, "/n/d/x")}},
       {"renamed folder keeps its watch",
        [&] {
-         rename((f + "/n").c_str(), (f + "/m").c_str());
-         unlink((f + "/m/d/x").c_str());
+         Move((f + "/n").c_str(), (f + "/m").c_str());
+         Remove(f + "/m/d/x");
        },
        {Line(256, "/m", "/n"), Line(512, "/m/d/x")}},
   };

@@ -2,10 +2,10 @@
 // var/lib/wezotifyd, appending one JSON line per file-system event to each registration's queue.
 // A registration whose events may have been lost gets its share flagged for a full reindex
 // through the indexing library. Runs in the foreground until SIGTERM or SIGINT.
-#include <signal.h>
 #include <sys/signalfd.h>
 
 #include <CLI/CLI.hpp>
+#include <csignal>
 #include <cstdio>
 #include <exception>
 #include <string>

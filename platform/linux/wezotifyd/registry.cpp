@@ -60,12 +60,15 @@ std::vector<Registration> LoadRegistry(const std::string& registryDir,
                                        std::vector<std::string>& problems) {
   std::vector<Registration> registrations;
   for (const std::string& client : List(registryDir)) {
-    for (const std::string& name : List(registryDir + "/" + client)) {
+    std::string clientDir = registryDir + "/";
+    clientDir += client;
+    for (const std::string& name : List(clientDir)) {
       if (!EndsWith(name, ".json")) {
         continue;  // a writer's temporary file
       }
       Registration registration;
-      registration.file = registryDir + "/" + client + "/" + name;
+      registration.file = clientDir + "/";
+      registration.file += name;
       Json::Value value;
       if (!FILEINDEX::JsonFromFile(value, registration.file)) {
         problems.push_back(registration.file + ": cannot be read as JSON");

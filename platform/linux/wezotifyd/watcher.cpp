@@ -7,6 +7,7 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <climits>
 #include <cstdio>
@@ -177,7 +178,8 @@ void Watcher::WatchTree(const std::string& top, bool reportEntries,
       if (name == "." || name == "..") {
         continue;
       }
-      const std::string path = dir + "/" + name;
+      std::string path = dir + "/";
+      path += name;
       if (!InAnyTree(path)) {
         continue;
       }
@@ -241,12 +243,8 @@ void Watcher::MoveWatches(const std::string& from, const std::string& to) {
 }
 
 bool Watcher::InAnyTree(const std::string& path) const {
-  for (const Registration& registration : m_registrations) {
-    if (registration.TreeOf(path) != nullptr) {
-      return true;
-    }
-  }
-  return false;
+  return std::any_of(m_registrations.begin(), m_registrations.end(),
+                     [&](const Registration& r) { return r.TreeOf(path) != nullptr; });
 }
 
 void Watcher::ReadRegistryEvents() {
