@@ -10,9 +10,10 @@ cd "$(dirname "$0")/.."
 
 ./scripts/install-deps.sh
 cmake -S . -B build >/dev/null
-cmake --build build -j"$(nproc)" --target fileindexctl fileindexd-standin
+cmake --build build -j"$(nproc)" --target fileindexctl fileindexd-standin wezotifyd
 ctl_bin=$PWD/build/bin/fileindexctl
 daemon_bin=$PWD/build/bin/fileindexd-standin
+monitor_bin=$PWD/build/bin/wezotifyd
 
 # ---------------------------------------------------------------------------------------------
 # Helpers
@@ -20,6 +21,7 @@ daemon_bin=$PWD/build/bin/fileindexd-standin
 step_no=0
 step_title="setup"
 daemon_pid=""
+monitor_pid=""
 root=""
 
 fail() {
@@ -33,6 +35,10 @@ cleanup() {
   if [ -n "$daemon_pid" ]; then
     kill -TERM "$daemon_pid" 2>/dev/null || true
     wait "$daemon_pid" 2>/dev/null || true
+  fi
+  if [ -n "$monitor_pid" ]; then
+    kill -TERM "$monitor_pid" 2>/dev/null || true
+    wait "$monitor_pid" 2>/dev/null || true
   fi
   if [ -n "$root" ]; then
     rm -rf "$root"
@@ -239,11 +245,14 @@ EOF
 chmod +x "$root/usr/bin/systemctl" "$root/usr/wezo/bin/wezohxonotify"
 
 start_daemon() {
-  "$daemon_bin" --socket "$root/var/run/fileindexd.sock" --log "$daemon_log" &
+  "$daemon_bin" --socket "$root/var/run/fileindexd.sock" --log "$daemon_log" --root "$root" --consume &
   daemon_pid=$!
   expect_daemon "listening on"
 }
 start_daemon
+# The platform's file-change monitor, serving the registrations the library writes.
+"$monitor_bin" --root "$root" 2>>"$demo/monitor.log" &
+monitor_pid=$!
 changes >/dev/null  # what the walkthrough shows is measured from here
 echo "Shares photo, video, music, archive (read-only) and surveillance; daemon pid $daemon_pid."
 
@@ -391,5 +400,53 @@ done
 expect_contains "$(queue_of photo)" "\"event\":65536,\"path\":\"$root/volume1/photo/2020\""
 expect_contains "$(queue_of music)" "\"event\":65536,\"path\":\"$root/volume1/music/live\""
 expect_contains "$root/etc/samba/smb.conf" "spotlight = yes"
+
+step "Files change in an indexed folder: the monitor queues them, the daemon takes them"
+# Waits up to five seconds for the monitor to serve COUNT queues.
+expect_monitor() {
+  local tries
+  for ((tries = 0; tries < 50; tries++)); do
+    if tail -n 1 "$demo/monitor.log" | grep -qF "for $1 queues"; then return 0; fi
+    sleep 0.1
+  done
+  fail "the monitor does not serve $1 queues: $(short <"$demo/monitor.log")"
+}
+# Waits up to five seconds for TEXT in the photo share's queue.
+expect_queue() {
+  local tries
+  for ((tries = 0; tries < 50; tries++)); do
+    if grep -qF -- "$1" "$(queue_of photo)" 2>/dev/null; then return 0; fi
+    sleep 0.1
+  done
+  fail "no \"$1\" in the queue of photo"
+}
+expect_monitor 2
+echo "(the daemon takes the queues it has: the folder has nothing left to do)"
+printf '$ kill -USR1 <daemon>\n'
+kill -USR1 "$daemon_pid"
+expect_daemon "of $(queue_of photo)"
+expect_output status /photo/2020 -- "/photo/2020: finished"
+changes
+photo=$root/volume1/photo/2020
+printf '$ echo sand >%s/beach.jpg; mv beach.jpg sunset.jpg; mkdir -p raw; rm sunset.jpg\n' \
+  "$(short <<<"$photo")"
+echo sand >"$photo/beach.jpg"
+mv "$photo/beach.jpg" "$photo/sunset.jpg"
+mkdir -p "$photo/raw"
+rm "$photo/sunset.jpg"
+expect_queue "{\"event\":512,\"path\":\"$photo/sunset.jpg\"}"
+echo "  the monitor's lines in the queue of photo:"
+indent <"$(queue_of photo)"
+expect_contains "$(queue_of photo)" "{\"event\":256,\"path\":\"$photo/beach.jpg\"}"
+expect_contains "$(queue_of photo)" \
+  "{\"event\":256,\"path\":\"$photo/sunset.jpg\",\"path_old\":\"$photo/beach.jpg\"}"
+expect_contains "$(queue_of photo)" "{\"event\":256,\"path\":\"$photo/raw\"}"
+expect_output status /photo/2020 -- "/photo/2020: processing"
+printf '$ kill -USR1 <daemon>\n'
+kill -USR1 "$daemon_pid"
+expect_daemon "of $(queue_of photo)"
+expect_output status /photo/2020 -- "/photo/2020: finished"
+expect_no_file "$(queue_of photo)"
+changes
 
 printf '\ndemo passed\n'

@@ -6,10 +6,18 @@
 // of compact JSON text {"type": <name>, "data": <arguments>} ending with a zero byte that the
 // length counts. A malformed frame is reported and ends its connection. Connections are served one
 // after the other, as the library's each carry one command and are closed at once.
+//
+// With --consume it also plays the daemon's side of the event queues: on SIGUSR1 it takes every
+// queue that the library registered with the file-change monitor (var/lib/wezotifyd/fileindex
+// under --root), under the queue's lock, prints how many events it held and removes it, as the
+// daemon does once it has indexed them.
+#include <dirent.h>
+#include <fcntl.h>
 #include <json/reader.h>
 #include <json/value.h>
 #include <json/writer.h>
 #include <poll.h>
+#include <sys/file.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
@@ -30,15 +38,83 @@ namespace {
 constexpr uint32_t kMaxFrame = 1024 * 1024;
 
 volatile std::sig_atomic_t g_stop = 0;
-sigset_t g_waitMask;  // the mask while waiting: SIGTERM and SIGINT get through only then
+volatile std::sig_atomic_t g_consume = 0;
+sigset_t g_waitMask;     // the mask while waiting: the signals get through only then
+std::string g_registry;  // where the queues to consume are registered; empty without --consume
 
 void OnStopSignal(int /*signal*/) { g_stop = 1; }
+void OnConsumeSignal(int /*signal*/) { g_consume = 1; }
 
 FILE* g_out = stdout;
 
 void PrintLine(const std::string& line) {
   (void)std::fprintf(g_out, "fileindexd: %s\n", line.c_str());
   (void)std::fflush(g_out);
+}
+
+bool ParseJson(const std::string& text, Json::Value& value) {
+  Json::CharReaderBuilder reader;
+  Json::CharReaderBuilder::strictMode(&reader.settings_);
+  const std::unique_ptr<Json::CharReader> parser(reader.newCharReader());
+  return parser->parse(text.data(), text.data() + text.size(), &value, nullptr);
+}
+
+std::string ReadAll(int fd) {
+  std::string text;
+  char buffer[65536];
+  for (ssize_t got; (got = read(fd, buffer, sizeof buffer)) > 0;) {
+    text.append(buffer, static_cast<size_t>(got));
+  }
+  return text;
+}
+
+// Takes the queue at `queue` (and its ".tmp" companion): reads it under its lock and removes it
+// before letting the lock go, so a writer waiting for the lock finds it gone and makes a new one.
+void ConsumeQueue(const std::string& queue) {
+  size_t events = 0;
+  for (const std::string& path : {queue, queue + ".tmp"}) {
+    const int fd = open(path.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_CLOEXEC);
+    if (fd < 0) {
+      continue;
+    }
+    struct stat st {};
+    if (fstat(fd, &st) == 0 && S_ISREG(st.st_mode) && flock(fd, LOCK_EX) == 0) {
+      const std::string text = ReadAll(fd);
+      for (const char c : text) {
+        events += c == '\n' ? 1 : 0;
+      }
+      unlink(path.c_str());
+    }
+    close(fd);
+  }
+  PrintLine("consumed " + std::to_string(events) + " events of " + queue);
+}
+
+void ConsumeQueues() {
+  DIR* dir = opendir(g_registry.c_str());
+  if (dir == nullptr) {
+    PrintLine("no registrations in " + g_registry);
+    return;
+  }
+  while (const dirent* entry = readdir(dir)) {
+    const std::string name = entry->d_name;
+    if (name.size() <= 5 || name.compare(name.size() - 5, 5, ".json") != 0) {
+      continue;
+    }
+    std::string file = g_registry + "/";
+    file += name;
+    const int fd = open(file.c_str(), O_RDONLY | O_CLOEXEC);
+    if (fd < 0) {
+      continue;
+    }
+    Json::Value registration;
+    if (ParseJson(ReadAll(fd), registration) && registration.isObject() &&
+        registration["queue"].isString()) {
+      ConsumeQueue(registration["queue"].asString());
+    }
+    close(fd);
+  }
+  closedir(dir);
 }
 
 // Says on stderr what could not be done with `path`, with errno's reason; returns the exit status.
@@ -53,6 +129,10 @@ int Fail(const char* what, const std::string& path) {
 bool WaitReadable(int fd) {
   pollfd entry{fd, POLLIN, 0};
   while (g_stop == 0) {
+    if (g_consume != 0) {
+      g_consume = 0;
+      ConsumeQueues();
+    }
     if (ppoll(&entry, 1, nullptr, &g_waitMask) > 0) {
       return true;
     }
@@ -74,12 +154,8 @@ size_t ReadFull(int fd, char* buffer, size_t count) {
 }
 
 std::string Describe(const std::string& text) {
-  Json::CharReaderBuilder reader;
-  Json::CharReaderBuilder::strictMode(&reader.settings_);
   Json::Value command;
-  const std::unique_ptr<Json::CharReader> parser(reader.newCharReader());
-  if (!parser->parse(text.data(), text.data() + text.size(), &command, nullptr) ||
-      !command.isObject() || !command["type"].isString()) {
+  if (!ParseJson(text, command) || !command.isObject() || !command["type"].isString()) {
     return text;
   }
   Json::StreamWriterBuilder writer;
@@ -125,7 +201,16 @@ int Run(int argc, char** argv) {
   CLI::App app{"Stand-in for the indexing daemon: prints the commands sent to its socket"};
   app.add_option("--socket", socketPath, "the Unix stream socket to listen on")->required();
   app.add_option("--log", logPath, "append the lines to this file instead of stdout");
+  std::string root;
+  bool consume = false;
+  app.add_option("--root", root, "the sandbox root whose registrations --consume reads");
+  app.add_flag("--consume", consume,
+               "on SIGUSR1, take and remove the event queues registered with the file-change "
+               "monitor");
   CLI11_PARSE(app, argc, argv);
+  if (consume) {
+    g_registry = root + "/var/lib/wezotifyd/fileindex";
+  }
 
   if (!logPath.empty()) {
     g_out = std::fopen(logPath.c_str(), "ae");
@@ -137,11 +222,16 @@ int Run(int argc, char** argv) {
   sigemptyset(&stopSignals);
   sigaddset(&stopSignals, SIGTERM);
   sigaddset(&stopSignals, SIGINT);
+  sigaddset(&stopSignals, SIGUSR1);
   sigprocmask(SIG_BLOCK, &stopSignals, &g_waitMask);
   struct sigaction action {};
   action.sa_handler = OnStopSignal;
   sigaction(SIGTERM, &action, nullptr);
   sigaction(SIGINT, &action, nullptr);
+  if (consume) {
+    action.sa_handler = OnConsumeSignal;
+    sigaction(SIGUSR1, &action, nullptr);
+  }
 
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
