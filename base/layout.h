@@ -22,6 +22,12 @@ inline constexpr char kDatabaseName[] = "WEZO@.fileindexdb";
 inline constexpr char kIndexService[] = "fileindexd";
 inline constexpr char kSmbService[] = "samba";
 
+// The library's client name with the file-change monitor, and the event classes it asks the
+// monitor to watch per folder: all except three that indexing has no use for (0x0001, 0x0010 and
+// 0x0020).
+inline constexpr char kMonitorClient[] = "fileindex";
+inline constexpr int kMonitorMask = 0xFFCE;
+
 // The metadata directory of the share whose full path is `shareFullPath`.
 inline std::string MetadataDirOf(const std::string& shareFullPath) {
   return shareFullPath + "/" + kMetadataDirName;

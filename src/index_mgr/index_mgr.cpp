@@ -32,10 +32,6 @@ namespace WEZO {
 namespace FILEINDEX {
 namespace {
 
-constexpr char kMonitorClient[] = "fileindex";
-// Every event class of the monitor except three that indexing has no use for (0x0001, 0x0010
-// and 0x0020).
-constexpr int kMonitorMask = 0xFFCE;
 constexpr int kServiceFlags = 1;
 constexpr int kLocationSize = 4096;
 

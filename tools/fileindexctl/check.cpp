@@ -26,6 +26,7 @@
 #include <thread>
 
 #include "commands.h"
+#include "layout.h"
 
 namespace fi = WEZO::FILEINDEX;
 namespace monitor = WEZO::WEZOTIFYD;
@@ -34,10 +35,9 @@ namespace fileindexctl {
 
 namespace {
 
-// The library's client name with the monitor, and what it asks the monitor to watch per folder.
-constexpr char kMonitorClient[] = "fileindex";
-constexpr int kMonitorMask = 0xFFCE;
-constexpr char kMetadataDir[] = "@eaDir";
+using fi::kMetadataDirName;
+using fi::kMonitorClient;
+using fi::kMonitorMask;
 // The generic-Linux monitor keeps one file per client and queue here, under the root prefix.
 constexpr char kRegistry[] = "/var/lib/wezotifyd/";
 // How long the second look waits for a daemon whose service the repair started.
@@ -208,7 +208,7 @@ void CheckRegistrations(const std::vector<fi::Folder>& folders, Findings& found)
       Json::Value dir(Json::objectValue);
       dir["path"] = path;
       dir["mask"] = kMonitorMask;
-      dir["ignore"].append(kMetadataDir);
+      dir["ignore"].append(kMetadataDirName);
       expected["config"].append(dir);
     }
     const auto entry = registered.find(queue);
