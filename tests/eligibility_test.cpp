@@ -1,6 +1,5 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <unistd.h>
 #include <wezo/platform.h>
 
 #include <filesystem>
@@ -12,152 +11,117 @@
 #include "fileindex/error.h"
 #include "test_support.h"
 
-namespace WEZO {
-namespace FILEINDEX {
+namespace WEZO::FILEINDEX {
 namespace {
 
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
-using ::testing::MatchesRegex;
 
 class EligibilityTest : public testsupport::LibraryTest {
  protected:
   EligibilityTest() {
-    std::filesystem::create_directories(volume + "/photo/2019");
-    std::filesystem::create_directories(volume + "/photo/#recycle-notes");
-    std::filesystem::create_directories(volume + "/photo/#snapshot");
-    std::filesystem::create_directories(volume + "/surveillance/cam");
-    std::filesystem::create_directories(volume + "/Surveillance/cam");
+    for (const char* dir : {"/photo/2019", "/photo/#recycle-notes", "/photo/#snapshot",
+                            "/surveillance/cam", "/Surveillance/cam"}) {
+      std::filesystem::create_directories(volume + dir);
+    }
     std::filesystem::create_symlink(volume + "/photo/2019", volume + "/photo/link");
-    fake::Get().AddShare("surveillance", volume + "/surveillance");
-    fake::Get().AddShare("Surveillance", volume + "/Surveillance");
   }
 };
 
 // Every rule of the folder check: the rule it yields, the call that decides it (which shows the
 // order in which the rules are tried) and the line it logs.
 TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
-  struct Case {
+  using P = fake::Platform;
+  const auto none = [](P&, const std::string&) {};
+  const struct {
     const char* name;
     const char* folder;  // under the volume
-    std::function<void(fake::Platform&, const std::string&)> setup;
-    bool accepted;
+    std::function<void(P&, const std::string&)> setup;
     IndexRule rule;
     const char* decidingCall;
     const char* logLine;  // after "utils:N ", with %s for the full path
-  };
-  const auto none = [](fake::Platform&, const std::string&) {};
-  const Case cases[] = {
-      {"plain folder", "/photo/2019", none, true, IndexRule::kIndexable, "WEZOFSDirIsMntPoint",
-       nullptr},
-      {"recycle bin", "/photo/#recycle-notes",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].recycle = true; }, false,
+  } cases[] = {
+      {"plain folder", "/photo/2019", none, IndexRule::kIndexable, "WEZOFSDirIsMntPoint", nullptr},
+      {"recycle bin", "/photo/#recycle-notes", [](P& pf, auto& p) { pf.facts[p].recycle = true; },
        IndexRule::kRecycleBin, "WEZOShareIsShareRecycle", nullptr},
-      {"#recycle in the name only", "/photo/#recycle-notes", none, true, IndexRule::kIndexable,
+      {"#recycle in the name only", "/photo/#recycle-notes", none, IndexRule::kIndexable,
        "WEZOFSDirIsMntPoint", nullptr},
-      {"snapshot", "/photo/#snapshot",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].snapshot = true; }, false,
+      {"snapshot", "/photo/#snapshot", [](P& pf, auto& p) { pf.facts[p].snapshot = true; },
        IndexRule::kSnapshot, "WLIBFhsPathInSnapshot", nullptr},
       {"snapshot query fails", "/photo/#snapshot",
-       [](fake::Platform& pf, const std::string& p) {
-         pf.facts[p].snapshot = true;
-         fake::Get().snapshot_query_fails = true;
-       },
-       true, IndexRule::kIndexable, "WEZOFSDirIsMntPoint", nullptr},
+       [](P& pf, auto& p) { pf.facts[p].snapshot = pf.snapshot_query_fails = true; },
+       IndexRule::kIndexable, "WEZOFSDirIsMntPoint", nullptr},
       {"unknown file system", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = WEZO_FSTYPE_UNKNOWN; },
-       false, IndexRule::kUnknownFileSystem, "WEZOGetFSType", nullptr},
+       [](P& pf, auto& p) { pf.facts[p].fsType = WEZO_FSTYPE_UNKNOWN; },
+       IndexRule::kUnknownFileSystem, "WEZOGetFSType", nullptr},
       {"remote file system before an excluded share", "/surveillance/cam",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = fake::kRemoteFs; },
-       false, IndexRule::kRemoteFileSystem, "WEZOFSIsRemoteFS", nullptr},
+       [](P& pf, auto& p) { pf.facts[p].fsType = fake::kRemoteFs; }, IndexRule::kRemoteFileSystem,
+       "WEZOFSIsRemoteFS", nullptr},
       {"image file system", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = fake::kImageFs; }, false,
-       IndexRule::kImageFileSystem, "WEZOFSIsImageFS", nullptr},
+       [](P& pf, auto& p) { pf.facts[p].fsType = fake::kImageFs; }, IndexRule::kImageFileSystem,
+       "WEZOFSIsImageFS", nullptr},
       {"never-indexed file system", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) {
-         pf.facts[p].fsType = WEZO_FSTYPE_NEVER_INDEXED;
-       },
-       false, IndexRule::kNeverIndexedFileSystem, "WEZOFSIsImageFS", nullptr},
+       [](P& pf, auto& p) { pf.facts[p].fsType = WEZO_FSTYPE_NEVER_INDEXED; },
+       IndexRule::kNeverIndexedFileSystem, "WEZOFSIsImageFS", nullptr},
       {"share lookup by path fails", "/photo/2019",
-       [](fake::Platform&, const std::string&) { fake::Get().share_name_path_get_fails = true; },
-       false, IndexRule::kNoShare, "WEZOShareNamePathGet",
-       "GetShareNamePathByFullPath failed, path=%s"},
-      {"share record lookup fails", "/photo/2019",
-       [](fake::Platform&, const std::string&) { fake::Get().share_get_fails = true; }, false,
+       [](P& pf, auto&) { pf.share_name_path_get_fails = true; }, IndexRule::kNoShare,
+       "WEZOShareNamePathGet", "GetShareNamePathByFullPath failed, path=%s"},
+      {"share record lookup fails", "/photo/2019", [](P& pf, auto&) { pf.share_get_fails = true; },
        IndexRule::kShareUnreadable, "WEZOShareGet", "WEZOShareGet failed, share=photo"},
-      {"excluded share", "/surveillance/cam", none, false, IndexRule::kExcludedShare,
-       "WEZOShareGet", nullptr},
-      {"excluded names are case-sensitive", "/Surveillance/cam", none, true, IndexRule::kIndexable,
+      {"excluded share", "/surveillance/cam", none, IndexRule::kExcludedShare, "WEZOShareGet",
+       nullptr},
+      {"excluded names are case-sensitive", "/Surveillance/cam", none, IndexRule::kIndexable,
        "WEZOFSDirIsMntPoint", nullptr},
-      {"encrypted share", "/photo/2019",
-       [](fake::Platform& pf, const std::string&) { pf.shares["photo"].encrypted = true; }, false,
+      {"encrypted share", "/photo/2019", [](P& pf, auto&) { pf.shares["photo"].encrypted = true; },
        IndexRule::kEncryptedShare, "WLIBShareIsReadOnlyGet", nullptr},
       {"encryption query fails", "/photo/2019",
-       [](fake::Platform&, const std::string&) { fake::Get().encrypted_query_fails = true; }, false,
-       IndexRule::kShareStateUnknown, "WLIBShareIsEncryptedGet", nullptr},
-      {"read-only share", "/photo/2019",
-       [](fake::Platform& pf, const std::string&) { pf.shares["photo"].readOnly = true; }, false,
+       [](P& pf, auto&) { pf.encrypted_query_fails = true; }, IndexRule::kShareStateUnknown,
+       "WLIBShareIsEncryptedGet", nullptr},
+      {"read-only share", "/photo/2019", [](P& pf, auto&) { pf.shares["photo"].readOnly = true; },
        IndexRule::kReadOnlyShare, "WLIBShareIsReadOnlyGet", nullptr},
       {"encrypted and read-only share", "/photo/2019",
-       [](fake::Platform& pf, const std::string&) {
-         pf.shares["photo"].encrypted = true;
-         pf.shares["photo"].readOnly = true;
-       },
-       false, IndexRule::kEncryptedShare, "WLIBShareIsReadOnlyGet", nullptr},
+       [](P& pf, auto&) { pf.shares["photo"].encrypted = pf.shares["photo"].readOnly = true; },
+       IndexRule::kEncryptedShare, "WLIBShareIsReadOnlyGet", nullptr},
       {"read-only query fails", "/photo/2019",
-       [](fake::Platform&, const std::string&) { fake::Get().read_only_query_fails = true; }, false,
-       IndexRule::kShareStateUnknown, "WLIBShareIsReadOnlyGet", nullptr},
-      {"mount point", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].mountPoint = 1; }, false,
+       [](P& pf, auto&) { pf.read_only_query_fails = true; }, IndexRule::kShareStateUnknown,
+       "WLIBShareIsReadOnlyGet", nullptr},
+      {"mount point", "/photo/2019", [](P& pf, auto& p) { pf.facts[p].mountPoint = 1; },
        IndexRule::kMountPoint, "WLIBShareIsEncryptionGet",
        "Mount point[%s] is not allowed to be indexed"},
       {"mount point of a share set up for encryption", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) {
-         pf.facts[p].mountPoint = 1;
-         pf.shares["photo"].encryption = true;
-       },
-       true, IndexRule::kIndexable, "WLIBShareIsEncryptionGet", nullptr},
+       [](P& pf, auto& p) { pf.facts[p].mountPoint = pf.shares["photo"].encryption = 1; },
+       IndexRule::kIndexable, "WLIBShareIsEncryptionGet", nullptr},
       {"mount point, encryption setting unknown", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) {
-         pf.facts[p].mountPoint = 1;
-         fake::Get().encryption_query_fails = true;
-       },
-       true, IndexRule::kIndexable, "WLIBShareIsEncryptionGet", nullptr},
-      {"trailing slash", "/photo/2019/", none, false, IndexRule::kResolvesElsewhere,
-       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
-      {"doubled slash", "/photo//2019", none, false, IndexRule::kResolvesElsewhere,
-       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
-      {"dot component", "/photo/./2019", none, false, IndexRule::kResolvesElsewhere,
-       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
-      {"symbolic link", "/photo/link", none, false, IndexRule::kResolvesElsewhere,
-       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
-      {"missing folder", "/photo/2020", none, false, IndexRule::kResolvesElsewhere,
-       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
+       [](P& pf, auto& p) { pf.facts[p].mountPoint = pf.encryption_query_fails = 1; },
+       IndexRule::kIndexable, "WLIBShareIsEncryptionGet", nullptr},
+      {"trailing slash", "/photo/2019/", none, IndexRule::kResolvesElsewhere, "WEZOFSDirIsMntPoint",
+       "check realpath failed, path=%s"},
+      {"dot component", "/photo/./2019", none, IndexRule::kResolvesElsewhere, "WEZOFSDirIsMntPoint",
+       "check realpath failed, path=%s"},
+      {"symbolic link", "/photo/link", none, IndexRule::kResolvesElsewhere, "WEZOFSDirIsMntPoint",
+       "check realpath failed, path=%s"},
+      {"missing folder", "/photo/2020", none, IndexRule::kResolvesElsewhere, "WEZOFSDirIsMntPoint",
+       "check realpath failed, path=%s"},
   };
-  for (const Case& c : cases) {
+  for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
     fake::Reset();
-    fake::Get().AddShare("photo", volume + "/photo");
-    fake::Get().AddShare("surveillance", volume + "/surveillance");
-    fake::Get().AddShare("Surveillance", volume + "/Surveillance");
+    for (const char* share : {"photo", "surveillance", "Surveillance"}) {
+      fake::Get().AddShare(share, volume + "/" + share);
+    }
     log.Clear();
     const std::string fullPath = volume + c.folder;
     c.setup(fake::Get(), fullPath);
 
-    EXPECT_EQ(CanFullPathBeIndexed(fullPath), c.accepted);
-    ASSERT_FALSE(fake::Get().calls.empty());
+    EXPECT_EQ(CanFullPathBeIndexed(fullPath), c.rule == IndexRule::kIndexable);
     // Calls after the deciding one are bookkeeping (releasing the share record).
     std::vector<std::string> ops = fake::Get().OpNames();
-    while (!ops.empty() && ops.back() == "WLIBCErrGet") {
-      ops.pop_back();
-    }
+    while (!ops.empty() && ops.back() == "WLIBCErrGet") ops.pop_back();
+    ASSERT_FALSE(ops.empty());
     EXPECT_EQ(ops.back(), c.decidingCall);
     EXPECT_EQ(fake::Get().openShareRecords, 0);
     EXPECT_EQ(ErrorHandler::GetError(),
-              c.logLine != nullptr && std::string(c.logLine).rfind("GetShare", 0) == 0
-                  ? FILEINDEX_ERR_PATH
-                  : FILEINDEX_ERR_NONE);
-    ErrorHandler::SetError(FILEINDEX_ERR_NONE);
+              c.rule == IndexRule::kNoShare ? FILEINDEX_ERR_PATH : FILEINDEX_ERR_NONE);
     if (c.logLine == nullptr) {
       EXPECT_THAT(log.Lines(), IsEmpty());
     } else {
@@ -171,6 +135,7 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
     const std::vector<std::string> logged = log.Lines();
     fake::Get().calls.clear();
     log.Clear();
+    ErrorHandler::SetError(FILEINDEX_ERR_NONE);
     const IndexRule rule = FullPathIndexRule(fullPath);
     EXPECT_EQ(rule, c.rule) << IndexRuleKey(rule);
     EXPECT_EQ(fake::Get().OpNames(), asked);
@@ -186,22 +151,21 @@ TEST_F(EligibilityTest, EveryRuleHasItsOwnKeyAndDescription) {
   std::set<std::string> keys;
   std::set<std::string> descriptions;
   constexpr int kRules = static_cast<int>(IndexRule::kResolvesElsewhere) + 1;
-  for (int value = 0; value < kRules; ++value) {
+  for (int value = -1; value <= kRules; ++value) {
     const auto rule = static_cast<IndexRule>(value);
-    const std::string key = IndexRuleKey(rule);
-    EXPECT_THAT(key, MatchesRegex("[a-z_]+")) << value;
-    EXPECT_NE(key, "unknown") << value;
-    keys.insert(key);
-    descriptions.insert(DescribeIndexRule(rule));
+    const bool inside = value >= 0 && value < kRules;
+    EXPECT_THAT(IndexRuleKey(rule), ::testing::MatchesRegex(inside ? "[a-z_]+" : "unknown"))
+        << value;
+    ASSERT_NE(DescribeIndexRule(rule), nullptr);
+    EXPECT_STRNE(DescribeIndexRule(rule), "");
+    if (inside) {
+      keys.insert(IndexRuleKey(rule));
+      descriptions.insert(DescribeIndexRule(rule));
+    }
   }
   EXPECT_EQ(keys.size(), static_cast<size_t>(kRules));
+  EXPECT_EQ(keys.count("unknown"), 0U);
   EXPECT_EQ(descriptions.size(), static_cast<size_t>(kRules));
-  EXPECT_EQ(descriptions.count(""), 0U);
-  for (const int outside : {-1, kRules}) {
-    EXPECT_STREQ(IndexRuleKey(static_cast<IndexRule>(outside)), "unknown");
-    ASSERT_NE(DescribeIndexRule(static_cast<IndexRule>(outside)), nullptr);
-    EXPECT_STRNE(DescribeIndexRule(static_cast<IndexRule>(outside)), "");
-  }
 }
 
 TEST_F(EligibilityTest, SharePathThatCannotBeResolvedSetsThePathCode) {
@@ -213,13 +177,12 @@ TEST_F(EligibilityTest, SharePathThatCannotBeResolvedSetsThePathCode) {
 }
 
 TEST_F(EligibilityTest, CrawledItemsAreSkippedByNameLocationAndFileSystem) {
-  struct Case {
+  const fake::PathFacts local{};
+  const struct {
     const char* path;
     fake::PathFacts facts;
     bool skipped;
-  };
-  const fake::PathFacts local{};
-  const Case cases[] = {
+  } cases[] = {
       {"no-slash", local, true},
       {"/volume1/photo/.DS_Store", local, true},
       {"/volume1/photo/x.DS_Store", local, false},
@@ -237,7 +200,7 @@ TEST_F(EligibilityTest, CrawledItemsAreSkippedByNameLocationAndFileSystem) {
       {"/volume1/photo/a", {fake::kImageFs, 0, false, false}, true},
       {"/volume1/photo/a", {WEZO_FSTYPE_NEVER_INDEXED, 0, false, false}, true},
   };
-  for (const Case& c : cases) {
+  for (const auto& c : cases) {
     fake::Reset();
     fake::Get().defaultFacts = c.facts;
     EXPECT_EQ(IsSkipIndex(c.path), c.skipped) << c.path << " type " << c.facts.fsType;
@@ -247,17 +210,16 @@ TEST_F(EligibilityTest, CrawledItemsAreSkippedByNameLocationAndFileSystem) {
 }
 
 TEST_F(EligibilityTest, OnlyADefiniteOutOfSpaceAnswerMeansNoRoom) {
-  struct Case {
+  const struct {
     bool enough;
     int error;
     bool expected;
-  };
-  const Case cases[] = {{true, 0, true},
-                        {false, WLIBC_ERR_NO_SPACE, false},
-                        {false, WLIBC_ERR_OVER_QUOTA, false},
-                        {false, WLIBC_ERR_BAD_PARAMETERS, true},
-                        {false, 0, true}};
-  for (const Case& c : cases) {
+  } cases[] = {{true, 0, true},
+               {false, WLIBC_ERR_NO_SPACE, false},
+               {false, WLIBC_ERR_OVER_QUOTA, false},
+               {false, WLIBC_ERR_BAD_PARAMETERS, true},
+               {false, 0, true}};
+  for (const auto& c : cases) {
     fake::Get().quotaEnough = c.enough;
     fake::Get().quotaError = c.error;
     fake::Get().calls.clear();
@@ -272,5 +234,4 @@ TEST_F(EligibilityTest, OnlyADefiniteOutOfSpaceAnswerMeansNoRoom) {
 }
 
 }  // namespace
-}  // namespace FILEINDEX
-}  // namespace WEZO
+}  // namespace WEZO::FILEINDEX
