@@ -155,8 +155,7 @@ TEST_F(ConfigTest, LockFileThatOthersCouldHoldIsRefused) {
          if (geteuid() != 0) return -2;
          return close(open(l, O_CREAT | O_WRONLY | O_CLOEXEC, 0600)) | chown(l, 65534, 65534);
        },
-       true},
-  };
+       true}};
   for (const auto& c : cases) {
     unlink(lock.c_str());
     const int made = c.make(other.c_str(), lock.c_str());

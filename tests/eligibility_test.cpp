@@ -3,8 +3,8 @@
 #include <wezo/platform.h>
 
 #include <filesystem>
-#include <functional>
 #include <set>
+#include <sstream>
 
 #include "fake_platform.h"
 #include "fileindex/eligibility.h"
@@ -28,91 +28,82 @@ class EligibilityTest : public testsupport::LibraryTest {
   }
 };
 
+// Sets up what `words` name for the folder at `path`: a fact of the path, a share setting, or a
+// query that fails ("?").
+void Arrange(const std::string& words, const std::string& path) {
+  fake::Platform& pf = fake::Get();
+  fake::Share& photo = pf.shares["photo"];
+  std::istringstream in(words);
+  for (std::string w; in >> w;) {
+    fake::PathFacts& facts = pf.facts[path];
+    if (w == "recycle") facts.recycle = true;
+    if (w == "snapshot") facts.snapshot = true;
+    if (w == "mount") facts.mountPoint = 1;
+    if (w == "unknown-fs") facts.fsType = WEZO_FSTYPE_UNKNOWN;
+    if (w == "remote-fs") facts.fsType = fake::kRemoteFs;
+    if (w == "image-fs") facts.fsType = fake::kImageFs;
+    if (w == "never-fs") facts.fsType = WEZO_FSTYPE_NEVER_INDEXED;
+    if (w == "encrypted") photo.encrypted = true;
+    if (w == "read-only") photo.readOnly = true;
+    if (w == "encryption") photo.encryption = true;
+    if (w == "snapshot?") pf.snapshot_query_fails = true;
+    if (w == "share-by-path?") pf.share_name_path_get_fails = true;
+    if (w == "share?") pf.share_get_fails = true;
+    if (w == "encrypted?") pf.encrypted_query_fails = true;
+    if (w == "read-only?") pf.read_only_query_fails = true;
+    if (w == "encryption?") pf.encryption_query_fails = true;
+  }
+}
+
 // Every rule of the folder check: the rule it yields, the call that decides it (which shows the
 // order in which the rules are tried) and the line it logs.
 TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
-  using P = fake::Platform;
-  const auto none = [](P&, const std::string&) {};
+  using R = IndexRule;
+  const char* realpath = "check realpath failed, path=%s";
   const struct {
-    const char* name;
-    const char* folder;  // under the volume
-    std::function<void(P&, const std::string&)> setup;
+    const char* folder;  // under the volume; "": /photo/2019
+    const char* setup;   // see Arrange()
     IndexRule rule;
     const char* decidingCall;
     const char* logLine;  // after "utils:N ", with %s for the full path
   } cases[] = {
-      {"plain folder", "/photo/2019", none, IndexRule::kIndexable, "WEZOFSDirIsMntPoint", nullptr},
-      {"recycle bin", "/photo/#recycle-notes", [](P& pf, auto& p) { pf.facts[p].recycle = true; },
-       IndexRule::kRecycleBin, "WEZOShareIsShareRecycle", nullptr},
-      {"#recycle in the name only", "/photo/#recycle-notes", none, IndexRule::kIndexable,
-       "WEZOFSDirIsMntPoint", nullptr},
-      {"snapshot", "/photo/#snapshot", [](P& pf, auto& p) { pf.facts[p].snapshot = true; },
-       IndexRule::kSnapshot, "WLIBFhsPathInSnapshot", nullptr},
-      {"snapshot query fails", "/photo/#snapshot",
-       [](P& pf, auto& p) { pf.facts[p].snapshot = pf.snapshot_query_fails = true; },
-       IndexRule::kIndexable, "WEZOFSDirIsMntPoint", nullptr},
-      {"unknown file system", "/photo/2019",
-       [](P& pf, auto& p) { pf.facts[p].fsType = WEZO_FSTYPE_UNKNOWN; },
-       IndexRule::kUnknownFileSystem, "WEZOGetFSType", nullptr},
-      {"remote file system before an excluded share", "/surveillance/cam",
-       [](P& pf, auto& p) { pf.facts[p].fsType = fake::kRemoteFs; }, IndexRule::kRemoteFileSystem,
-       "WEZOFSIsRemoteFS", nullptr},
-      {"image file system", "/photo/2019",
-       [](P& pf, auto& p) { pf.facts[p].fsType = fake::kImageFs; }, IndexRule::kImageFileSystem,
-       "WEZOFSIsImageFS", nullptr},
-      {"never-indexed file system", "/photo/2019",
-       [](P& pf, auto& p) { pf.facts[p].fsType = WEZO_FSTYPE_NEVER_INDEXED; },
-       IndexRule::kNeverIndexedFileSystem, "WEZOFSIsImageFS", nullptr},
-      {"share lookup by path fails", "/photo/2019",
-       [](P& pf, auto&) { pf.share_name_path_get_fails = true; }, IndexRule::kNoShare,
-       "WEZOShareNamePathGet", "GetShareNamePathByFullPath failed, path=%s"},
-      {"share record lookup fails", "/photo/2019", [](P& pf, auto&) { pf.share_get_fails = true; },
-       IndexRule::kShareUnreadable, "WEZOShareGet", "WEZOShareGet failed, share=photo"},
-      {"excluded share", "/surveillance/cam", none, IndexRule::kExcludedShare, "WEZOShareGet",
-       nullptr},
-      {"excluded names are case-sensitive", "/Surveillance/cam", none, IndexRule::kIndexable,
-       "WEZOFSDirIsMntPoint", nullptr},
-      {"encrypted share", "/photo/2019", [](P& pf, auto&) { pf.shares["photo"].encrypted = true; },
-       IndexRule::kEncryptedShare, "WLIBShareIsReadOnlyGet", nullptr},
-      {"encryption query fails", "/photo/2019",
-       [](P& pf, auto&) { pf.encrypted_query_fails = true; }, IndexRule::kShareStateUnknown,
-       "WLIBShareIsEncryptedGet", nullptr},
-      {"read-only share", "/photo/2019", [](P& pf, auto&) { pf.shares["photo"].readOnly = true; },
-       IndexRule::kReadOnlyShare, "WLIBShareIsReadOnlyGet", nullptr},
-      {"encrypted and read-only share", "/photo/2019",
-       [](P& pf, auto&) { pf.shares["photo"].encrypted = pf.shares["photo"].readOnly = true; },
-       IndexRule::kEncryptedShare, "WLIBShareIsReadOnlyGet", nullptr},
-      {"read-only query fails", "/photo/2019",
-       [](P& pf, auto&) { pf.read_only_query_fails = true; }, IndexRule::kShareStateUnknown,
-       "WLIBShareIsReadOnlyGet", nullptr},
-      {"mount point", "/photo/2019", [](P& pf, auto& p) { pf.facts[p].mountPoint = 1; },
-       IndexRule::kMountPoint, "WLIBShareIsEncryptionGet",
+      {"", "", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
+      {"/photo/#recycle-notes", "recycle", R::kRecycleBin, "WEZOShareIsShareRecycle", ""},
+      {"/photo/#snapshot", "snapshot", R::kSnapshot, "WLIBFhsPathInSnapshot", ""},
+      {"/photo/#snapshot", "snapshot snapshot?", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
+      {"", "unknown-fs", R::kUnknownFileSystem, "WEZOGetFSType", ""},
+      // A remote file system is refused before the share is looked at.
+      {"/surveillance/cam", "remote-fs", R::kRemoteFileSystem, "WEZOFSIsRemoteFS", ""},
+      {"", "image-fs", R::kImageFileSystem, "WEZOFSIsImageFS", ""},
+      {"", "never-fs", R::kNeverIndexedFileSystem, "WEZOFSIsImageFS", ""},
+      {"", "share-by-path?", R::kNoShare, "WEZOShareNamePathGet",
+       "GetShareNamePathByFullPath failed, path=%s"},
+      {"", "share?", R::kShareUnreadable, "WEZOShareGet", "WEZOShareGet failed, share=photo"},
+      {"/surveillance/cam", "", R::kExcludedShare, "WEZOShareGet", ""},
+      // Excluded share names are case-sensitive.
+      {"/Surveillance/cam", "", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
+      {"", "encrypted", R::kEncryptedShare, "WLIBShareIsReadOnlyGet", ""},
+      {"", "encrypted?", R::kShareStateUnknown, "WLIBShareIsEncryptedGet", ""},
+      {"", "read-only", R::kReadOnlyShare, "WLIBShareIsReadOnlyGet", ""},
+      {"", "encrypted read-only", R::kEncryptedShare, "WLIBShareIsReadOnlyGet", ""},
+      {"", "read-only?", R::kShareStateUnknown, "WLIBShareIsReadOnlyGet", ""},
+      {"", "mount", R::kMountPoint, "WLIBShareIsEncryptionGet",
        "Mount point[%s] is not allowed to be indexed"},
-      {"mount point of a share set up for encryption", "/photo/2019",
-       [](P& pf, auto& p) { pf.facts[p].mountPoint = pf.shares["photo"].encryption = 1; },
-       IndexRule::kIndexable, "WLIBShareIsEncryptionGet", nullptr},
-      {"mount point, encryption setting unknown", "/photo/2019",
-       [](P& pf, auto& p) { pf.facts[p].mountPoint = pf.encryption_query_fails = 1; },
-       IndexRule::kIndexable, "WLIBShareIsEncryptionGet", nullptr},
-      {"trailing slash", "/photo/2019/", none, IndexRule::kResolvesElsewhere, "WEZOFSDirIsMntPoint",
-       "check realpath failed, path=%s"},
-      {"dot component", "/photo/./2019", none, IndexRule::kResolvesElsewhere, "WEZOFSDirIsMntPoint",
-       "check realpath failed, path=%s"},
-      {"symbolic link", "/photo/link", none, IndexRule::kResolvesElsewhere, "WEZOFSDirIsMntPoint",
-       "check realpath failed, path=%s"},
-      {"missing folder", "/photo/2020", none, IndexRule::kResolvesElsewhere, "WEZOFSDirIsMntPoint",
-       "check realpath failed, path=%s"},
-  };
+      {"", "mount encryption", R::kIndexable, "WLIBShareIsEncryptionGet", ""},
+      {"", "mount encryption?", R::kIndexable, "WLIBShareIsEncryptionGet", ""},
+      {"/photo/2019/", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath},
+      {"/photo/./2019", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath},
+      {"/photo/link", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath},
+      {"/photo/2020", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath}};
   for (const auto& c : cases) {
-    SCOPED_TRACE(c.name);
+    SCOPED_TRACE(std::string(c.folder) + " " + c.setup);
     fake::Reset();
     for (const char* share : {"photo", "surveillance", "Surveillance"}) {
       fake::Get().AddShare(share, volume + "/" + share);
     }
     log.Clear();
-    const std::string fullPath = volume + c.folder;
-    c.setup(fake::Get(), fullPath);
-
+    const std::string fullPath = volume + (*c.folder != '\0' ? c.folder : "/photo/2019");
+    Arrange(c.setup, fullPath);
     EXPECT_EQ(CanFullPathBeIndexed(fullPath), c.rule == IndexRule::kIndexable);
     // Calls after the deciding one are bookkeeping (releasing the share record).
     std::vector<std::string> ops = fake::Get().OpNames();
@@ -122,7 +113,7 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
     EXPECT_EQ(fake::Get().openShareRecords, 0);
     EXPECT_EQ(ErrorHandler::GetError(),
               c.rule == IndexRule::kNoShare ? FILEINDEX_ERR_PATH : FILEINDEX_ERR_NONE);
-    if (c.logLine == nullptr) {
+    if (*c.logLine == '\0') {
       EXPECT_THAT(log.Lines(), IsEmpty());
     } else {
       char expected[512];
@@ -182,24 +173,22 @@ TEST_F(EligibilityTest, CrawledItemsAreSkippedByNameLocationAndFileSystem) {
     const char* path;
     fake::PathFacts facts;
     bool skipped;
-  } cases[] = {
-      {"no-slash", local, true},
-      {"/volume1/photo/.DS_Store", local, true},
-      {"/volume1/photo/x.DS_Store", local, false},
-      {"/volume1/photo/.ds_store", local, false},
-      {"/volume1/photo/@eaDir", local, true},
-      {"/volume1/photo/WEZO@file_index_queue", local, true},
-      {"/volume1/photo/WEZO@.fileindexdb", local, true},
-      {"/volume1/photo/.TemporaryItems", local, true},
-      {"/volume1/photo/.WEZOPPSDB", local, true},
-      {"/volume1/photo/#recycle/a", {fake::kLocalFs, 0, true, false}, true},
-      {"/volume1/photo/#recycle-notes/a", local, false},
-      {"/volume1/photo/#snapshot/a", {fake::kLocalFs, 0, false, true}, true},
-      {"/volume1/photo/a", {WEZO_FSTYPE_UNKNOWN, 0, false, false}, false},
-      {"/volume1/photo/a", {fake::kRemoteFs, 0, false, false}, true},
-      {"/volume1/photo/a", {fake::kImageFs, 0, false, false}, true},
-      {"/volume1/photo/a", {WEZO_FSTYPE_NEVER_INDEXED, 0, false, false}, true},
-  };
+  } cases[] = {{"no-slash", local, true},
+               {"/volume1/photo/.DS_Store", local, true},
+               {"/volume1/photo/x.DS_Store", local, false},
+               {"/volume1/photo/.ds_store", local, false},
+               {"/volume1/photo/@eaDir", local, true},
+               {"/volume1/photo/WEZO@file_index_queue", local, true},
+               {"/volume1/photo/WEZO@.fileindexdb", local, true},
+               {"/volume1/photo/.TemporaryItems", local, true},
+               {"/volume1/photo/.WEZOPPSDB", local, true},
+               {"/volume1/photo/#recycle/a", {fake::kLocalFs, 0, true, false}, true},
+               {"/volume1/photo/#recycle-notes/a", local, false},
+               {"/volume1/photo/#snapshot/a", {fake::kLocalFs, 0, false, true}, true},
+               {"/volume1/photo/a", {WEZO_FSTYPE_UNKNOWN, 0, false, false}, false},
+               {"/volume1/photo/a", {fake::kRemoteFs, 0, false, false}, true},
+               {"/volume1/photo/a", {fake::kImageFs, 0, false, false}, true},
+               {"/volume1/photo/a", {WEZO_FSTYPE_NEVER_INDEXED, 0, false, false}, true}};
   for (const auto& c : cases) {
     fake::Reset();
     fake::Get().defaultFacts = c.facts;

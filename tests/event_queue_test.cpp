@@ -74,13 +74,11 @@ TEST_F(EventQueueTest, AQueuedReindexOfExactlyThePathCoversEveryEvent) {
     std::string inTmp;
     int event;
     bool written;
-  } cases[] = {
-      {Line(kEventReindex, folder), "", 2, false},
-      {"", Line(kEventReindex, folder), kEventUpdate, false},  // only in the .tmp file
-      {Line(kEventReindex, folder + "/"), "", kEventUpdate, true},
-      {Line(kEventUpdate, folder), "", kEventUpdate, true},
-      {Line(kEventReindex, volume + "/photo"), "", kEventUpdate, true},
-  };
+  } cases[] = {{Line(kEventReindex, folder), "", 2, false},
+               {"", Line(kEventReindex, folder), kEventUpdate, false},  // only in the .tmp file
+               {Line(kEventReindex, folder + "/"), "", kEventUpdate, true},
+               {Line(kEventUpdate, folder), "", kEventUpdate, true},
+               {Line(kEventReindex, volume + "/photo"), "", kEventUpdate, true}};
   for (const auto& c : cases) {
     WriteFile(queue, c.inQueue);
     WriteFile(queue + ".tmp", c.inTmp);
@@ -136,38 +134,36 @@ TEST_F(EventQueueTest, AnEventThatCannotBeQueuedFlagsItsShareForAFullReindex) {
     std::function<void()> arrange;
     const char* share;
     std::vector<std::string> lines;
-  } cases[] = {
-      {"outside every share",
-       "/elsewhere/x",
-       [] {},
-       "",
-       {"utils:N WEZOShareNamePathGet failed, path=/elsewhere/x"}},
-      {"a symbolic link planted as the queue",
-       folder,
-       [&] { std::filesystem::create_symlink(target, queue); },
-       "photo",
-       {refused + "Too many levels of symbolic links"}},
-      {"the metadata directory is missing",
-       volume + "/video/a",
-       [] { fake::Get().ea_mkdir_fails = true; },
-       "video",
-       {"utils:N WEZOEAMKDir failed, path=" + volume + "/video/@eaDir, code=3585",
-        "utils:N Failed to open queue=" + volume +
-            "/video/@eaDir/WEZO@file_index_queue, reason=No such file or directory"}},
-      {"a FIFO that nobody reads",
-       folder,
-       [&] { mkfifo(queue.c_str(), 0644); },
-       "photo",
-       {refused + "No such device or address"}},
-      {"a FIFO with a reader",
-       folder,
-       [&] {
-         mkfifo(queue.c_str(), 0644);
-         reader = open(queue.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
-       },
-       "photo",
-       {refused + "No such device or address"}},
-  };
+  } cases[] = {{"outside every share",
+                "/elsewhere/x",
+                [] {},
+                "",
+                {"utils:N WEZOShareNamePathGet failed, path=/elsewhere/x"}},
+               {"a symbolic link planted as the queue",
+                folder,
+                [&] { std::filesystem::create_symlink(target, queue); },
+                "photo",
+                {refused + "Too many levels of symbolic links"}},
+               {"the metadata directory is missing",
+                volume + "/video/a",
+                [] { fake::Get().ea_mkdir_fails = true; },
+                "video",
+                {"utils:N WEZOEAMKDir failed, path=" + volume + "/video/@eaDir, code=3585",
+                 "utils:N Failed to open queue=" + volume +
+                     "/video/@eaDir/WEZO@file_index_queue, reason=No such file or directory"}},
+               {"a FIFO that nobody reads",
+                folder,
+                [&] { mkfifo(queue.c_str(), 0644); },
+                "photo",
+                {refused + "No such device or address"}},
+               {"a FIFO with a reader",
+                folder,
+                [&] {
+                  mkfifo(queue.c_str(), 0644);
+                  reader = open(queue.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
+                },
+                "photo",
+                {refused + "No such device or address"}}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
     std::filesystem::remove(StatusConfPath());

@@ -87,17 +87,15 @@ TEST_F(JsonIoTest, RemovesOnlyOldRegularTemporariesOfTheFile) {
     Kind kind;
     bool old;
     bool removed;
-  } cases[] = {
-      {"folder.conf.a1B2c3", kFile, true, true},
-      {"folder.conf.Z9z9Z9", kFile, false, false},  // its writer may still be saving
-      {"folder.conf.a1B2c", kFile, true, false},
-      {"folder.conf.a1B2c3d", kFile, true, false},
-      {"folder.conf.a1-2c3", kFile, true, false},
-      {"folder.confXa1B2c3", kFile, true, false},
-      {"status.conf.a1B2c3", kFile, true, false},
-      {"folder.conf.L1nk00", kLink, true, false},
-      {"folder.conf.D1r000", kDir, true, false},
-  };
+  } cases[] = {{"folder.conf.a1B2c3", kFile, true, true},
+               {"folder.conf.Z9z9Z9", kFile, false, false},  // its writer may still be saving
+               {"folder.conf.a1B2c", kFile, true, false},
+               {"folder.conf.a1B2c3d", kFile, true, false},
+               {"folder.conf.a1-2c3", kFile, true, false},
+               {"folder.confXa1B2c3", kFile, true, false},
+               {"status.conf.a1B2c3", kFile, true, false},
+               {"folder.conf.L1nk00", kLink, true, false},
+               {"folder.conf.D1r000", kDir, true, false}};
   const std::string target = sandbox.Path("/target");
   testsupport::WriteFile(target, "keep");
   for (const auto& c : cases) {

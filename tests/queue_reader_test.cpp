@@ -61,25 +61,23 @@ TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
     std::string line;
     const char* event;
     bool quick;  // what the writers produce must not need the parser
-  } cases[] = {
-      {R"({"event":2,"path":"/p"})", "2 /p ", true},
-      {R"( {"path_old":"/o", "path":"/p","event":256 } )", "256 /p /o", true},
-      {R"({"event":256,"path":"/p","path_old":7})", "256 /p ", true},
-      {R"({"event":2,"path":"/p","data":{"a":[1,-2.5,"x",true,false,null,{}],"b":[]}})", "2 /p ",
-       true},
-      {R"({"event":4294967295,"path":"/p"})", "4294967295 /p ", true},
-      {R"({"event":+1,"path":"/p"})", "1 /p ", false},
-      {R"({"event":1.5,"path":"/p"})", "1 /p ", false},
-      {R"({"event":true,"path":"/p"})", "1 /p ", false},
-      {"{\"event\":2,\"path\":\"/p\"}\0 x"s, "2 /p ", false},
-      {R"({"event":2,"path":"/caf\u00e9\/x"})", "2 /caf\xC3\xA9/x ", false},
-      {R"({"event":4294967296,"path":"/p"})", "none", false},
-      {R"({"event":2,"path":3})", "none", false},
-      {R"({"event":2})", "none", false},
-      {R"([{"event":2,"path":"/p"}])", "none", false},
-      {R"({"event":2,"path":"/p","data":)" + std::string(2000, '[') + "]}", "none", false},
-      {"", "none", false},
-  };
+  } cases[] = {{R"({"event":2,"path":"/p"})", "2 /p ", true},
+               {R"( {"path_old":"/o", "path":"/p","event":256 } )", "256 /p /o", true},
+               {R"({"event":256,"path":"/p","path_old":7})", "256 /p ", true},
+               {R"({"event":2,"path":"/p","data":{"a":[1,-2.5,"x",true,false,null,{}],"b":[]}})",
+                "2 /p ", true},
+               {R"({"event":4294967295,"path":"/p"})", "4294967295 /p ", true},
+               {R"({"event":+1,"path":"/p"})", "1 /p ", false},
+               {R"({"event":1.5,"path":"/p"})", "1 /p ", false},
+               {R"({"event":true,"path":"/p"})", "1 /p ", false},
+               {"{\"event\":2,\"path\":\"/p\"}\0 x"s, "2 /p ", false},
+               {R"({"event":2,"path":"/caf\u00e9\/x"})", "2 /caf\xC3\xA9/x ", false},
+               {R"({"event":4294967296,"path":"/p"})", "none", false},
+               {R"({"event":2,"path":3})", "none", false},
+               {R"({"event":2})", "none", false},
+               {R"([{"event":2,"path":"/p"}])", "none", false},
+               {R"({"event":2,"path":"/p","data":)" + std::string(2000, '[') + "]}", "none", false},
+               {"", "none", false}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.line);
     EXPECT_EQ(Parsed(c.line), c.event);
@@ -109,8 +107,7 @@ TEST_F(QueueReaderTest, ReadersMatchTheExactPathOrTheFolderAndBelow) {
       {"old path on another event", false, "", Ev("2", other, R"(,"path_old":")" + p + "\""),
        false},
       {"old path not a string", false, "", Ev("256", other, R"(,"path_old":[")" + p + "\"]"),
-       false},
-  };
+       false}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
     EXPECT_EQ(c.reindex ? IsReindexQueued(c.path, Queue(c.text))

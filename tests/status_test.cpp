@@ -11,8 +11,7 @@
 #include "paths.h"
 #include "test_support.h"
 
-namespace WEZO {
-namespace FILEINDEX {
+namespace WEZO::FILEINDEX {
 namespace {
 
 using ::testing::ElementsAre;
@@ -33,28 +32,23 @@ TEST_F(StatusTest, PauseStateReadsMinusOneWhenAbsentAndRefusesWhatIsNotAnInteger
     bool readable;
     long long resumeTime;
   };
-  const Case cases[] = {
-      {"{}", true, -1},
-      {R"({"resume_time":0})", true, 0},
-      {R"({"resume_time":4102444800})", true, 4102444800LL},
-      {R"({"resume_time":-1})", true, -1},
-      {R"({"resume_time":"abc"})", false, 42},
-      {R"({"resume_time":[1]})", false, 42},
-      {R"({"resume_time":1e30})", false, 42},
-      {"[1]", false, 42},
-  };
+  const Case cases[] = {{"{}", true, -1},
+                        {R"({"resume_time":0})", true, 0},
+                        {R"({"resume_time":4102444800})", true, 4102444800LL},
+                        {R"({"resume_time":-1})", true, -1},
+                        {R"({"resume_time":"abc"})", false, 42},
+                        {R"({"resume_time":[1]})", false, 42},
+                        {R"({"resume_time":1e30})", false, 42},
+                        {"[1]", false, 42}};
   for (const Case& c : cases) {
     Status status;
     LoadText(status, c.file);
     log.Clear();
     long long resumeTime = 42;
-    EXPECT_EQ(status.GetPauseInfo(resumeTime), c.readable) << c.file;
+    EXPECT_EQ(status.GetPauseInfo(resumeTime), c.resumeTime != 42) << c.file;
     EXPECT_EQ(resumeTime, c.resumeTime) << c.file;
-    if (c.readable) {
-      EXPECT_THAT(log.Lines(), IsEmpty());
-    } else {
-      EXPECT_THAT(log.Lines(), ElementsAre("status:N json exception"));
-    }
+    const std::vector<std::string> refused = {"status:N json exception"};
+    EXPECT_EQ(log.Lines(), c.resumeTime != 42 ? std::vector<std::string>{} : refused);
   }
 
   Status status;
@@ -114,11 +108,8 @@ TEST_F(StatusTest, ShareFlagsAreAddedAndRemovedByPresence) {
 TEST_F(StatusTest, MarkersReadAsBooleansWithoutThrowing) {
   Status status;
   LoadText(status, R"({"t":true,"f":false,"one":1,"zero":0,"text":"yes","obj":{},"null":null})");
-  const std::pair<const char*, bool> cases[] = {{"t", true},     {"f", false},     {"one", true},
-                                                {"zero", false}, {"text", false},  {"obj", false},
-                                                {"null", false}, {"absent", false}};
-  for (const auto& [key, expected] : cases) {
-    EXPECT_EQ(status.IsUpdated(key), expected) << key;
+  for (const char* key : {"t", "f", "one", "zero", "text", "obj", "null", "absent"}) {
+    EXPECT_EQ(status.IsUpdated(key), key == std::string("t") || key == std::string("one")) << key;
   }
   status.SetUpdated("absent");
   EXPECT_TRUE(status.IsUpdated("absent"));
@@ -134,5 +125,4 @@ TEST_F(StatusTest, MarkersReadAsBooleansWithoutThrowing) {
 }
 
 }  // namespace
-}  // namespace FILEINDEX
-}  // namespace WEZO
+}  // namespace WEZO::FILEINDEX

@@ -5,8 +5,6 @@
 #include <filesystem>
 #include <functional>
 #include <map>
-#include <string>
-#include <vector>
 
 #include "fake_platform.h"
 #include "fileindex/fileindex_c.h"
@@ -30,38 +28,33 @@ class StorageTest : public testsupport::LibraryTest {
 
 TEST_F(StorageTest, RefusesBadArgumentsInOrderWithThePlatformError) {
   char buffer[64];
+  const auto bad = [](const char* what) {
+    return std::string("utils:N Invaild Argument (") + what + ")=[0]\n";
+  };
   const struct {
     Getter getter;
     const char* name;
     char* out;
     int size;
-    const char* line;
-  } cases[] = {
-      {FILEIDXQueuePathGet, nullptr, nullptr, 0,
-       "utils:N Invaild Argument (__null != szName)=[0]\n"},
-      {FILEIDXQueuePathGet, "photo", nullptr, 0,
-       "utils:N Invaild Argument (__null != szOutQueuePath)=[0]\n"},
-      {FILEIDXDBPathGet, "photo", nullptr, 64,
-       "utils:N Invaild Argument (__null != szOutDBPath)=[0]\n"},
-      {FILEIDXQueuePathGet, "photo", buffer, 0, "utils:N Invaild Argument (cbOutLen > 0)=[0]\n"},
-      {FILEIDXDBPathGet, "photo", buffer, -5, "utils:N Invaild Argument (cbOutLen > 0)=[0]\n"},
-  };
+    std::string line;
+    int code;  // the platform's last error afterwards
+  } cases[] = {{FILEIDXQueuePathGet, nullptr, nullptr, 0, bad("__null != szName"), 0xD00},
+               {FILEIDXQueuePathGet, "photo", nullptr, 0, bad("__null != szOutQueuePath"), 0xD00},
+               {FILEIDXDBPathGet, "photo", nullptr, 64, bad("__null != szOutDBPath"), 0xD00},
+               {FILEIDXQueuePathGet, "photo", buffer, 0, bad("cbOutLen > 0"), 0xD00},
+               {FILEIDXDBPathGet, "photo", buffer, -5, bad("cbOutLen > 0"), 0xD00},
+               // Left by the lookup, not replaced.
+               {FILEIDXDBPathGet, "nosuch", buffer, 64,
+                "utils:N WEZOShareGet failed, name=nosuch, code=3585", fake::kInjectedError}};
   for (const auto& c : cases) {
     fake::Reset();
     log.Clear();
     EXPECT_EQ(c.getter(c.name, c.out, c.size), -1) << c.line;
     EXPECT_THAT(log.Lines(), ElementsAre(c.line));
-    EXPECT_EQ(fake::Get().errCode, 0xD00);
-    EXPECT_THAT(fake::Get().calls, IsEmpty()) << "nothing is looked up";
+    EXPECT_EQ(fake::Get().errCode, c.code);
+    EXPECT_EQ(fake::Get().calls.empty(), c.code == 0xD00) << "nothing is looked up";
+    EXPECT_EQ(fake::Get().openShareRecords, 0);
   }
-}
-
-TEST_F(StorageTest, UnknownShareFailsWithoutSettingAPlatformError) {
-  char buffer[256];
-  EXPECT_EQ(FILEIDXDBPathGet("nosuch", buffer, sizeof buffer), -1);
-  EXPECT_EQ(fake::Get().errCode, fake::kInjectedError) << "left by the lookup, not replaced";
-  EXPECT_THAT(log.Lines(), ElementsAre("utils:N WEZOShareGet failed, name=nosuch, code=3585"));
-  EXPECT_EQ(fake::Get().openShareRecords, 0);
 }
 
 TEST_F(StorageTest, WritesTheLocationsAndCreatesOnlyTheirDirectories) {
@@ -102,12 +95,11 @@ TEST_F(StorageTest, TheDatabaseDirectoryIsWritableByItsOwnerOnlyWhateverTheUmask
   }
   EXPECT_THAT(log.Lines(), IsEmpty());
   EXPECT_EQ(fake::Get().openShareRecords, 0);
-}
 
-TEST_F(StorageTest, DirectoriesThatCannotBeCreatedAreLoggedAndThePathStillReturned) {
+  // Directories that cannot be made are logged, and the path still returned.
   fake::Get().ea_mkdir_fails = true;
+  std::filesystem::remove_all(volume + "/photo/@eaDir");
   char buffer[4096];
-  const std::string db = volume + "/photo/@eaDir/WEZO@.fileindexdb";
   EXPECT_EQ(FILEIDXDBPathGet("photo", buffer, sizeof buffer), static_cast<int>(db.size()));
   EXPECT_THAT(
       log.Lines(),
@@ -140,20 +132,19 @@ TEST_F(StorageTest, NothingBelowTheShareIsReachedThroughALinkInTheMetadataDirect
     std::function<bool()> run;
     bool result;
     std::string lastLine;
-  } cases[] = {
-      {"database directory",
-       [&] {
-         char buffer[4096];
-         return FILEIDXDBPathGet("photo", buffer, sizeof buffer) == static_cast<int>(db.size());
-       },
-       true, "utils:N mkdir failed, path=" + db + ", " + linked},
-      {"duplicate check", [&] { return IsReindexQueued(folder, queue); }, false,
-       "utils:N Failed to open queue=" + queue + ", " + linked},
-      {"progress", [&] { return QueueHasFolderEvent("/photo/a", queue); }, false,
-       "status_mgr:N Failed to open queue=" + queue + ", " + linked},
-      {"index data removal", [&] { return IndexMgr::CleanShareIndexData("photo"); }, false,
-       "index_mgr:N Failed to remove " + db + ", " + linked},
-  };
+  } cases[] = {{"database directory",
+                [&] {
+                  char buffer[4096];
+                  return FILEIDXDBPathGet("photo", buffer, sizeof buffer) ==
+                         static_cast<int>(db.size());
+                },
+                true, "utils:N mkdir failed, path=" + db + ", " + linked},
+               {"duplicate check", [&] { return IsReindexQueued(folder, queue); }, false,
+                "utils:N Failed to open queue=" + queue + ", " + linked},
+               {"progress", [&] { return QueueHasFolderEvent("/photo/a", queue); }, false,
+                "status_mgr:N Failed to open queue=" + queue + ", " + linked},
+               {"index data removal", [&] { return IndexMgr::CleanShareIndexData("photo"); }, false,
+                "index_mgr:N Failed to remove " + db + ", " + linked}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
     std::filesystem::remove_all(metadata);
@@ -184,9 +175,7 @@ TEST_F(StorageTest, RemovingIndexDataTakesWholeTreesAndLinksButNeverWhatALinkPoi
   std::filesystem::create_symlink(out + "/file", metadata + "/WEZO@file_index_queue.tmp");
   std::filesystem::create_directory_symlink(out, db + "/a/out");
   std::string deepest = db;
-  for (int depth = 0; depth < kMaxRemovalDepth; ++depth) {
-    deepest += "/d";
-  }
+  for (int depth = 0; depth < kMaxRemovalDepth; ++depth) deepest += "/d";
   std::filesystem::create_directories(deepest);
 
   // One level too deep: that tree stays, the other locations go all the same.

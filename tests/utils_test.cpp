@@ -86,12 +86,11 @@ TEST_F(UtilsTest, JsonReadersTakeOnlyMembersOfTheirOwnType) {
     const Json::Value* from;
     const char* string;  // what the string reader gives, or nullptr
     int boolean;         // what the bool reader gives, or -1
-  } cases[] = {
-      {"s", &obj, "text", -1},    {"e", &obj, "", -1},           {"b", &obj, nullptr, 1},
-      {"n", &obj, nullptr, -1},   {"z", &obj, nullptr, -1},      {"sb", &obj, "true", -1},
-      {"one", &obj, nullptr, -1}, {"absent", &obj, nullptr, -1}, {"0", &array, nullptr, -1},
-      {"s", &text, nullptr, -1},
-  };
+  } cases[] = {{"s", &obj, "text", -1},    {"e", &obj, "", -1},
+               {"b", &obj, nullptr, 1},    {"n", &obj, nullptr, -1},
+               {"z", &obj, nullptr, -1},   {"sb", &obj, "true", -1},
+               {"one", &obj, nullptr, -1}, {"absent", &obj, nullptr, -1},
+               {"0", &array, nullptr, -1}, {"s", &text, nullptr, -1}};
   for (const auto& c : cases) {
     std::string s = "untouched";
     bool b = false;
@@ -106,16 +105,14 @@ TEST_F(UtilsTest, StringStartWithComparesAsCStrings) {
   const struct {
     std::string str, prefix;
     bool expected;
-  } cases[] = {
-      {"/volume1", "", true},
-      {"/vol", "/volume1", false},
-      {"/volume1/x", "/volume1", true},
-      {"/volume1", "/volume1", true},
-      {"/Volume1", "/volume1", false},
-      {"", "/", false},
-      // Bytes after an embedded NUL are not compared.
-      {std::string("/a\0x", 4), std::string("/a\0y", 4), true},
-  };
+  } cases[] = {{"/volume1", "", true},
+               {"/vol", "/volume1", false},
+               {"/volume1/x", "/volume1", true},
+               {"/volume1", "/volume1", true},
+               {"/Volume1", "/volume1", false},
+               {"", "/", false},
+               // Bytes after an embedded NUL are not compared.
+               {std::string("/a\0x", 4), std::string("/a\0y", 4), true}};
   for (const auto& c : cases) {
     EXPECT_EQ(StringStartWith(c.str, c.prefix), c.expected) << c.str << " / " << c.prefix;
   }
@@ -126,16 +123,14 @@ TEST_F(UtilsTest, SharePathsSplitAtTheFirstComponent) {
     const char* path;
     const char* name;      // nullptr: refused
     const char* replaced;  // ReplaceShareName(path, "b")
-  } cases[] = {
-      {"/photo/2019", "photo", "/b/2019"},
-      {"/photo", "photo", "/b"},
-      {"/photo/", "photo", "/b/"},
-      {"/", "", "/b"},
-      {"/a/b/c", "a", "/b/b/c"},
-      {"photo/2019", "hoto", nullptr},
-      {"//x", "", nullptr},
-      {"", nullptr, ""},
-  };
+  } cases[] = {{"/photo/2019", "photo", "/b/2019"},
+               {"/photo", "photo", "/b"},
+               {"/photo/", "photo", "/b/"},
+               {"/", "", "/b"},
+               {"/a/b/c", "a", "/b/b/c"},
+               {"photo/2019", "hoto", nullptr},
+               {"//x", "", nullptr},
+               {"", nullptr, ""}};
   for (const auto& c : cases) {
     std::string name = "old";
     EXPECT_EQ(GetShareNameByPath(name, c.path), c.name != nullptr) << c.path;
@@ -156,15 +151,13 @@ TEST_F(UtilsTest, FullPathTakesTheVolumeFromWhereTheShareLies) {
     bool shareGetFails;
     _tag_fileindex_err_ code;
     std::vector<std::string> lines;
-  } cases[] = {
-      {"/photo/2019", volume + "/photo/2019", false, FILEINDEX_ERR_NONE, {}},
-      {"/photo/", volume + "/photo/", false, FILEINDEX_ERR_NONE, {}},
-      {"/photo/a//b/../c", volume + "/photo/a//b/../c", false, FILEINDEX_ERR_NONE, {}},
-      {"/flat/x", "flatshare/flat/x", false, FILEINDEX_ERR_NONE, {}},
-      {"/music/a", "", false, FILEINDEX_ERR_PATH, {}},
-      {"/photo/a", "", true, FILEINDEX_ERR_PATH, {}},
-      {"", "", false, FILEINDEX_ERR_NONE, {"utils:N GetShareNameByPath failed, path="}},
-  };
+  } cases[] = {{"/photo/2019", volume + "/photo/2019", false, FILEINDEX_ERR_NONE, {}},
+               {"/photo/", volume + "/photo/", false, FILEINDEX_ERR_NONE, {}},
+               {"/photo/a//b/../c", volume + "/photo/a//b/../c", false, FILEINDEX_ERR_NONE, {}},
+               {"/flat/x", "flatshare/flat/x", false, FILEINDEX_ERR_NONE, {}},
+               {"/music/a", "", false, FILEINDEX_ERR_PATH, {}},
+               {"/photo/a", "", true, FILEINDEX_ERR_PATH, {}},
+               {"", "", false, FILEINDEX_ERR_NONE, {"utils:N GetShareNameByPath failed, path="}}};
   for (const auto& c : cases) {
     fake::Get().share_get_fails = c.shareGetFails;
     fake::Get().calls.clear();

@@ -17,10 +17,8 @@ TEST_F(ExecTest, OnlyAProgramThatExitsWithZeroSucceeds) {
   const struct {
     std::string program;
     bool succeeds;
-  } cases[] = {
-      {"/bin/true", true},   {"/bin/false", false}, {At("exit3"), false},
-      {At("killed"), false}, {At("plain"), false},  {At("missing"), false},
-  };
+  } cases[] = {{"/bin/true", true},   {"/bin/false", false}, {At("exit3"), false},
+               {At("killed"), false}, {At("plain"), false},  {At("missing"), false}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.program);
     const char* const argv[] = {c.program.c_str(), nullptr};
