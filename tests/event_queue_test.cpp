@@ -126,50 +126,31 @@ TEST_F(EventQueueTest, AQueueKeptLockedByAnotherProcessDropsTheEventAndSucceeds)
 TEST_F(EventQueueTest, AnEventThatCannotBeQueuedFlagsItsShareForAFullReindex) {
   const std::string target = volume + "/photo/victim";
   WriteFile(target, "keep");
-  int reader = -1;
   const std::string refused = "utils:N Failed to open queue=" + queue + ", reason=";
   const struct {
-    const char* name;
+    std::string what;  // outside every share; a link or a FIFO as the queue; no metadata folder
     std::string path;
-    std::function<void()> arrange;
     const char* share;
     std::vector<std::string> lines;
-  } cases[] = {{"outside every share",
-                "/elsewhere/x",
-                [] {},
-                "",
-                {"utils:N WEZOShareNamePathGet failed, path=/elsewhere/x"}},
-               {"a symbolic link planted as the queue",
-                folder,
-                [&] { std::filesystem::create_symlink(target, queue); },
-                "photo",
-                {refused + "Too many levels of symbolic links"}},
-               {"the metadata directory is missing",
-                volume + "/video/a",
-                [] { fake::Get().ea_mkdir_fails = true; },
-                "video",
-                {"utils:N WEZOEAMKDir failed, path=" + volume + "/video/@eaDir, code=3585",
-                 "utils:N Failed to open queue=" + volume +
-                     "/video/@eaDir/WEZO@file_index_queue, reason=No such file or directory"}},
-               {"a FIFO that nobody reads",
-                folder,
-                [&] { mkfifo(queue.c_str(), 0644); },
-                "photo",
-                {refused + "No such device or address"}},
-               {"a FIFO with a reader",
-                folder,
-                [&] {
-                  mkfifo(queue.c_str(), 0644);
-                  reader = open(queue.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC);
-                },
-                "photo",
-                {refused + "No such device or address"}}};
+  } cases[] = {
+      {"outside", "/elsewhere/x", "", {"utils:N WEZOShareNamePathGet failed, path=/elsewhere/x"}},
+      {"link", folder, "photo", {refused + "Too many levels of symbolic links"}},
+      {"fifo", folder, "photo", {refused + "No such device or address"}},
+      {"no metadata folder",
+       volume + "/video/a",
+       "video",
+       {"utils:N WEZOEAMKDir failed, path=" + volume + "/video/@eaDir, code=3585",
+        "utils:N Failed to open queue=" + volume +
+            "/video/@eaDir/WEZO@file_index_queue, reason=No such file or directory"}},
+  };
   for (const auto& c : cases) {
-    SCOPED_TRACE(c.name);
+    SCOPED_TRACE(c.what);
     std::filesystem::remove(StatusConfPath());
     std::filesystem::remove(queue);
     log.Clear();
-    c.arrange();
+    if (c.what == "link") std::filesystem::create_symlink(target, queue);
+    if (c.what == "fifo") mkfifo(queue.c_str(), 0644);
+    fake::Get().ea_mkdir_fails = c.what == "no metadata folder";
     // Bounded: opening the queue for reading releases a writer stuck on a FIFO.
     std::future<bool> added = std::async(
         std::launch::async, [&] { return AddCustomEvent(kEventUpdate, c.path, Json::Value()); });
@@ -178,8 +159,6 @@ TEST_F(EventQueueTest, AnEventThatCannotBeQueuedFlagsItsShareForAFullReindex) {
       close(open(queue.c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
     }
     EXPECT_FALSE(added.get());
-    fake::Get().ea_mkdir_fails = false;
-    if (reader >= 0) close(std::exchange(reader, -1));
     Json::Value flagged(Json::objectValue);
     flagged[c.share] = true;
     EXPECT_EQ(StatusFile()["need_reindex"], flagged);

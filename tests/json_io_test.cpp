@@ -58,18 +58,9 @@ TEST_F(JsonIoTest, FromStringRefusesAnythingButOneWholeValue) {
   EXPECT_EQ(v["a"][1].asInt(), 2);
 }
 
-TEST_F(JsonIoTest, FailedSaveLeavesTheOldFileAndNoTemporaryFile) {
-  // A directory in the file's place makes the final rename fail after the data is written.
-  const std::string path = Dir() + "/blocked.conf";
-  ASSERT_EQ(mkdir(path.c_str(), 0755), 0);
-  EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kFailed);
-  EXPECT_EQ(DirEntries(), std::vector<std::string>{"blocked.conf"});
-
-  EXPECT_EQ(JsonToFile(Json::Value(1), sandbox.Path("/no/such/dir/x.conf"), 0644),
-            JsonSaveResult::kFailed);
-}
-
-TEST_F(JsonIoTest, SaveReplacesASymbolicLinkInsteadOfWritingThroughIt) {
+// A symbolic link in the file's place is replaced, not written through; a failed save leaves
+// the old file and no temporary file.
+TEST_F(JsonIoTest, SaveReplacesTheFileWholeOrNotAtAll) {
   const std::string target = sandbox.Path("/target");
   testsupport::WriteFile(target, "keep");
   const std::string path = Dir() + "/x.conf";
@@ -78,34 +69,35 @@ TEST_F(JsonIoTest, SaveReplacesASymbolicLinkInsteadOfWritingThroughIt) {
   EXPECT_EQ(testsupport::ReadFile(target), "keep");
   EXPECT_EQ(testsupport::ReadFile(path), "{}\n");
   EXPECT_EQ(DirEntries(), std::vector<std::string>{"x.conf"});
+
+  // A directory in the file's place makes the final rename fail after the data is written.
+  ASSERT_EQ(unlink(path.c_str()) | mkdir(path.c_str(), 0755), 0);
+  EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kFailed);
+  EXPECT_EQ(DirEntries(), std::vector<std::string>{"x.conf"});
+  EXPECT_EQ(JsonToFile(Json::Value(1), sandbox.Path("/no/such/dir/x.conf"), 0644),
+            JsonSaveResult::kFailed);
 }
 
 TEST_F(JsonIoTest, RemovesOnlyOldRegularTemporariesOfTheFile) {
-  enum Kind { kFile, kLink, kDir };
+  // A new one's writer may still be saving.
   const struct {
     const char* name;
-    Kind kind;
-    bool old;
-    bool removed;
-  } cases[] = {{"folder.conf.a1B2c3", kFile, true, true},
-               {"folder.conf.Z9z9Z9", kFile, false, false},  // its writer may still be saving
-               {"folder.conf.a1B2c", kFile, true, false},
-               {"folder.conf.a1B2c3d", kFile, true, false},
-               {"folder.conf.a1-2c3", kFile, true, false},
-               {"folder.confXa1B2c3", kFile, true, false},
-               {"status.conf.a1B2c3", kFile, true, false},
-               {"folder.conf.L1nk00", kLink, true, false},
-               {"folder.conf.D1r000", kDir, true, false}};
+    char kind;  // 'f'ile, 'l'ink, 'd'irectory
+    bool old, removed;
+  } cases[] = {{"folder.conf.a1B2c3", 'f', true, true},  {"folder.conf.Z9z9Z9", 'f', false, false},
+               {"folder.conf.a1B2c", 'f', true, false},  {"folder.conf.a1B2c3d", 'f', true, false},
+               {"folder.conf.a1-2c3", 'f', true, false}, {"folder.confXa1B2c3", 'f', true, false},
+               {"status.conf.a1B2c3", 'f', true, false}, {"folder.conf.L1nk00", 'l', true, false},
+               {"folder.conf.D1r000", 'd', true, false}};
   const std::string target = sandbox.Path("/target");
   testsupport::WriteFile(target, "keep");
   for (const auto& c : cases) {
     const std::string path = Dir() + "/" + c.name;
-    if (c.kind == kFile) {
-      testsupport::WriteFile(path, "{");
-    } else {
-      ASSERT_EQ(c.kind == kLink ? symlink(target.c_str(), path.c_str()) : mkdir(path.c_str(), 0755),
-                0);
-    }
+    if (c.kind == 'f') testsupport::WriteFile(path, "{");
+    const int made = c.kind == 'l'   ? symlink(target.c_str(), path.c_str())
+                     : c.kind == 'd' ? mkdir(path.c_str(), 0755)
+                                     : 0;
+    ASSERT_EQ(made, 0) << c.name;
     const timespec twoHoursAgo[2] = {{time(nullptr) - 7200, 0}, {time(nullptr) - 7200, 0}};
     ASSERT_EQ(c.old ? utimensat(AT_FDCWD, path.c_str(), twoHoursAgo, AT_SYMLINK_NOFOLLOW) : 0, 0);
   }
@@ -120,9 +112,7 @@ TEST_F(JsonIoTest, RemovesOnlyOldRegularTemporariesOfTheFile) {
 TEST_F(JsonIoTest, ReaderNeverSeesAPartialFileWhileAnotherProcessSaves) {
   const std::string path = Dir() + "/folder.conf";
   Json::Value big(Json::objectValue);
-  for (int i = 0; i < 2000; ++i) {
-    big["/photo/" + std::to_string(i)]["name"] = std::string(40, 'n');
-  }
+  for (int i = 0; i < 2000; ++i) big["/photo/" + std::to_string(i)]["name"] = std::string(40, 'n');
   ASSERT_EQ(JsonToFile(big, path, 0644), JsonSaveResult::kReplaced);
 
   const pid_t writer = fork();
@@ -130,9 +120,7 @@ TEST_F(JsonIoTest, ReaderNeverSeesAPartialFileWhileAnotherProcessSaves) {
     Json::Value doc = big;
     for (int i = 0; i < 60; ++i) {
       doc["/video/" + std::to_string(i)]["name"] = "v";
-      if (JsonToFile(doc, path, 0644) != JsonSaveResult::kReplaced) {
-        _exit(1);
-      }
+      if (JsonToFile(doc, path, 0644) != JsonSaveResult::kReplaced) _exit(1);
     }
     _exit(0);
   }
