@@ -28,14 +28,13 @@ class EligibilityTest : public testsupport::LibraryTest {
   }
 };
 
-// Sets up what `words` name for the folder at `path`: a fact of the path, a share setting, or a
+// Sets up what `words` name for a path with `facts`: a fact of the path, a share setting, or a
 // query that fails ("?").
-void Arrange(const std::string& words, const std::string& path) {
+void Arrange(const std::string& words, fake::PathFacts& facts) {
   fake::Platform& pf = fake::Get();
   fake::Share& photo = pf.shares["photo"];
   std::istringstream in(words);
   for (std::string w; in >> w;) {
-    fake::PathFacts& facts = pf.facts[path];
     if (w == "recycle") facts.recycle = true;
     if (w == "snapshot") facts.snapshot = true;
     if (w == "mount") facts.mountPoint = 1;
@@ -103,7 +102,7 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
     }
     log.Clear();
     const std::string fullPath = volume + (*c.folder != '\0' ? c.folder : "/photo/2019");
-    Arrange(c.setup, fullPath);
+    Arrange(c.setup, fake::Get().facts[fullPath]);
     EXPECT_EQ(CanFullPathBeIndexed(fullPath), c.rule == IndexRule::kIndexable);
     // Calls after the deciding one are bookkeeping (releasing the share record).
     std::vector<std::string> ops = fake::Get().OpNames();
@@ -162,34 +161,35 @@ TEST_F(EligibilityTest, SharePathThatCannotBeResolvedSetsThePathCode) {
   EXPECT_FALSE(CanShareBeIndexed(nullptr));
 }
 
+// The file-system type is asked before anything else, whatever decides.
 TEST_F(EligibilityTest, CrawledItemsAreSkippedByNameLocationAndFileSystem) {
-  const fake::PathFacts local{};
   const struct {
-    const char* path;
-    fake::PathFacts facts;
+    const char* name;   // in /volume1/photo, but for "no-slash"
+    const char* setup;  // see Arrange()
     bool skipped;
-  } cases[] = {{"no-slash", local, true},
-               {"/volume1/photo/.DS_Store", local, true},
-               {"/volume1/photo/x.DS_Store", local, false},
-               {"/volume1/photo/.ds_store", local, false},
-               {"/volume1/photo/@eaDir", local, true},
-               {"/volume1/photo/WEZO@file_index_queue", local, true},
-               {"/volume1/photo/WEZO@.fileindexdb", local, true},
-               {"/volume1/photo/.TemporaryItems", local, true},
-               {"/volume1/photo/.WEZOPPSDB", local, true},
-               {"/volume1/photo/#recycle/a", {fake::kLocalFs, 0, true, false}, true},
-               {"/volume1/photo/#recycle-notes/a", local, false},
-               {"/volume1/photo/#snapshot/a", {fake::kLocalFs, 0, false, true}, true},
-               {"/volume1/photo/a", {WEZO_FSTYPE_UNKNOWN, 0, false, false}, false},
-               {"/volume1/photo/a", {fake::kRemoteFs, 0, false, false}, true},
-               {"/volume1/photo/a", {fake::kImageFs, 0, false, false}, true},
-               {"/volume1/photo/a", {WEZO_FSTYPE_NEVER_INDEXED, 0, false, false}, true}};
+  } cases[] = {{"no-slash", "", true},
+               {".DS_Store", "", true},
+               {"x.DS_Store", "", false},
+               {".ds_store", "", false},
+               {"@eaDir", "", true},
+               {"WEZO@file_index_queue", "", true},
+               {"WEZO@.fileindexdb", "", true},
+               {".TemporaryItems", "", true},
+               {".WEZOPPSDB", "", true},
+               {"#recycle/a", "recycle", true},
+               {"#recycle-notes/a", "", false},
+               {"#snapshot/a", "snapshot", true},
+               {"a", "unknown-fs", false},
+               {"a", "remote-fs", true},
+               {"a", "image-fs", true},
+               {"a", "never-fs", true}};
   for (const auto& c : cases) {
     fake::Reset();
-    fake::Get().defaultFacts = c.facts;
-    EXPECT_EQ(IsSkipIndex(c.path), c.skipped) << c.path << " type " << c.facts.fsType;
-    // The file-system type is asked before anything else, whatever decides.
-    EXPECT_EQ(fake::Get().OpNames().front(), "WEZOGetFSType") << c.path;
+    Arrange(c.setup, fake::Get().defaultFacts);
+    const std::string path =
+        std::string(c.name) == "no-slash" ? c.name : std::string("/volume1/photo/") + c.name;
+    EXPECT_EQ(IsSkipIndex(path), c.skipped) << path << " " << c.setup;
+    EXPECT_EQ(fake::Get().OpNames().front(), "WEZOGetFSType") << path;
   }
 }
 
