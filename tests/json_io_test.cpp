@@ -1,7 +1,6 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <sys/stat.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <ctime>
@@ -107,37 +106,6 @@ TEST_F(JsonIoTest, RemovesOnlyOldRegularTemporariesOfTheFile) {
     EXPECT_EQ(lstat((Dir() + "/" + c.name).c_str(), &st) != 0, c.removed) << c.name;
   }
   EXPECT_EQ(testsupport::ReadFile(target), "keep");
-}
-
-TEST_F(JsonIoTest, ReaderNeverSeesAPartialFileWhileAnotherProcessSaves) {
-  const std::string path = Dir() + "/folder.conf";
-  Json::Value big(Json::objectValue);
-  for (int i = 0; i < 2000; ++i) big["/photo/" + std::to_string(i)]["name"] = std::string(40, 'n');
-  ASSERT_EQ(JsonToFile(big, path, 0644), JsonSaveResult::kReplaced);
-
-  const pid_t writer = fork();
-  if (writer == 0) {
-    Json::Value doc = big;
-    for (int i = 0; i < 60; ++i) {
-      doc["/video/" + std::to_string(i)]["name"] = "v";
-      if (JsonToFile(doc, path, 0644) != JsonSaveResult::kReplaced) _exit(1);
-    }
-    _exit(0);
-  }
-  ASSERT_GT(writer, 0);
-  int reads = 0;
-  int bad = 0;
-  int status = 0;
-  while (waitpid(writer, &status, WNOHANG) == 0) {
-    Json::Value v;
-    ++reads;
-    if (!JsonFromFile(v, path) || !v.isObject() || v.size() < 2000) {
-      ++bad;
-    }
-  }
-  ASSERT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
-  EXPECT_GT(reads, 0);
-  EXPECT_EQ(bad, 0) << "of " << reads << " reads";
 }
 
 }  // namespace

@@ -36,6 +36,8 @@ TEST_F(ExecTest, PassesArgumentsVerbatimWithoutAShell) {
   const char* const argv[] = {"x", out.c_str(), "a b", "$HOME", "*", "; touch x", "", nullptr};
   ASSERT_EQ(WLIBCExecv(program.c_str(), argv, 1), 0);
   EXPECT_EQ(Read("args"), "a b\n$HOME\n*\n; touch x\n\n");
+  ASSERT_EQ(WLIBCExec(program.c_str(), out.c_str(), "a", "b", "c"), 0);
+  EXPECT_EQ(Read("args"), "a\nb\nc\n");
   // The first null argument ends the list.
   ASSERT_EQ(WLIBCExec(program.c_str(), out.c_str(), "`id`", nullptr, "ignored"), 0);
   EXPECT_EQ(Read("args"), "`id`\n");

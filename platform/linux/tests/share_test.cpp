@@ -46,6 +46,7 @@ TEST_F(ShareTest, ReadsSharesFromTheSambaConfiguration) {
     ASSERT_EQ(WEZOShareGet(c.name, &share), 0);
     EXPECT_STREQ(share->szPath, c.path);
     int readOnly = -1;
+    EXPECT_LT(WLIBShareIsReadOnlyGet(share, nullptr), 0);
     EXPECT_EQ(WLIBShareIsReadOnlyGet(share, &readOnly), 0);
     EXPECT_EQ(readOnly, c.readOnly);
     WEZOShareFree(share);
