@@ -118,6 +118,7 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
     } else {
       char expected[512];
       (void)snprintf(expected, sizeof expected, c.logLine, fullPath.c_str());
+      ASSERT_FALSE(log.Lines().empty());
       EXPECT_EQ(log.Lines().back(), std::string("utils:N ") + expected);
     }
 
