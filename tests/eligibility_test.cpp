@@ -142,7 +142,8 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
 // Values outside the rules share the key "unknown" and one description.
 TEST_F(EligibilityTest, EveryRuleHasItsOwnKeyAndDescription) {
   constexpr size_t kRules = static_cast<size_t>(IndexRule::kResolvesElsewhere) + 1;
-  std::set<std::string> keys, descriptions;
+  std::set<std::string> keys;
+  std::set<std::string> descriptions;
   for (int value = -1; value <= static_cast<int>(kRules); ++value) {
     const auto rule = static_cast<IndexRule>(value);
     EXPECT_THAT(IndexRuleKey(rule), ::testing::MatchesRegex("[a-z_]+")) << value;

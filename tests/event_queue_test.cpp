@@ -91,6 +91,7 @@ TEST_F(EventQueueTest, AQueuedReindexOfExactlyThePathCoversEveryEvent) {
 TEST_F(EventQueueTest, LinesOfWritersInSeveralProcessesNeverInterleave) {
   const std::string payload(3000, 'x');  // several pages per line
   std::vector<pid_t> writers;
+  writers.reserve(4);
   for (int w = 0; w < 4; ++w) {
     writers.push_back(Spawn([&] {
       for (int i = 0; i < 150; ++i) {
