@@ -1,168 +1,124 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <unistd.h>
 #include <wezo/platform.h>
 
 #include <filesystem>
-#include <functional>
 #include <set>
+#include <sstream>
 
 #include "fake_platform.h"
 #include "fileindex/eligibility.h"
 #include "fileindex/error.h"
 #include "test_support.h"
 
-namespace WEZO {
-namespace FILEINDEX {
+namespace WEZO::FILEINDEX {
 namespace {
 
 using ::testing::ElementsAre;
 using ::testing::IsEmpty;
-using ::testing::MatchesRegex;
 
 class EligibilityTest : public testsupport::LibraryTest {
  protected:
   EligibilityTest() {
-    std::filesystem::create_directories(volume + "/photo/2019");
-    std::filesystem::create_directories(volume + "/photo/#recycle-notes");
-    std::filesystem::create_directories(volume + "/photo/#snapshot");
-    std::filesystem::create_directories(volume + "/surveillance/cam");
-    std::filesystem::create_directories(volume + "/Surveillance/cam");
+    for (const char* dir : {"/photo/2019", "/photo/#recycle-notes", "/photo/#snapshot",
+                            "/surveillance/cam", "/Surveillance/cam"}) {
+      std::filesystem::create_directories(volume + dir);
+    }
     std::filesystem::create_symlink(volume + "/photo/2019", volume + "/photo/link");
-    fake::Get().AddShare("surveillance", volume + "/surveillance");
-    fake::Get().AddShare("Surveillance", volume + "/Surveillance");
   }
 };
+
+// Sets up what `words` name for a path with `facts`: a fact of the path, a share setting, or a
+// query that fails ("?").
+void Arrange(const std::string& words, fake::PathFacts& facts) {
+  fake::Platform& pf = fake::Get();
+  fake::Share& photo = pf.shares["photo"];
+  std::istringstream in(words);
+  for (std::string w; in >> w;) {
+    if (w == "recycle") facts.recycle = true;
+    if (w == "snapshot") facts.snapshot = true;
+    if (w == "mount") facts.mountPoint = 1;
+    if (w == "unknown-fs") facts.fsType = WEZO_FSTYPE_UNKNOWN;
+    if (w == "remote-fs") facts.fsType = fake::kRemoteFs;
+    if (w == "image-fs") facts.fsType = fake::kImageFs;
+    if (w == "never-fs") facts.fsType = WEZO_FSTYPE_NEVER_INDEXED;
+    if (w == "encrypted") photo.encrypted = true;
+    if (w == "read-only") photo.readOnly = true;
+    if (w == "encryption") photo.encryption = true;
+    if (w == "snapshot?") pf.snapshot_query_fails = true;
+    if (w == "share-by-path?") pf.share_name_path_get_fails = true;
+    if (w == "share?") pf.share_get_fails = true;
+    if (w == "encrypted?") pf.encrypted_query_fails = true;
+    if (w == "read-only?") pf.read_only_query_fails = true;
+    if (w == "encryption?") pf.encryption_query_fails = true;
+  }
+}
 
 // Every rule of the folder check: the rule it yields, the call that decides it (which shows the
 // order in which the rules are tried) and the line it logs.
 TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
-  struct Case {
-    const char* name;
-    const char* folder;  // under the volume
-    std::function<void(fake::Platform&, const std::string&)> setup;
-    bool accepted;
+  using R = IndexRule;
+  const char* realpath = "check realpath failed, path=%s";
+  const struct {
+    const char* folder;  // under the volume; "": /photo/2019
+    const char* setup;   // see Arrange()
     IndexRule rule;
     const char* decidingCall;
     const char* logLine;  // after "utils:N ", with %s for the full path
-  };
-  const auto none = [](fake::Platform&, const std::string&) {};
-  const Case cases[] = {
-      {"plain folder", "/photo/2019", none, true, IndexRule::kIndexable, "WEZOFSDirIsMntPoint",
-       nullptr},
-      {"recycle bin", "/photo/#recycle-notes",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].recycle = true; }, false,
-       IndexRule::kRecycleBin, "WEZOShareIsShareRecycle", nullptr},
-      {"#recycle in the name only", "/photo/#recycle-notes", none, true, IndexRule::kIndexable,
-       "WEZOFSDirIsMntPoint", nullptr},
-      {"snapshot", "/photo/#snapshot",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].snapshot = true; }, false,
-       IndexRule::kSnapshot, "WLIBFhsPathInSnapshot", nullptr},
-      {"snapshot query fails", "/photo/#snapshot",
-       [](fake::Platform& pf, const std::string& p) {
-         pf.facts[p].snapshot = true;
-         fake::Get().snapshot_query_fails = true;
-       },
-       true, IndexRule::kIndexable, "WEZOFSDirIsMntPoint", nullptr},
-      {"unknown file system", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = WEZO_FSTYPE_UNKNOWN; },
-       false, IndexRule::kUnknownFileSystem, "WEZOGetFSType", nullptr},
-      {"remote file system before an excluded share", "/surveillance/cam",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = fake::kRemoteFs; },
-       false, IndexRule::kRemoteFileSystem, "WEZOFSIsRemoteFS", nullptr},
-      {"image file system", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].fsType = fake::kImageFs; }, false,
-       IndexRule::kImageFileSystem, "WEZOFSIsImageFS", nullptr},
-      {"never-indexed file system", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) {
-         pf.facts[p].fsType = WEZO_FSTYPE_NEVER_INDEXED;
-       },
-       false, IndexRule::kNeverIndexedFileSystem, "WEZOFSIsImageFS", nullptr},
-      {"share lookup by path fails", "/photo/2019",
-       [](fake::Platform&, const std::string&) { fake::Get().share_name_path_get_fails = true; },
-       false, IndexRule::kNoShare, "WEZOShareNamePathGet",
+  } cases[] = {
+      {"", "", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
+      {"/photo/#recycle-notes", "recycle", R::kRecycleBin, "WEZOShareIsShareRecycle", ""},
+      {"/photo/#snapshot", "snapshot", R::kSnapshot, "WLIBFhsPathInSnapshot", ""},
+      {"/photo/#snapshot", "", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
+      {"/photo/#snapshot", "snapshot snapshot?", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
+      {"", "unknown-fs", R::kUnknownFileSystem, "WEZOGetFSType", ""},
+      // A remote file system is refused before the share is looked at.
+      {"/surveillance/cam", "remote-fs", R::kRemoteFileSystem, "WEZOFSIsRemoteFS", ""},
+      {"", "image-fs", R::kImageFileSystem, "WEZOFSIsImageFS", ""},
+      {"", "never-fs", R::kNeverIndexedFileSystem, "WEZOFSIsImageFS", ""},
+      {"", "share-by-path?", R::kNoShare, "WEZOShareNamePathGet",
        "GetShareNamePathByFullPath failed, path=%s"},
-      {"share record lookup fails", "/photo/2019",
-       [](fake::Platform&, const std::string&) { fake::Get().share_get_fails = true; }, false,
-       IndexRule::kShareUnreadable, "WEZOShareGet", "WEZOShareGet failed, share=photo"},
-      {"excluded share", "/surveillance/cam", none, false, IndexRule::kExcludedShare,
-       "WEZOShareGet", nullptr},
-      {"excluded names are case-sensitive", "/Surveillance/cam", none, true, IndexRule::kIndexable,
-       "WEZOFSDirIsMntPoint", nullptr},
-      {"encrypted share", "/photo/2019",
-       [](fake::Platform& pf, const std::string&) { pf.shares["photo"].encrypted = true; }, false,
-       IndexRule::kEncryptedShare, "WLIBShareIsReadOnlyGet", nullptr},
-      {"encryption query fails", "/photo/2019",
-       [](fake::Platform&, const std::string&) { fake::Get().encrypted_query_fails = true; }, false,
-       IndexRule::kShareStateUnknown, "WLIBShareIsEncryptedGet", nullptr},
-      {"read-only share", "/photo/2019",
-       [](fake::Platform& pf, const std::string&) { pf.shares["photo"].readOnly = true; }, false,
-       IndexRule::kReadOnlyShare, "WLIBShareIsReadOnlyGet", nullptr},
-      {"encrypted and read-only share", "/photo/2019",
-       [](fake::Platform& pf, const std::string&) {
-         pf.shares["photo"].encrypted = true;
-         pf.shares["photo"].readOnly = true;
-       },
-       false, IndexRule::kEncryptedShare, "WLIBShareIsReadOnlyGet", nullptr},
-      {"read-only query fails", "/photo/2019",
-       [](fake::Platform&, const std::string&) { fake::Get().read_only_query_fails = true; }, false,
-       IndexRule::kShareStateUnknown, "WLIBShareIsReadOnlyGet", nullptr},
-      {"mount point", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) { pf.facts[p].mountPoint = 1; }, false,
-       IndexRule::kMountPoint, "WLIBShareIsEncryptionGet",
+      {"", "share?", R::kShareUnreadable, "WEZOShareGet", "WEZOShareGet failed, share=photo"},
+      {"/surveillance/cam", "", R::kExcludedShare, "WEZOShareGet", ""},
+      // Excluded share names are case-sensitive.
+      {"/Surveillance/cam", "", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
+      {"", "encrypted", R::kEncryptedShare, "WLIBShareIsReadOnlyGet", ""},
+      {"", "encrypted?", R::kShareStateUnknown, "WLIBShareIsEncryptedGet", ""},
+      {"", "read-only", R::kReadOnlyShare, "WLIBShareIsReadOnlyGet", ""},
+      {"", "encrypted read-only", R::kEncryptedShare, "WLIBShareIsReadOnlyGet", ""},
+      {"", "read-only?", R::kShareStateUnknown, "WLIBShareIsReadOnlyGet", ""},
+      {"", "mount", R::kMountPoint, "WLIBShareIsEncryptionGet",
        "Mount point[%s] is not allowed to be indexed"},
-      {"mount point of a share set up for encryption", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) {
-         pf.facts[p].mountPoint = 1;
-         pf.shares["photo"].encryption = true;
-       },
-       true, IndexRule::kIndexable, "WLIBShareIsEncryptionGet", nullptr},
-      {"mount point, encryption setting unknown", "/photo/2019",
-       [](fake::Platform& pf, const std::string& p) {
-         pf.facts[p].mountPoint = 1;
-         fake::Get().encryption_query_fails = true;
-       },
-       true, IndexRule::kIndexable, "WLIBShareIsEncryptionGet", nullptr},
-      {"trailing slash", "/photo/2019/", none, false, IndexRule::kResolvesElsewhere,
-       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
-      {"doubled slash", "/photo//2019", none, false, IndexRule::kResolvesElsewhere,
-       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
-      {"dot component", "/photo/./2019", none, false, IndexRule::kResolvesElsewhere,
-       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
-      {"symbolic link", "/photo/link", none, false, IndexRule::kResolvesElsewhere,
-       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
-      {"missing folder", "/photo/2020", none, false, IndexRule::kResolvesElsewhere,
-       "WEZOFSDirIsMntPoint", "check realpath failed, path=%s"},
-  };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(c.name);
+      {"", "mount encryption", R::kIndexable, "WLIBShareIsEncryptionGet", ""},
+      {"", "mount encryption?", R::kIndexable, "WLIBShareIsEncryptionGet", ""},
+      {"/photo/2019/", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath},
+      {"/photo/./2019", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath},
+      {"/photo/link", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath},
+      {"/photo/2020", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath}};
+  for (const auto& c : cases) {
+    SCOPED_TRACE(std::string(c.folder) + " " + c.setup);
     fake::Reset();
-    fake::Get().AddShare("photo", volume + "/photo");
-    fake::Get().AddShare("surveillance", volume + "/surveillance");
-    fake::Get().AddShare("Surveillance", volume + "/Surveillance");
+    for (const char* share : {"photo", "surveillance", "Surveillance"}) {
+      fake::Get().AddShare(share, volume + "/" + share);
+    }
     log.Clear();
-    const std::string fullPath = volume + c.folder;
-    c.setup(fake::Get(), fullPath);
-
-    EXPECT_EQ(CanFullPathBeIndexed(fullPath), c.accepted);
-    ASSERT_FALSE(fake::Get().calls.empty());
+    const std::string fullPath = volume + (*c.folder != '\0' ? c.folder : "/photo/2019");
+    Arrange(c.setup, fake::Get().facts[fullPath]);
+    EXPECT_EQ(CanFullPathBeIndexed(fullPath), c.rule == IndexRule::kIndexable);
     // Calls after the deciding one are bookkeeping (releasing the share record).
     std::vector<std::string> ops = fake::Get().OpNames();
-    while (!ops.empty() && ops.back() == "WLIBCErrGet") {
-      ops.pop_back();
-    }
+    while (!ops.empty() && ops.back() == "WLIBCErrGet") ops.pop_back();
+    ASSERT_FALSE(ops.empty());
     EXPECT_EQ(ops.back(), c.decidingCall);
     EXPECT_EQ(fake::Get().openShareRecords, 0);
     EXPECT_EQ(ErrorHandler::GetError(),
-              c.logLine != nullptr && std::string(c.logLine).rfind("GetShare", 0) == 0
-                  ? FILEINDEX_ERR_PATH
-                  : FILEINDEX_ERR_NONE);
-    ErrorHandler::SetError(FILEINDEX_ERR_NONE);
-    if (c.logLine == nullptr) {
+              c.rule == IndexRule::kNoShare ? FILEINDEX_ERR_PATH : FILEINDEX_ERR_NONE);
+    if (*c.logLine == '\0') {
       EXPECT_THAT(log.Lines(), IsEmpty());
     } else {
       char expected[512];
       (void)snprintf(expected, sizeof expected, c.logLine, fullPath.c_str());
+      ASSERT_FALSE(log.Lines().empty());
       EXPECT_EQ(log.Lines().back(), std::string("utils:N ") + expected);
     }
 
@@ -171,6 +127,7 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
     const std::vector<std::string> logged = log.Lines();
     fake::Get().calls.clear();
     log.Clear();
+    ErrorHandler::SetError(FILEINDEX_ERR_NONE);
     const IndexRule rule = FullPathIndexRule(fullPath);
     EXPECT_EQ(rule, c.rule) << IndexRuleKey(rule);
     EXPECT_EQ(fake::Get().OpNames(), asked);
@@ -182,26 +139,21 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
   }
 }
 
+// Values outside the rules share the key "unknown" and one description.
 TEST_F(EligibilityTest, EveryRuleHasItsOwnKeyAndDescription) {
+  constexpr size_t kRules = static_cast<size_t>(IndexRule::kResolvesElsewhere) + 1;
   std::set<std::string> keys;
   std::set<std::string> descriptions;
-  constexpr int kRules = static_cast<int>(IndexRule::kResolvesElsewhere) + 1;
-  for (int value = 0; value < kRules; ++value) {
+  for (int value = -1; value <= static_cast<int>(kRules); ++value) {
     const auto rule = static_cast<IndexRule>(value);
-    const std::string key = IndexRuleKey(rule);
-    EXPECT_THAT(key, MatchesRegex("[a-z_]+")) << value;
-    EXPECT_NE(key, "unknown") << value;
-    keys.insert(key);
+    EXPECT_THAT(IndexRuleKey(rule), ::testing::MatchesRegex("[a-z_]+")) << value;
+    keys.insert(IndexRuleKey(rule));
     descriptions.insert(DescribeIndexRule(rule));
   }
-  EXPECT_EQ(keys.size(), static_cast<size_t>(kRules));
-  EXPECT_EQ(descriptions.size(), static_cast<size_t>(kRules));
+  EXPECT_EQ(keys.size(), kRules + 1);
+  EXPECT_EQ(keys.count("unknown"), 1U);
+  EXPECT_EQ(descriptions.size(), kRules + 1);
   EXPECT_EQ(descriptions.count(""), 0U);
-  for (const int outside : {-1, kRules}) {
-    EXPECT_STREQ(IndexRuleKey(static_cast<IndexRule>(outside)), "unknown");
-    ASSERT_NE(DescribeIndexRule(static_cast<IndexRule>(outside)), nullptr);
-    EXPECT_STRNE(DescribeIndexRule(static_cast<IndexRule>(outside)), "");
-  }
 }
 
 TEST_F(EligibilityTest, SharePathThatCannotBeResolvedSetsThePathCode) {
@@ -212,52 +164,49 @@ TEST_F(EligibilityTest, SharePathThatCannotBeResolvedSetsThePathCode) {
   EXPECT_FALSE(CanShareBeIndexed(nullptr));
 }
 
+// The file-system type is asked before anything else, whatever decides.
 TEST_F(EligibilityTest, CrawledItemsAreSkippedByNameLocationAndFileSystem) {
-  struct Case {
-    const char* path;
-    fake::PathFacts facts;
+  const struct {
+    const char* name;   // in /volume1/photo, but for "no-slash"
+    const char* setup;  // see Arrange()
     bool skipped;
-  };
-  const fake::PathFacts local{};
-  const Case cases[] = {
-      {"no-slash", local, true},
-      {"/volume1/photo/.DS_Store", local, true},
-      {"/volume1/photo/x.DS_Store", local, false},
-      {"/volume1/photo/.ds_store", local, false},
-      {"/volume1/photo/@eaDir", local, true},
-      {"/volume1/photo/WEZO@file_index_queue", local, true},
-      {"/volume1/photo/WEZO@.fileindexdb", local, true},
-      {"/volume1/photo/.TemporaryItems", local, true},
-      {"/volume1/photo/.WEZOPPSDB", local, true},
-      {"/volume1/photo/#recycle/a", {fake::kLocalFs, 0, true, false}, true},
-      {"/volume1/photo/#recycle-notes/a", local, false},
-      {"/volume1/photo/#snapshot/a", {fake::kLocalFs, 0, false, true}, true},
-      {"/volume1/photo/a", {WEZO_FSTYPE_UNKNOWN, 0, false, false}, false},
-      {"/volume1/photo/a", {fake::kRemoteFs, 0, false, false}, true},
-      {"/volume1/photo/a", {fake::kImageFs, 0, false, false}, true},
-      {"/volume1/photo/a", {WEZO_FSTYPE_NEVER_INDEXED, 0, false, false}, true},
-  };
-  for (const Case& c : cases) {
+  } cases[] = {{"no-slash", "", true},
+               {".DS_Store", "", true},
+               {"x.DS_Store", "", false},
+               {".ds_store", "", false},
+               {"@eaDir", "", true},
+               {"WEZO@file_index_queue", "", true},
+               {"WEZO@.fileindexdb", "", true},
+               {".TemporaryItems", "", true},
+               {".WEZOPPSDB", "", true},
+               {"#recycle/a", "recycle", true},
+               {"#recycle-notes/a", "", false},
+               {"#snapshot/a", "snapshot", true},
+               {"a", "unknown-fs", false},
+               {"a", "remote-fs", true},
+               {"a", "image-fs", true},
+               {"a", "never-fs", true}};
+  for (const auto& c : cases) {
     fake::Reset();
-    fake::Get().defaultFacts = c.facts;
-    EXPECT_EQ(IsSkipIndex(c.path), c.skipped) << c.path << " type " << c.facts.fsType;
-    // The file-system type is asked before anything else, whatever decides.
-    EXPECT_EQ(fake::Get().OpNames().front(), "WEZOGetFSType") << c.path;
+    Arrange(c.setup, fake::Get().defaultFacts);
+    const std::string path =
+        std::string(c.name) == "no-slash" ? c.name : std::string("/volume1/photo/") + c.name;
+    EXPECT_EQ(IsSkipIndex(path), c.skipped) << path << " " << c.setup;
+    EXPECT_EQ(fake::Get().OpNames().front(), "WEZOGetFSType") << path;
   }
 }
 
 TEST_F(EligibilityTest, OnlyADefiniteOutOfSpaceAnswerMeansNoRoom) {
-  struct Case {
+  const struct {
     bool enough;
     int error;
     bool expected;
-  };
-  const Case cases[] = {{true, 0, true},
-                        {false, WLIBC_ERR_NO_SPACE, false},
-                        {false, WLIBC_ERR_OVER_QUOTA, false},
-                        {false, WLIBC_ERR_BAD_PARAMETERS, true},
-                        {false, 0, true}};
-  for (const Case& c : cases) {
+  } cases[] = {{true, 0, true},
+               {false, WLIBC_ERR_NO_SPACE, false},
+               {false, WLIBC_ERR_OVER_QUOTA, false},
+               {false, WLIBC_ERR_BAD_PARAMETERS, true},
+               {false, 0, true}};
+  for (const auto& c : cases) {
     fake::Get().quotaEnough = c.enough;
     fake::Get().quotaError = c.error;
     fake::Get().calls.clear();
@@ -272,5 +221,4 @@ TEST_F(EligibilityTest, OnlyADefiniteOutOfSpaceAnswerMeansNoRoom) {
 }
 
 }  // namespace
-}  // namespace FILEINDEX
-}  // namespace WEZO
+}  // namespace WEZO::FILEINDEX

@@ -5,19 +5,15 @@
 #include <filesystem>
 #include <functional>
 #include <map>
-#include <string>
-#include <vector>
 
 #include "fake_platform.h"
 #include "fileindex/fileindex_c.h"
 #include "fileindex/index_mgr.h"
-#include "fileindex/queue.h"
+#include "test_support.h"
 #include "utils/queue_reader.h"
 #include "utils/storage.h"
-#include "test_support.h"
 
-namespace WEZO {
-namespace FILEINDEX {
+namespace WEZO::FILEINDEX {
 namespace {
 
 using ::testing::ElementsAre;
@@ -32,38 +28,33 @@ class StorageTest : public testsupport::LibraryTest {
 
 TEST_F(StorageTest, RefusesBadArgumentsInOrderWithThePlatformError) {
   char buffer[64];
-  struct Case {
+  const auto bad = [](const char* what) {
+    return std::string("utils:N Invaild Argument (") + what + ")=[0]\n";
+  };
+  const struct {
     Getter getter;
     const char* name;
     char* out;
     int size;
-    const char* line;
-  } cases[] = {
-      {FILEIDXQueuePathGet, nullptr, nullptr, 0,
-       "utils:N Invaild Argument (__null != szName)=[0]\n"},
-      {FILEIDXQueuePathGet, "photo", nullptr, 0,
-       "utils:N Invaild Argument (__null != szOutQueuePath)=[0]\n"},
-      {FILEIDXDBPathGet, "photo", nullptr, 64,
-       "utils:N Invaild Argument (__null != szOutDBPath)=[0]\n"},
-      {FILEIDXQueuePathGet, "photo", buffer, 0, "utils:N Invaild Argument (cbOutLen > 0)=[0]\n"},
-      {FILEIDXDBPathGet, "photo", buffer, -5, "utils:N Invaild Argument (cbOutLen > 0)=[0]\n"},
-  };
-  for (const Case& c : cases) {
+    std::string line;
+    int code;  // the platform's last error afterwards
+  } cases[] = {{FILEIDXQueuePathGet, nullptr, nullptr, 0, bad("__null != szName"), 0xD00},
+               {FILEIDXQueuePathGet, "photo", nullptr, 0, bad("__null != szOutQueuePath"), 0xD00},
+               {FILEIDXDBPathGet, "photo", nullptr, 64, bad("__null != szOutDBPath"), 0xD00},
+               {FILEIDXQueuePathGet, "photo", buffer, 0, bad("cbOutLen > 0"), 0xD00},
+               {FILEIDXDBPathGet, "photo", buffer, -5, bad("cbOutLen > 0"), 0xD00},
+               // Left by the lookup, not replaced.
+               {FILEIDXDBPathGet, "nosuch", buffer, 64,
+                "utils:N WEZOShareGet failed, name=nosuch, code=3585", fake::kInjectedError}};
+  for (const auto& c : cases) {
     fake::Reset();
     log.Clear();
     EXPECT_EQ(c.getter(c.name, c.out, c.size), -1) << c.line;
     EXPECT_THAT(log.Lines(), ElementsAre(c.line));
-    EXPECT_EQ(fake::Get().errCode, 0xD00);
-    EXPECT_THAT(fake::Get().calls, IsEmpty()) << "nothing is looked up";
+    EXPECT_EQ(fake::Get().errCode, c.code);
+    EXPECT_EQ(fake::Get().calls.empty(), c.code == 0xD00) << "nothing is looked up";
+    EXPECT_EQ(fake::Get().openShareRecords, 0);
   }
-}
-
-TEST_F(StorageTest, UnknownShareFailsWithoutSettingAPlatformError) {
-  char buffer[256];
-  EXPECT_EQ(FILEIDXDBPathGet("nosuch", buffer, sizeof buffer), -1);
-  EXPECT_EQ(fake::Get().errCode, fake::kInjectedError) << "left by the lookup, not replaced";
-  EXPECT_THAT(log.Lines(), ElementsAre("utils:N WEZOShareGet failed, name=nosuch, code=3585"));
-  EXPECT_EQ(fake::Get().openShareRecords, 0);
 }
 
 TEST_F(StorageTest, WritesTheLocationsAndCreatesOnlyTheirDirectories) {
@@ -74,19 +65,22 @@ TEST_F(StorageTest, WritesTheLocationsAndCreatesOnlyTheirDirectories) {
   EXPECT_TRUE(std::filesystem::is_directory(volume + "/photo/@eaDir"));
   EXPECT_FALSE(std::filesystem::exists(queue));
   EXPECT_EQ(fake::Get().openShareRecords, 0);
+  // Cut as snprintf cuts, and still a success.
+  ASSERT_EQ(FILEIDXQueuePathGet("photo", buffer, 10), 9);
+  EXPECT_EQ(std::string(buffer), (volume + "/photo").substr(0, 9));
+  ASSERT_EQ(FILEIDXQueuePathGet("photo", buffer, 1), 0);
+  EXPECT_EQ(buffer[0], '\0');
 }
 
 // Made when missing; an existing one is no error and loses only its group and world write bits.
 TEST_F(StorageTest, TheDatabaseDirectoryIsWritableByItsOwnerOnlyWhateverTheUmask) {
   const std::string db = volume + "/photo/@eaDir/WEZO@.fileindexdb";
-  struct Case {
+  const struct {
     mode_t umask;
     int existing;  // the mode of a directory already there, or -1
     int mode;
-  } cases[] = {
-      {0, -1, 0755}, {077, -1, 0755}, {0, 0777, 0755}, {0, 0775, 0755}, {0, 0700, 0700},
-  };
-  for (const Case& c : cases) {
+  } cases[] = {{0, -1, 0755}, {077, -1, 0755}, {0, 0777, 0755}, {0, 0700, 0700}};
+  for (const auto& c : cases) {
     std::filesystem::remove_all(db);
     if (c.existing >= 0) {
       std::filesystem::create_directories(db);
@@ -101,20 +95,11 @@ TEST_F(StorageTest, TheDatabaseDirectoryIsWritableByItsOwnerOnlyWhateverTheUmask
   }
   EXPECT_THAT(log.Lines(), IsEmpty());
   EXPECT_EQ(fake::Get().openShareRecords, 0);
-}
 
-TEST_F(StorageTest, CutsTheOutputAsSnprintfDoesAndStillSucceeds) {
-  char buffer[16];
-  ASSERT_EQ(FILEIDXQueuePathGet("photo", buffer, 10), 9);
-  EXPECT_EQ(std::string(buffer), (volume + "/photo").substr(0, 9));
-  ASSERT_EQ(FILEIDXQueuePathGet("photo", buffer, 1), 0);
-  EXPECT_EQ(buffer[0], '\0');
-}
-
-TEST_F(StorageTest, DirectoriesThatCannotBeCreatedAreLoggedAndThePathStillReturned) {
+  // Directories that cannot be made are logged, and the path still returned.
   fake::Get().ea_mkdir_fails = true;
+  std::filesystem::remove_all(volume + "/photo/@eaDir");
   char buffer[4096];
-  const std::string db = volume + "/photo/@eaDir/WEZO@.fileindexdb";
   EXPECT_EQ(FILEIDXDBPathGet("photo", buffer, sizeof buffer), static_cast<int>(db.size()));
   EXPECT_THAT(
       log.Lines(),
@@ -142,28 +127,25 @@ TEST_F(StorageTest, NothingBelowTheShareIsReachedThroughALinkInTheMetadataDirect
   const std::string folder = volume + "/photo/a";
   const std::string out = sandbox.Path("/out");
   const std::string linked = "reason=Too many levels of symbolic links";
-  struct Case {
+  const struct {
     const char* name;
     std::function<bool()> run;
     bool result;
     std::string lastLine;
-  } cases[] = {
-      {"queue writer", [&] { return AddCustomEvent(kEventUpdate, folder + "/x", Json::Value()); },
-       false, "utils:N Failed to open queue=" + queue + ", " + linked},
-      {"database directory",
-       [&] {
-         char buffer[4096];
-         return FILEIDXDBPathGet("photo", buffer, sizeof buffer) == static_cast<int>(db.size());
-       },
-       true, "utils:N mkdir failed, path=" + db + ", " + linked},
-      {"duplicate check", [&] { return IsReindexQueued(folder, queue); }, false,
-       "utils:N Failed to open queue=" + queue + ", " + linked},
-      {"progress", [&] { return QueueHasFolderEvent("/photo/a", queue); }, false,
-       "status_mgr:N Failed to open queue=" + queue + ", " + linked},
-      {"index data removal", [&] { return IndexMgr::CleanShareIndexData("photo"); }, false,
-       "index_mgr:N Failed to remove " + db + ", " + linked},
-  };
-  for (const Case& c : cases) {
+  } cases[] = {{"database directory",
+                [&] {
+                  char buffer[4096];
+                  return FILEIDXDBPathGet("photo", buffer, sizeof buffer) ==
+                         static_cast<int>(db.size());
+                },
+                true, "utils:N mkdir failed, path=" + db + ", " + linked},
+               {"duplicate check", [&] { return IsReindexQueued(folder, queue); }, false,
+                "utils:N Failed to open queue=" + queue + ", " + linked},
+               {"progress", [&] { return QueueHasFolderEvent("/photo/a", queue); }, false,
+                "status_mgr:N Failed to open queue=" + queue + ", " + linked},
+               {"index data removal", [&] { return IndexMgr::CleanShareIndexData("photo"); }, false,
+                "index_mgr:N Failed to remove " + db + ", " + linked}};
+  for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
     std::filesystem::remove_all(metadata);
     std::filesystem::remove_all(out);
@@ -193,9 +175,7 @@ TEST_F(StorageTest, RemovingIndexDataTakesWholeTreesAndLinksButNeverWhatALinkPoi
   std::filesystem::create_symlink(out + "/file", metadata + "/WEZO@file_index_queue.tmp");
   std::filesystem::create_directory_symlink(out, db + "/a/out");
   std::string deepest = db;
-  for (int depth = 0; depth < kMaxRemovalDepth; ++depth) {
-    deepest += "/d";
-  }
+  for (int depth = 0; depth < kMaxRemovalDepth; ++depth) deepest += "/d";
   std::filesystem::create_directories(deepest);
 
   // One level too deep: that tree stays, the other locations go all the same.
@@ -215,5 +195,4 @@ TEST_F(StorageTest, RemovingIndexDataTakesWholeTreesAndLinksButNeverWhatALinkPoi
 }
 
 }  // namespace
-}  // namespace FILEINDEX
-}  // namespace WEZO
+}  // namespace WEZO::FILEINDEX

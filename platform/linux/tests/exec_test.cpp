@@ -17,10 +17,8 @@ TEST_F(ExecTest, OnlyAProgramThatExitsWithZeroSucceeds) {
   const struct {
     std::string program;
     bool succeeds;
-  } cases[] = {
-      {"/bin/true", true},   {"/bin/false", false}, {At("exit3"), false},
-      {At("killed"), false}, {At("plain"), false},  {At("missing"), false},
-  };
+  } cases[] = {{"/bin/true", true},   {"/bin/false", false}, {At("exit3"), false},
+               {At("killed"), false}, {At("plain"), false},  {At("missing"), false}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.program);
     const char* const argv[] = {c.program.c_str(), nullptr};
@@ -38,6 +36,8 @@ TEST_F(ExecTest, PassesArgumentsVerbatimWithoutAShell) {
   const char* const argv[] = {"x", out.c_str(), "a b", "$HOME", "*", "; touch x", "", nullptr};
   ASSERT_EQ(WLIBCExecv(program.c_str(), argv, 1), 0);
   EXPECT_EQ(Read("args"), "a b\n$HOME\n*\n; touch x\n\n");
+  ASSERT_EQ(WLIBCExec(program.c_str(), out.c_str(), "a", "b", "c"), 0);
+  EXPECT_EQ(Read("args"), "a\nb\nc\n");
   // The first null argument ends the list.
   ASSERT_EQ(WLIBCExec(program.c_str(), out.c_str(), "`id`", nullptr, "ignored"), 0);
   EXPECT_EQ(Read("args"), "`id`\n");

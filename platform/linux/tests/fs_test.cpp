@@ -8,7 +8,6 @@
 #include <climits>
 #include <cstring>
 #include <fstream>
-#include <sstream>
 #include <string>
 
 #include "sandbox.h"
@@ -19,17 +18,9 @@ namespace {
 // build's, the root directory is an ordinary folder of some mount.
 bool MountTableListsRoot() {
   std::ifstream table("/proc/self/mountinfo");
-  std::string line;
-  while (std::getline(table, line)) {
-    std::istringstream fields(line);
-    std::string id;
-    std::string parent;
-    std::string device;
-    std::string root;
-    std::string mountPoint;
-    if (fields >> id >> parent >> device >> root >> mountPoint && mountPoint == "/") {
-      return true;
-    }
+  for (std::string id, parent, device, root, point, rest;
+       table >> id >> parent >> device >> root >> point && std::getline(table, rest);) {
+    if (point == "/") return true;
   }
   return false;
 }
@@ -44,18 +35,9 @@ TEST_F(FsTest, TellsFileSystemTypesAndMountPoints) {
 
   Write("dir/file", "");
   ASSERT_EQ(symlink("/", At("link").c_str()), 0);
-  const struct {
-    std::string path;
-    int mountPoint;
-  } cases[] = {
-      {root_, 0},
-      {At("dir/file"), 0},
-      {At("link"), 0},
-      {At("missing"), -1},
-  };
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.path);
-    EXPECT_EQ(std::max(WEZOFSDirIsMntPoint(c.path.c_str()), -1), c.mountPoint);
+  for (const auto& [path, mountPoint] :
+       {std::pair{root_, 0}, {At("dir/file"), 0}, {At("link"), 0}, {At("missing"), -1}}) {
+    EXPECT_EQ(std::max(WEZOFSDirIsMntPoint(path.c_str()), -1), mountPoint) << path;
   }
   if (!MountTableListsRoot()) {
     GTEST_SKIP() << "the mount table does not list / as a mount point (no /proc, or a chroot "

@@ -44,13 +44,11 @@ TEST_F(MonitorTest, RefusesWhatCannotBeARegistrationFile) {
   const struct {
     std::string queue;
     std::string client;
-  } cases[] = {
-      {"/q", ""},
-      {"/q", "a/b"},
-      {"/q", ".."},
-      {"/q", std::string("a\0b", 3)},
-      {std::string(100, '/'), "c"},
-  };
+  } cases[] = {{"/q", ""},
+               {"/q", "a/b"},
+               {"/q", ".."},
+               {"/q", std::string("a\0b", 3)},
+               {std::string(100, '/'), "c"}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.client);
     EXPECT_FALSE(MonitorQueue::Upsert(Entry(c.queue, "/d"), c.client, QUEUE_TYPE_FILE));

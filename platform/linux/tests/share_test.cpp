@@ -30,13 +30,11 @@ TEST_F(ShareTest, ReadsSharesFromTheSambaConfiguration) {
     const char* name;
     const char* path;  // null: no such share
     int readOnly;
-  } cases[] = {
-      {"photo", "/volume1/photo", 0}, {"docs", "/volume1/docs", 1},
-      {"music", "/volume1/music", 1}, {"photo2019", "/volume1/photo/2019", 0},
-      {"PHOTO", nullptr, 0},          {"global", nullptr, 0},
-      {"homes", nullptr, 0},          {"printers", nullptr, 0},
-      {"nopath", nullptr, 0},         {"commented", nullptr, 0},
-  };
+  } cases[] = {{"photo", "/volume1/photo", 0}, {"docs", "/volume1/docs", 1},
+               {"music", "/volume1/music", 1}, {"photo2019", "/volume1/photo/2019", 0},
+               {"PHOTO", nullptr, 0},          {"global", nullptr, 0},
+               {"homes", nullptr, 0},          {"printers", nullptr, 0},
+               {"nopath", nullptr, 0},         {"commented", nullptr, 0}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.name);
     PWEZOSHARE share = nullptr;
@@ -48,6 +46,7 @@ TEST_F(ShareTest, ReadsSharesFromTheSambaConfiguration) {
     ASSERT_EQ(WEZOShareGet(c.name, &share), 0);
     EXPECT_STREQ(share->szPath, c.path);
     int readOnly = -1;
+    EXPECT_LT(WLIBShareIsReadOnlyGet(share, nullptr), 0);
     EXPECT_EQ(WLIBShareIsReadOnlyGet(share, &readOnly), 0);
     EXPECT_EQ(readOnly, c.readOnly);
     WEZOShareFree(share);
@@ -59,22 +58,19 @@ TEST_F(ShareTest, FindsTheDeepestShareHoldingAPathAndItsFolders) {
   const struct {
     const char* full;
     const char* share;  // null: no share holds it
-    int recycle;
-    int snapshot;
-  } cases[] = {
-      {"/volume1/photo", "photo", 0, 0},
-      {"/volume1/photo/2019/x", "photo2019", 0, 0},
-      {"/volume1/photo/20190", "photo", 0, 0},
-      {"/volume1/photos/x", "photos", 0, 0},
-      {"/volume1/pho", nullptr, 0, 0},
-      {"/volume1", nullptr, 0, 0},
-      {"/volume1/photo/#recycle", "photo", 1, 0},
-      {"/volume1/photo/#recycle/a", "photo", 1, 0},
-      {"/volume1/photo/#snapshot/x", "photo", 0, 1},
-      {"/volume1/photo/#recycle-x", "photo", 0, 0},
-      {"/volume1/photo/a/#recycle", "photo", 0, 0},
-      {"/elsewhere/#snapshot", nullptr, 0, 0},
-  };
+    int recycle, snapshot;
+  } cases[] = {{"/volume1/photo", "photo", 0, 0},
+               {"/volume1/photo/2019/x", "photo2019", 0, 0},
+               {"/volume1/photo/20190", "photo", 0, 0},
+               {"/volume1/photos/x", "photos", 0, 0},
+               {"/volume1/pho", nullptr, 0, 0},
+               {"/volume1", nullptr, 0, 0},
+               {"/volume1/photo/#recycle", "photo", 1, 0},
+               {"/volume1/photo/#recycle/a", "photo", 1, 0},
+               {"/volume1/photo/#snapshot/x", "photo", 0, 1},
+               {"/volume1/photo/#recycle-x", "photo", 0, 0},
+               {"/volume1/photo/a/#recycle", "photo", 0, 0},
+               {"/elsewhere/#snapshot", nullptr, 0, 0}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.full);
     char name[WEZO_SHARE_NAME_MAX] = "";
@@ -115,12 +111,11 @@ TEST_F(ShareTest, AShareOnAPlainFolderIsNotEncrypted) {
   Write("data/file", "");
   Write("etc/samba/smb.conf",
         "[data]\npath = " + At("data") + "\n[gone]\npath = " + At("x") + "\n");
-  for (const char* name : {"data", "gone"}) {
+  for (const auto& [name, expected] : {std::pair{"data", 0}, {"gone", -1}}) {
     PWEZOSHARE share = nullptr;
     ASSERT_EQ(WEZOShareGet(name, &share), 0);
     int encrypted = -1;
     int encryption = -1;
-    const int expected = std::string(name) == "data" ? 0 : -1;
     EXPECT_EQ(WLIBShareIsEncryptedGet(share, &encrypted) < 0 ? -1 : encrypted, expected);
     EXPECT_EQ(WLIBShareIsEncryptionGet(share, &encryption) < 0 ? -1 : encryption, expected);
     WEZOShareFree(share);

@@ -16,20 +16,18 @@ TEST_F(SpotlightTest, RewritesOnlyTheGlobalSpotlightValue) {
     const char* before;
     int enable;
     const char* after;
-  } cases[] = {
-      {"[global]\n\tspotlight = no\n[s]\n\tpath = /x\n", 1,
-       "[global]\n\tspotlight = yes\n[s]\n\tpath = /x\n"},
-      {"# keep ; me\r\n[ Global ]\r\n  Spot Light=off  \r\n\tworkgroup = W\r\n", 1,
-       "# keep ; me\r\n[ Global ]\r\n  Spot Light= yes\r\n\tworkgroup = W\r\n"},
-      {"[global]\nspotlight = \\\n  yes\n# tail", 0, "[global]\nspotlight = no\n# tail"},
-      {"[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = no\n", 1,
-       "[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = yes\n"},
-      {"spotlight = no\n[s]\npath = /x\n", 1, "spotlight = yes\n[s]\npath = /x\n"},
-      {"# c\n[global]\n\tworkgroup = W\n[s]\n\tspotlight = yes\n", 1,
-       "# c\n[global]\n\tspotlight = yes\n\tworkgroup = W\n[s]\n\tspotlight = yes\n"},
-      {"[global]", 1, "[global]\n\tspotlight = yes\n"},
-      {"[s]\n\tpath = /x", 0, "[s]\n\tpath = /x\n[global]\n\tspotlight = no\n"},
-  };
+  } cases[] = {{"[global]\n\tspotlight = no\n[s]\n\tpath = /x\n", 1,
+                "[global]\n\tspotlight = yes\n[s]\n\tpath = /x\n"},
+               {"# keep ; me\r\n[ Global ]\r\n  Spot Light=off  \r\n\tworkgroup = W\r\n", 1,
+                "# keep ; me\r\n[ Global ]\r\n  Spot Light= yes\r\n\tworkgroup = W\r\n"},
+               {"[global]\nspotlight = \\\n  yes\n# tail", 0, "[global]\nspotlight = no\n# tail"},
+               {"[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = no\n", 1,
+                "[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = yes\n"},
+               {"spotlight = no\n[s]\npath = /x\n", 1, "spotlight = yes\n[s]\npath = /x\n"},
+               {"# c\n[global]\n\tworkgroup = W\n[s]\n\tspotlight = yes\n", 1,
+                "# c\n[global]\n\tspotlight = yes\n\tworkgroup = W\n[s]\n\tspotlight = yes\n"},
+               {"[global]", 1, "[global]\n\tspotlight = yes\n"},
+               {"[s]\n\tpath = /x", 0, "[s]\n\tpath = /x\n[global]\n\tspotlight = no\n"}};
   const std::string conf = At("etc/samba/smb.conf");
   const bool haveTestparm = access("/usr/bin/testparm", X_OK) == 0;
   for (const auto& c : cases) {
@@ -60,12 +58,10 @@ TEST_F(SpotlightTest, ReadsSambasDefaultAndRefusesWhatSambaRefuses) {
   const struct {
     const char* text;
     int expected;
-  } cases[] = {
-      {"[global]\n\tworkgroup = W\n", 0},
-      {"[global]\n\tspotlight = True\n\tspotlight = 1\n", 1},
-      {"[global]\n\tspotlight = on\n[s]\n\tspotlight = no\n", 1},
-      {"[global]\n\tspotlight = maybe\n", -1},
-  };
+  } cases[] = {{"[global]\n\tworkgroup = W\n", 0},
+               {"[global]\n\tspotlight = True\n\tspotlight = 1\n", 1},
+               {"[global]\n\tspotlight = on\n[s]\n\tspotlight = no\n", 1},
+               {"[global]\n\tspotlight = maybe\n", -1}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.text);
     Write("etc/samba/smb.conf", c.text);
