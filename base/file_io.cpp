@@ -134,5 +134,28 @@ ReplaceResult ReplaceFile(const std::string& path, const std::string& data, mode
   return modeSet ? ReplaceResult::kReplaced : ReplaceResult::kReplacedModeNotSet;
 }
 
+bool AppendLineAligned(int fd, const std::string& line, ssize_t& written, size_t& wanted) {
+  written = 0;
+  wanted = 0;
+  struct stat st {};
+  if (fstat(fd, &st) != 0) {
+    return false;
+  }
+  char last = '\n';
+  if (st.st_size > 0 && pread(fd, &last, 1, st.st_size - 1) != 1) {
+    return false;
+  }
+  const std::string data = last == '\n' ? line : '\n' + line;
+  wanted = data.size();
+  written = write(fd, data.data(), data.size());
+  if (written == static_cast<ssize_t>(data.size())) {
+    return true;
+  }
+  if (written > 0) {
+    (void)ftruncate(fd, st.st_size);
+  }
+  return false;
+}
+
 }  // namespace FILEINDEX
 }  // namespace WEZO

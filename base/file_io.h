@@ -36,6 +36,15 @@ ReplaceResult ReplaceFile(const std::string& path, const std::string& data, mode
 // file that cannot be removed stays, and nothing is reported.
 void RemoveStaleTemporaries(const std::string& path, time_t minAgeSeconds);
 
+// Appends `line` to the end of the file `fd`, which the caller holds locked against the file's
+// other writers, in one write. A last line without its "\n", left by a writer that failed
+// part-way, is ended first, so that `line` never joins it; a write of ours that falls short is
+// cut off again, since the next writer's line would otherwise be glued to the torn one and both
+// lost. Returns true when `line` is in the file whole. On false, `written` and `wanted` hold what
+// the write returned and the bytes it was given, both 0 when the file could not be inspected and
+// nothing was written.
+bool AppendLineAligned(int fd, const std::string& line, ssize_t& written, size_t& wanted);
+
 }  // namespace FILEINDEX
 }  // namespace WEZO
 

@@ -9,6 +9,7 @@
 
 #include <string>
 
+#include "file_io.h"
 #include "fileindex/queue.h"
 #include "flock.h"
 #include "json_io.h"
@@ -22,34 +23,17 @@ namespace WEZO {
 namespace FILEINDEX {
 namespace {
 
-// Writes `line` at the end of the locked queue `fd` in one call. A last line without its "\n",
-// left by a writer that failed part-way, is ended first, so that the event never joins it; a
-// write of our own that falls short is cut off again, since the next writer's line would
-// otherwise be glued to the torn one and both events lost. False when the event is not in the
-// queue whole.
+// Writes `line` at the end of the locked queue `fd` in one call, line-aligned (file_io.h). False
+// when the event is not in the queue whole.
 bool WriteLineAligned(int fd, const std::string& line) {
-  struct stat st {};
-  if (fstat(fd, &st) != 0) {
-    return false;
-  }
-  char last = '\n';
-  if (st.st_size > 0 && pread(fd, &last, 1, st.st_size - 1) != 1) {
-    return false;
-  }
-  std::string ended;
-  const std::string* data = &line;
-  if (last != '\n') {
-    ended = '\n' + line;
-    data = &ended;
-  }
-  const ssize_t written = write(fd, data->data(), data->size());
-  if (written == static_cast<ssize_t>(data->size())) {
+  ssize_t written = 0;
+  size_t wanted = 0;
+  if (AppendLineAligned(fd, line, written, wanted)) {
     return true;
   }
-  FILEINDEX_LOG_DEBUG("write fail, (%ld, %ld)", static_cast<long>(written),
-                      static_cast<long>(data->size()));
-  if (written > 0) {
-    (void)ftruncate(fd, st.st_size);
+  if (wanted != 0) {
+    FILEINDEX_LOG_DEBUG("write fail, (%ld, %ld)", static_cast<long>(written),
+                        static_cast<long>(wanted));
   }
   return false;
 }

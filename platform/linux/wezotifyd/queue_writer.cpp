@@ -7,6 +7,7 @@
 
 #include <cerrno>
 
+#include "file_io.h"
 #include "unique_fd.h"
 
 namespace WEZO {
@@ -69,28 +70,6 @@ bool Lock(int fd) {
   return false;
 }
 
-// One write for the line. A last line without its "\n", left by a writer that failed part-way,
-// is ended first; a short write of our own is cut off again so the next line is not glued to it.
-bool WriteLine(int fd, const std::string& line) {
-  struct stat st {};
-  if (fstat(fd, &st) != 0) {
-    return false;
-  }
-  char last = '\n';
-  if (st.st_size > 0 && pread(fd, &last, 1, st.st_size - 1) != 1) {
-    return false;
-  }
-  const std::string data = last == '\n' ? line : '\n' + line;
-  const ssize_t written = write(fd, data.data(), data.size());
-  if (written == static_cast<ssize_t>(data.size())) {
-    return true;
-  }
-  if (written > 0) {
-    (void)ftruncate(fd, st.st_size);
-  }
-  return false;
-}
-
 }  // namespace
 
 AppendResult AppendLines(const std::string& queuePath, const std::vector<std::string>& lines) {
@@ -116,7 +95,9 @@ AppendResult AppendLines(const std::string& queuePath, const std::vector<std::st
   }
   bool whole = true;
   for (const std::string& line : lines) {
-    whole = WriteLine(fd.get(), line) && whole;
+    ssize_t written = 0;
+    size_t wanted = 0;
+    whole = FILEINDEX::AppendLineAligned(fd.get(), line, written, wanted) && whole;
   }
   flock(fd.get(), LOCK_UN);
   return whole ? AppendResult::kWritten : AppendResult::kLost;
