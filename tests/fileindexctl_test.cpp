@@ -71,6 +71,7 @@ class FileindexctlTest : public SandboxTest {
   // null; the exit status, or -1. With `pid`, leaves it running and answers 0.
   int Spawn(std::vector<std::string> args, pid_t* pid) const {
     std::vector<char*> argv;
+    argv.reserve(args.size() + 1);
     for (std::string& arg : args) {
       argv.push_back(arg.data());
     }

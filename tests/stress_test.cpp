@@ -229,11 +229,11 @@ std::function<std::string()> Spawn(const std::function<std::string()>& body) {
   };
 }
 
-// Each change must stay done, or fail with FILEINDEX_ERR_LOCK having changed nothing.
-std::string Outcome(bool done, const std::string& what) {
-  return done || ErrorHandler::GetError() == FILEINDEX_ERR_LOCK
-             ? ""
-             : what + " failed with code " + std::to_string(ErrorHandler::GetError());
+// The failure of a change or Get that is not FILEINDEX_ERR_LOCK, or "".
+std::string Unexpected(bool done, const std::string& what) {
+  const int code = ErrorHandler::GetError();
+  return done || code == FILEINDEX_ERR_LOCK ? ""
+                                            : what + " failed with code " + std::to_string(code);
 }
 
 // Adds and removes its own folder `rounds` times, then finds its last change in the list.
@@ -254,8 +254,8 @@ std::string Writer(int w, int rounds) {
     if (done) {
       mine = add ? "r" + std::to_string(r) : "";
     }
-    if (const std::string wrong = Outcome(done, "round " + std::to_string(r)); !wrong.empty()) {
-      return wrong;
+    if (!Unexpected(done, "round").empty()) {
+      return Unexpected(done, "round " + std::to_string(r));
     }
   }
   const Json::Value state = ReadState();
@@ -274,8 +274,8 @@ std::string Reader(int rounds) {
         (got && folder["name"] != "keep")) {
       return "round " + std::to_string(r) + " saw a wrong list";
     }
-    if (const std::string wrong = Outcome(got, "Get"); !wrong.empty()) {
-      return wrong;
+    if (!Unexpected(got, "Get").empty()) {
+      return Unexpected(got, "Get");
     }
   }
   return "ok";
@@ -286,6 +286,7 @@ TEST_F(StressTest, ConcurrentWritersKeepEveryDoneChangeAndReadersSeeUntouchedFol
   ASSERT_TRUE(IndexMgr::Upsert(testsupport::ParseJson(
       R"([{"path":"/photo/seed","name":"keep"},{"path":"/video/seed","name":"keep"}])")));
   std::vector<std::function<std::string()>> children;
+  children.reserve(5);
   for (int w = 0; w < 3; ++w) {
     children.push_back(Spawn([w, rounds] { return Writer(w, rounds); }));
   }
