@@ -570,6 +570,7 @@ TEST_F(IndexOpsTest, SharePauseStopsTheWorkerFirstAndResumeRegistersFirst) {
 TEST_F(IndexOpsTest, TheMigrationBringsServicesMonitorAndQueuesInLineWithTheList) {
   ASSERT_TRUE(Updater_hxo60_beta2()) << "a missing list";
   EXPECT_EQ(Effects(), "Stop fileindexd");
+  EXPECT_EQ(fake::Get().calls[0].args[1], "1") << "the flags of the stop";
   fake::Get().service_stop_fails = true;
   EXPECT_FALSE(Updater_hxo60_beta2());
   EXPECT_EQ(Log(), "utils:N WLIBServiceStart failed: err=[0x0E01 fake_platform:N]");
@@ -583,6 +584,7 @@ TEST_F(IndexOpsTest, TheMigrationBringsServicesMonitorAndQueuesInLineWithTheList
             "watch video: /video");
   EXPECT_EQ(Events("photo"), "65536 /photo/a null; 65536 /photo/b null");
   EXPECT_EQ(Events("video"), "65536 /video null");
+  EXPECT_EQ(fake::Get().CallsTo("WLIBServiceStart")[0].args[1], "1");
   ASSERT_TRUE(Updater_hxo60_beta2()) << "a second run";
   EXPECT_EQ(Events("photo"), "65536 /photo/a null; 65536 /photo/b null")
       << "the queued reindex covers the second";
@@ -595,6 +597,12 @@ TEST_F(IndexOpsTest, TheMigrationBringsServicesMonitorAndQueuesInLineWithTheList
             "utils:N GetShareNameByPath failed, path=; "
             "utils:N GetShareNameByPath failed, path=")
       << "once as the list is read, once by the migration";
+  Reset();
+  fake::Get().spotlight_set_fails = true;
+  EXPECT_FALSE(Updater_hxo60_beta2());
+  EXPECT_EQ(Log(),
+            "utils:N GetShareNameByPath failed, path=; "
+            "utils:N WEZOSMBSetSpotlight failed: err=[0x0E01 fake_platform:N]");
 }
 
 }  // namespace
