@@ -50,22 +50,10 @@ TEST_F(DaemonTest, EachCallIsOneConnectionWithOneExactFrame) {
     expected.push_back(std::string(reinterpret_cast<const char*>(&size), 4) + R"({"data":")" + s +
                        R"(","type":"t"})" + '\0');
   }
-  const std::vector<Json::Value> sent = {ParseJson(R"({"share": "/photo"})"),
-                                         ParseJson("[1, \"é\\n\"]"), Json::Value()};
-  for (const Json::Value& data : sent) {
-    ASSERT_TRUE(SendCammandToDaemon("add", data));
-  }
-  const std::vector<std::string> received = daemon.Connections(expected.size() + sent.size());
-  ASSERT_EQ(received.size(), expected.size() + sent.size());
+  const std::vector<std::string> received = daemon.Connections(expected.size());
+  ASSERT_EQ(received.size(), expected.size());
   for (size_t i = 0; i < expected.size(); ++i) {
     EXPECT_TRUE(received[i] == expected[i]) << "frame of " << expected[i].size() << " bytes";
-  }
-  const std::vector<Json::Value> commands = daemon.Commands(received.size());
-  for (size_t i = 0; i < sent.size(); ++i) {
-    Json::Value command;
-    command["type"] = "add";
-    command["data"] = sent[i];
-    EXPECT_EQ(commands[expected.size() + i], command);
   }
 }
 
