@@ -86,12 +86,13 @@ class FileindexctlTest : public SandboxTest {
     const int spawned = posix_spawn(&child, argv[0], pid != nullptr ? nullptr : &actions, nullptr,
                                     argv.data(), environ);
     posix_spawn_file_actions_destroy(&actions);
-    int wstatus = 0;
-    if (spawned != 0 || pid != nullptr) {
-      *(pid != nullptr ? pid : &child) = child;
+    if (pid != nullptr) {
+      *pid = child;
       return spawned == 0 ? 0 : -1;
     }
-    return waitpid(child, &wstatus, 0) == child && WIFEXITED(wstatus) ? WEXITSTATUS(wstatus) : -1;
+    int wstatus = 0;
+    const bool exited = spawned == 0 && waitpid(child, &wstatus, 0) == child && WIFEXITED(wstatus);
+    return exited ? WEXITSTATUS(wstatus) : -1;
   }
 
   // Waits up to five seconds for `text` in the stand-in daemon's log at or after byte `from`.
