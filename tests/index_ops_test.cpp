@@ -268,44 +268,23 @@ TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {
   // Each shape is malformed for every operation below; several make jsoncpp throw when a value
   // is read as a type it does not have. Paths that name more than one place, or another place
   // than they seem to, are refused like any other malformed element.
-  const char* shapes[] = {"{}",
-                          R"({"path":"/photo/b"})",
-                          R"("/photo/a")",
-                          "1",
-                          "null",
-                          "true",
-                          "[1]",
-                          "[null]",
-                          "[true]",
-                          "[[1]]",
-                          "[{}]",
-                          R"([{"path":{}}])",
-                          R"([{"path":1}])",
-                          R"([{"path":["/photo/b"]}])",
-                          R"([{"path":"/photo/b"},"/photo/a"])",
-                          R"(["/photo/a",{"path":"/photo/b"}])",
-                          R"([{"path":"/photo/b"},[1]])",
-                          R"(["/photo/../../../../etc"])",
-                          R"(["/photo/a","/photo/.."])",
-                          R"([""])",
-                          R"(["photo/a"])",
-                          R"(["/photo/./a"])",
-                          R"(["/photo//a"])",
-                          R"(["/photo/a/"])",
-                          R"(["/photo/a\u0000"])",
-                          R"([{"path":"/photo/b"},{"path":"/photo/x/../../../etc"}])",
-                          R"([{"path":"/photo/b\u0000"}])"};
+  const Json::Value shapes = ParseJson(R"([{}, {"path":"/photo/b"}, "/photo/a", 1, null, true,
+      [1], [null], [true], [[1]], [{}], [{"path":{}}], [{"path":1}], [{"path":["/photo/b"]}],
+      [{"path":"/photo/b"},"/photo/a"], ["/photo/a",{"path":"/photo/b"}], [{"path":"/photo/b"},[1]],
+      ["/photo/../../../../etc"], ["/photo/a","/photo/.."], [""], ["photo/a"], ["/photo/./a"],
+      ["/photo//a"], ["/photo/a/"], ["/photo/a\u0000"], [{"path":"/photo/b\u0000"}],
+      [{"path":"/photo/b"},{"path":"/photo/x/../../../etc"}]])");
   const std::pair<const char*, bool (*)(const Json::Value&)> operations[] = {
       {"Upsert", &IndexMgr::Upsert}, {"Set", &IndexMgr::Set},         {"Add", &IndexMgr::Add},
       {"Delete", &IndexMgr::Delete}, {"Reindex", &IndexMgr::Reindex},
   };
   for (const auto& [name, operation] : operations) {
-    for (const char* shape : shapes) {
-      SCOPED_TRACE(std::string(name) + " " + shape);
+    for (const Json::Value& shape : shapes) {
+      SCOPED_TRACE(std::string(name) + " " + JsonToString(shape));
       ErrorHandler::SetError(FILEINDEX_ERR_NONE);
       log.Clear();
       bool result = true;
-      EXPECT_NO_THROW(result = operation(ParseJson(shape)));
+      EXPECT_NO_THROW(result = operation(shape));
       EXPECT_FALSE(result);
       EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_BAD_PARAM);
       EXPECT_THAT(Log(), ::testing::ContainsRegex("(Bad param|Malformed jsArrPath): "));
@@ -340,8 +319,7 @@ TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {
 
   // The configuration classes take the same shapes, and the elements inside them, without
   // throwing.
-  for (const char* shape : shapes) {
-    const Json::Value request = ParseJson(shape);
+  for (const Json::Value& request : shapes) {
     for (const Json::Value& value : {request, request.isArray() ? request[0] : request}) {
       Folders list;
       Folder one;
@@ -353,7 +331,7 @@ TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {
         one.AddToJson(out);
         one.GetAdditional(out, value);
         one.asJson(value);
-      }) << shape;
+      }) << JsonToString(request);
     }
   }
   for (const char* additional : {R"("is_valid")", "[1]", "[[1]]", R"({"a":1})"}) {
