@@ -199,50 +199,11 @@ changes() {
 # The sandbox appliance
 
 root=$(realpath "$(mktemp -d)")
-demo=$root/demo
+demo=$root/records
 daemon_log=$demo/daemon.log
 registry=$root/var/lib/wezotifyd/fileindex
 printf '\nSandbox appliance in ROOT=%s\n' "$root"
-
-mkdir -p "$root"/{tmp,var/run,var/lib/wezotifyd,usr/wezo/etc/fileindex,usr/wezo/bin,usr/bin}
-mkdir -p "$root"/etc/samba "$demo"/units
-mkdir -p "$root"/volume1/{photo/2019,photo/2020,video/movies,video/series,music/live}
-mkdir -p "$root"/volume1/{archive/2018,surveillance/cam1}
-ln -s 2019 "$root/volume1/photo/latest"
-
-{
-  printf '[global]\n\tworkgroup = DEMO\n\tspotlight = no\n'
-  for share in photo video music archive surveillance; do
-    read_only=no
-    if [ "$share" = archive ]; then read_only=yes; fi
-    printf '\n[%s]\n\tpath = %s/volume1/%s\n\tread only = %s\n' "$share" "$root" "$share" "$read_only"
-  done
-} >"$root/etc/samba/smb.conf"
-# A parse is kept only for a file older than two seconds; an older file lets the demo use it.
-touch -d '-5 seconds' "$root/etc/samba/smb.conf"
-
-cat >"$root/usr/bin/systemctl" <<EOF
-#!/bin/sh
-# Stand-in service manager: records each change and keeps each unit's state in a file.
-if [ "\$1" = is-active ]; then
-  state=\$(cat "$demo/units/\$2" 2>/dev/null || echo inactive)
-  echo "\$state"
-  [ "\$state" = active ]
-  exit
-fi
-echo "systemctl \$*" >>"$demo/services.log"
-case "\$1" in
-  start | restart | reload-or-restart) echo active >"$demo/units/\$2" ;;
-  stop) echo inactive >"$demo/units/\$2" ;;
-esac
-exit 0
-EOF
-cat >"$root/usr/wezo/bin/wezohxonotify" <<EOF
-#!/bin/sh
-# Stand-in notification tool: records its arguments as one line.
-echo "\$*" >>"$demo/notify.log"
-EOF
-chmod +x "$root/usr/bin/systemctl" "$root/usr/wezo/bin/wezohxonotify"
+./scripts/sandbox-appliance.sh "$root"
 
 start_daemon() {
   "$daemon_bin" --socket "$root/var/run/fileindexd.sock" --log "$daemon_log" --root "$root" --consume &

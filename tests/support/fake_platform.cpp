@@ -57,8 +57,8 @@ int FlagQuery(const char* op, const WEZOSHARE* record, int* flag, bool fails, bo
   return 0;
 }
 
-int ServiceCall(const char* op, const char* service, bool fails, bool running) {
-  Record(op, {Str(service)});
+int ServiceCall(const char* op, const char* service, bool fails, bool running, int flags = 0) {
+  Record(op, {Str(service), std::to_string(flags)});
   if (fails || service == nullptr) {
     return Fail(__LINE__);
   }
@@ -265,12 +265,12 @@ int WLIBCExecv(const char* szPath, const char* const argv[], int flags) {
   return Get().execResult;
 }
 
-int WLIBServiceStart(const char* szService, int /*flags*/) {
-  return fake::ServiceCall("WLIBServiceStart", szService, Get().service_start_fails, true);
+int WLIBServiceStart(const char* szService, int flags) {
+  return fake::ServiceCall("WLIBServiceStart", szService, Get().service_start_fails, true, flags);
 }
 
-int WLIBServiceStop(const char* szService, int /*flags*/) {
-  return fake::ServiceCall("WLIBServiceStop", szService, Get().service_stop_fails, false);
+int WLIBServiceStop(const char* szService, int flags) {
+  return fake::ServiceCall("WLIBServiceStop", szService, Get().service_stop_fails, false, flags);
 }
 
 int WLIBServiceRestart(const char* szService) {

@@ -2,7 +2,6 @@
 
 #include <dirent.h>
 #include <fcntl.h>
-#include <ftw.h>
 #include <poll.h>
 #include <sys/file.h>
 #include <sys/socket.h>
@@ -15,18 +14,18 @@
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
-#include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <regex>
 #include <sstream>
+#include <utility>
 
 #include "fake_platform.h"
 #include "fileindex/error.h"
-#include "fileindex/root.h"
 #include "json_io.h"
-#include "utils/log.h"
 #include "paths.h"
+#include "utils/log.h"
 
 namespace testsupport {
 namespace {
@@ -37,48 +36,11 @@ std::vector<std::string>& Captured() {
 }
 
 void CaptureSink(int priority, const char* line) {
-  std::string entry = line;
-  if (priority != LOG_ERR) {
-    entry = "priority=" + std::to_string(priority) + " " + entry;
-  }
-  Captured().push_back(entry);
-}
-
-int RemoveEntry(const char* path, const struct stat* /*st*/, int /*flag*/, struct FTW* /*ftw*/) {
-  (void)remove(path);  // best effort: a leftover only wastes space in the temporary directory
-  return 0;
-}
-
-void MakeDirs(const std::string& path) {
-  for (size_t pos = 1; pos != std::string::npos;) {
-    pos = path.find('/', pos + 1);
-    mkdir(path.substr(0, pos).c_str(), 0755);
-  }
+  Captured().push_back((priority != LOG_ERR ? "priority=" + std::to_string(priority) + " " : "") +
+                       line);
 }
 
 }  // namespace
-
-Sandbox::Sandbox() {
-  const char* tmp = std::getenv("TMPDIR");
-  std::string pattern =
-      std::string(tmp != nullptr && *tmp != '\0' ? tmp : "/tmp") + "/fileindex-test.XXXXXX";
-  if (mkdtemp(pattern.data()) == nullptr) {
-    ADD_FAILURE() << "mkdtemp failed";
-    return;
-  }
-  m_root = pattern;
-  for (const char* dir : {"/tmp", "/var/run", "/usr/wezo/etc/fileindex", "/usr/wezo/bin"}) {
-    MakeDirs(m_root + dir);
-  }
-  EXPECT_TRUE(WEZO::FILEINDEX::SetRootPrefix(m_root));
-}
-
-Sandbox::~Sandbox() {
-  WEZO::FILEINDEX::SetRootPrefix("");
-  if (!m_root.empty()) {
-    nftw(m_root.c_str(), RemoveEntry, 16, FTW_DEPTH | FTW_PHYS);
-  }
-}
 
 LogCapture::LogCapture() {
   Captured().clear();
@@ -115,12 +77,9 @@ void WriteFile(const std::string& path, const std::string& text) {
 
 std::string ReadFile(const std::string& path) {
   std::ifstream in(path, std::ios::binary);
-  if (!in) {
-    return "<missing>";
-  }
   std::ostringstream text;
   text << in.rdbuf();
-  return text.str();
+  return in ? text.str() : "<missing>";
 }
 
 int ModeOf(const std::string& path) {
@@ -131,13 +90,12 @@ int ModeOf(const std::string& path) {
 int OpenDescriptorCount() {
   int count = 0;
   DIR* dir = opendir("/proc/self/fd");
-  if (dir == nullptr) {
-    return -1;
-  }
-  while (readdir(dir) != nullptr) {
+  while (dir != nullptr && readdir(dir) != nullptr) {
     ++count;
   }
-  closedir(dir);
+  if (dir != nullptr) {
+    closedir(dir);
+  }
   return count - 3;  // ".", ".." and the directory's own descriptor
 }
 
@@ -150,10 +108,9 @@ LockHolder::LockHolder(const std::string& path, bool exclusive) {
   }
   m_pid = fork();
   if (m_pid == 0) {
-    close(ready[0]);
-    close(release[1]);
     const int fd = open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644);
     const char ok = fd >= 0 && flock(fd, exclusive ? LOCK_EX : LOCK_SH) == 0 ? '1' : '0';
+    close(release[1]);
     (void)!write(ready[1], &ok, 1);
     char byte;
     while (read(release[0], &byte, 1) > 0) {
@@ -170,56 +127,35 @@ LockHolder::LockHolder(const std::string& path, bool exclusive) {
 }
 
 LockHolder::~LockHolder() {
-  if (m_release >= 0) {
-    close(m_release);
-  }
+  close(m_release);
   if (m_pid > 0) {
-    int status = 0;
-    waitpid(m_pid, &status, 0);
+    waitpid(m_pid, nullptr, 0);
   }
 }
-
-namespace {
-
-// The daemon's socket address for `path`. A path that fills sun_path to its last byte is still
-// taken, so that tests can put a daemon where the library must refuse to look.
-bool SocketAddress(const std::string& path, sockaddr_un& address) {
-  address = sockaddr_un{};
-  address.sun_family = AF_UNIX;
-  if (path.size() > sizeof(address.sun_path)) {
-    return false;
-  }
-  std::memcpy(address.sun_path, path.data(), path.size());
-  return true;
-}
-
-}  // namespace
 
 FakeDaemon::FakeDaemon(Behaviour behaviour)
     : m_path(WEZO::FILEINDEX::DaemonSocketPath()), m_behaviour(behaviour) {
+  // A path that fills sun_path to its last byte is still taken, so that a test can put a daemon
+  // where the library must refuse to look.
   sockaddr_un address{};
-  if (!SocketAddress(m_path, address)) {
+  address.sun_family = AF_UNIX;
+  if (m_path.size() > sizeof(address.sun_path)) {
     ADD_FAILURE() << "socket path too long: " << m_path;
     return;
   }
+  std::memcpy(address.sun_path, m_path.data(), m_path.size());
   const auto* addr = reinterpret_cast<const sockaddr*>(&address);
   const bool hold = behaviour == Behaviour::kHoldConnect;
   unlink(m_path.c_str());
   m_listen = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+  // A listener with a backlog of 0 queues one connection; kHoldConnect's own takes the place, so
+  // the next client waits in connect().
   if (m_listen < 0 || bind(m_listen, addr, sizeof(address)) != 0 ||
-      listen(m_listen, hold ? 0 : SOMAXCONN) != 0 || pipe2(m_wake, O_CLOEXEC | O_NONBLOCK) != 0) {
+      listen(m_listen, hold ? 0 : SOMAXCONN) != 0 || pipe2(m_wake, O_CLOEXEC | O_NONBLOCK) != 0 ||
+      (hold && ((m_dummy = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) < 0 ||
+                connect(m_dummy, addr, sizeof(address)) != 0))) {
     ADD_FAILURE() << "cannot listen on " << m_path << ": " << std::strerror(errno);
     return;
-  }
-  if (hold) {
-    // A listener with a backlog of 0 queues one connection; this one takes the place, so the
-    // next client waits in connect().
-    m_dummy = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
-    if (m_dummy < 0 || connect(m_dummy, addr, sizeof(address)) != 0) {
-      ADD_FAILURE() << "cannot fill the backlog: " << std::strerror(errno);
-      return;
-    }
-    m_discardNext = true;
   }
   m_thread = std::thread(&FakeDaemon::Serve, this);
 }
@@ -249,137 +185,97 @@ void FakeDaemon::Release() {
   (void)!write(m_wake[1], "x", 1);
 }
 
-void FakeDaemon::Serve() {
-  std::vector<Connection> reading;
-  std::vector<int> held;  // kStopReading's connections
-  std::vector<pollfd> fds;
+bool FakeDaemon::Wait(int fd) {
   for (;;) {
-    bool accepting = false;
-    {
-      std::lock_guard<std::mutex> lock(m_mutex);
-      if (m_stopping) {
-        break;
-      }
-      accepting = m_behaviour != Behaviour::kHoldConnect;
-    }
-    fds.assign({{m_wake[0], POLLIN, 0}, {accepting ? m_listen : -1, POLLIN, 0}});
-    for (const Connection& connection : reading) {
-      fds.push_back({connection.fd, POLLIN, 0});
-    }
-    // The timeout only guards against a lost wake-up; the pipe ends every wait that matters.
-    if (poll(fds.data(), fds.size(), 1000) < 0 && errno != EINTR) {
-      ADD_FAILURE() << "fake daemon: poll failed: " << std::strerror(errno);
-      break;
+    pollfd fds[2] = {{m_wake[0], POLLIN, 0}, {fd, POLLIN, 0}};
+    // The timeout only guards against a lost wake-up.
+    if (poll(fds, 2, 1000) < 0 && errno != EINTR) {
+      return false;
     }
     char drain[64];
     while (read(m_wake[0], drain, sizeof(drain)) > 0) {
     }
-    for (size_t i = reading.size(); i-- > 0;) {
-      if (fds[i + 2].revents == 0) {
-        continue;
-      }
-      char buffer[65536];
-      const ssize_t got = read(reading[i].fd, buffer, sizeof(buffer));
-      if (got > 0) {
-        reading[i].bytes.append(buffer, static_cast<size_t>(got));
-      } else if (got == 0 || (errno != EAGAIN && errno != EINTR)) {
-        Finish(reading[i]);
-        reading.erase(reading.begin() + static_cast<std::ptrdiff_t>(i));
-      }
+    std::lock_guard<std::mutex> lock(m_mutex);
+    if (m_stopping) {
+      return false;
     }
-    while (accepting && AcceptOne(reading, held)) {
+    if (fds[1].revents != 0 || (fd < 0 && fds[0].revents != 0)) {
+      return true;
     }
   }
-  for (const Connection& connection : reading) {
-    close(connection.fd);
+}
+
+void FakeDaemon::Serve() {
+  std::vector<int> held;                                  // kStopReading's connections
+  bool discard = m_behaviour == Behaviour::kHoldConnect;  // the first accepted is m_dummy's
+  for (;;) {
+    Behaviour behaviour;
+    {
+      std::lock_guard<std::mutex> lock(m_mutex);
+      behaviour = m_behaviour;
+    }
+    if (!Wait(behaviour == Behaviour::kHoldConnect ? -1 : m_listen)) {
+      break;
+    }
+    const int fd = behaviour == Behaviour::kHoldConnect
+                       ? -1
+                       : accept4(m_listen, nullptr, nullptr, SOCK_CLOEXEC);
+    if (fd < 0 || std::exchange(discard, false) || behaviour == Behaviour::kStopReading) {
+      if (fd >= 0) {
+        held.push_back(fd);
+      }
+      continue;
+    }
+    std::string bytes;
+    char buffer[65536];
+    ssize_t got = 0;
+    while (behaviour == Behaviour::kRead && Wait(fd) &&
+           (got = read(fd, buffer, sizeof(buffer))) > 0) {
+      bytes.append(buffer, static_cast<size_t>(got));
+    }
+    close(fd);
+    {
+      std::lock_guard<std::mutex> lock(m_mutex);
+      m_ended.push_back(std::move(bytes));
+    }
+    m_changed.notify_all();
   }
   for (int fd : held) {
     close(fd);
   }
 }
 
-bool FakeDaemon::AcceptOne(std::vector<Connection>& reading, std::vector<int>& held) {
-  const int fd = accept4(m_listen, nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK);
-  if (fd < 0) {
-    return false;
-  }
-  Connection connection{fd, 0, {}};
-  Behaviour behaviour = Behaviour::kRead;
-  {
-    std::lock_guard<std::mutex> lock(m_mutex);
-    if (std::exchange(m_discardNext, false)) {
-      close(fd);
-      return true;
-    }
-    connection.index = m_accepted++;
-    behaviour = m_behaviour;
-  }
-  switch (behaviour) {
-    case Behaviour::kAcceptAndClose:
-      Finish(connection);
-      break;
-    case Behaviour::kStopReading:
-      held.push_back(fd);
-      break;
-    default:
-      reading.push_back(std::move(connection));
-      break;
-  }
-  return true;
-}
-
-void FakeDaemon::Finish(Connection& connection) {
-  close(connection.fd);
-  {
-    std::lock_guard<std::mutex> lock(m_mutex);
-    m_ended.emplace_back(connection.index, std::move(connection.bytes));
-  }
-  m_changed.notify_all();
-}
-
 std::vector<std::string> FakeDaemon::Connections(size_t count, std::chrono::milliseconds timeout) {
-  std::vector<std::pair<size_t, std::string>> ended;
-  {
-    std::unique_lock<std::mutex> lock(m_mutex);
-    m_changed.wait_for(lock, timeout, [&] { return m_ended.size() >= count; });
-    ended = m_ended;
-  }
-  std::sort(ended.begin(), ended.end());
-  std::vector<std::string> out;
-  out.reserve(ended.size());
-  for (auto& entry : ended) {
-    out.push_back(std::move(entry.second));
-  }
-  return out;
+  std::unique_lock<std::mutex> lock(m_mutex);
+  m_changed.wait_for(lock, timeout, [&] { return m_ended.size() >= count; });
+  return m_ended;
 }
 
 std::vector<Json::Value> FakeDaemon::Commands(size_t count, std::chrono::milliseconds timeout) {
   std::vector<Json::Value> out;
   for (const std::string& frame : Connections(count, timeout)) {
     uint32_t length = 0;
-    if (frame.size() >= sizeof(length)) {
-      std::memcpy(&length, frame.data(), sizeof(length));
-    }
-    const size_t textEnd = frame.size() - 1;
+    std::memcpy(&length, frame.data(), std::min(frame.size(), sizeof(length)));
     if (frame.size() <= sizeof(length) || length != frame.size() - sizeof(length) ||
-        frame.find('\0', sizeof(length)) != textEnd) {
+        frame.find('\0', sizeof(length)) != frame.size() - 1) {
       ADD_FAILURE() << "bad frame of " << frame.size() << " bytes, length field " << length;
       continue;
     }
-    out.push_back(ParseJson(frame.substr(sizeof(length), textEnd - sizeof(length))));
+    out.push_back(ParseJson(frame.substr(sizeof(length), length - 1)));
   }
   return out;
 }
 
-LibraryTest::LibraryTest() : volume(sandbox.Path("/volume1")) {
+LibraryTest::LibraryTest() : volume(At("volume1")) {
+  for (const char* dir : {"tmp", "var/run", "usr/wezo/etc/fileindex", "usr/wezo/bin"}) {
+    std::filesystem::create_directories(At(dir));
+  }
   fake::Reset();
   fake::Get().AddShare("photo", volume + "/photo");
   fake::Get().AddShare("video", volume + "/video");
   WEZO::FILEINDEX::ErrorHandler::SetError(WEZO::FILEINDEX::FILEINDEX_ERR_NONE);
   WEZO::FILEINDEX::LOG_LEVEL = 3;
 }
-
-LibraryTest::~LibraryTest() = default;
 
 Json::Value LibraryTest::StatusFile() {
   return ParseJson(ReadFile(WEZO::FILEINDEX::StatusConfPath()));

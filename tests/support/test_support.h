@@ -1,5 +1,5 @@
-// Shared helpers of the library's tests: a sandbox root per test, the captured log, and another
-// process that holds a file lock.
+// Shared helpers of the library's tests: the fixture with its sandbox root, the captured log,
+// another process that holds a file lock, and a stand-in daemon on the socket.
 #ifndef FILEINDEX_TESTS_SUPPORT_TEST_SUPPORT_H_
 #define FILEINDEX_TESTS_SUPPORT_TEST_SUPPORT_H_
 
@@ -14,8 +14,9 @@
 #include <ostream>
 #include <string>
 #include <thread>
-#include <utility>
 #include <vector>
+
+#include "sandbox.h"
 
 namespace Json {
 // Failed expectations show JSON values as text.
@@ -24,28 +25,9 @@ inline void PrintTo(const Value& value, std::ostream* os) { *os << value.toStyle
 
 namespace testsupport {
 
-// A fresh temporary directory made the library's root prefix, with the directories that exist on
-// the appliance (tmp, var/run, usr/wezo/etc/fileindex). Removed with everything in it, and the
-// root prefix cleared, on destruction.
-class Sandbox {
- public:
-  Sandbox();
-  ~Sandbox();
-  Sandbox(const Sandbox&) = delete;
-  Sandbox& operator=(const Sandbox&) = delete;
-
-  const std::string& Root() const { return m_root; }
-  // `relative` (absolute on the appliance, "/volume1/photo") inside the sandbox.
-  std::string Path(const std::string& relative) const { return m_root + relative; }
-
- private:
-  std::string m_root;
-};
-
-// Reads back what the library logged. Lines are returned with their source line number replaced
-// by "N" ("config:N Failed to lock folder"), so tests can state them exactly without depending
-// on where the statement sits. A line logged at any priority other than LOG_ERR is returned with
-// the prefix "priority=<n> " so that a test sees it.
+// Reads back what the library logged. Lines() replaces each line's source line number by "N"
+// ("config:N Failed to lock folder") and prefixes a line logged at any priority but LOG_ERR with
+// "priority=<n> ".
 class LogCapture {
  public:
   LogCapture();
@@ -60,7 +42,6 @@ class LogCapture {
 
 // `text` parsed as JSON. Fails the test when it is not JSON.
 Json::Value ParseJson(const std::string& text);
-
 // Writes `text` to `path`, replacing it. Fails the test on error.
 void WriteFile(const std::string& path, const std::string& text);
 // The file's content, or "<missing>" when it cannot be read.
@@ -86,16 +67,16 @@ class LockHolder {
   bool m_holding = false;
 };
 
-// A stand-in for the indexing daemon: a real listening Unix socket at the sandbox's daemon socket
-// path, served by a thread of the test process. Create it after the root prefix is set. It never
-// calls into the library from its thread, so it can run beside a test that captures the log.
+// A stand-in for the indexing daemon: a listening Unix socket at the sandbox's daemon socket
+// path, served one connection at a time by a thread that never calls into the library. Create
+// it after the root prefix is set.
 class FakeDaemon {
  public:
   enum class Behaviour {
-    kRead,            // accepts each connection and reads it to its end
-    kAcceptAndClose,  // accepts each connection and closes it at once without reading
-    kStopReading,     // accepts and never reads (the connection stays open until destruction)
-    kHoldConnect,     // accepts nobody until Release(): its backlog is kept full, so a client
+    kRead,            // reads each connection to its end
+    kAcceptAndClose,  // closes each connection at once without reading
+    kStopReading,     // never reads (the connection stays open until destruction)
+    kHoldConnect,     // accepts nobody until Release(): its backlog stays full, so a client
                       // blocks in connect()
   };
   explicit FakeDaemon(Behaviour behaviour = Behaviour::kRead);
@@ -103,11 +84,10 @@ class FakeDaemon {
   FakeDaemon(const FakeDaemon&) = delete;
   FakeDaemon& operator=(const FakeDaemon&) = delete;
 
-  // For kHoldConnect: from now on behave as kRead (accept the queued connections and read them).
+  // For kHoldConnect: from now on behave as kRead.
   void Release();
-  // The bytes received on each connection that has ended, in order of acceptance (length field
-  // included; empty for a connection closed without reading). Waits until at least `count`
-  // connections have ended or `timeout` passes; returns what it has.
+  // The bytes received on each ended connection, in order (length field included; empty for a
+  // connection closed unread), once `count` have ended or `timeout` passed.
   std::vector<std::string> Connections(size_t count,
                                        std::chrono::milliseconds timeout = std::chrono::seconds(5));
   // The same, each decoded: fails the test on a bad frame (a length field that is not the rest's
@@ -116,43 +96,37 @@ class FakeDaemon {
                                     std::chrono::milliseconds timeout = std::chrono::seconds(5));
 
  private:
-  struct Connection {
-    int fd;
-    size_t index;  // order of acceptance
-    std::string bytes;
-  };
-
   void Serve();
-  bool AcceptOne(std::vector<Connection>& reading, std::vector<int>& held);
-  void Finish(Connection& connection);
+  bool Wait(int fd);  // until `fd` is readable (true) or the daemon stops (false)
 
   std::string m_path;
   int m_listen = -1;
   int m_wake[2] = {-1, -1};
   int m_dummy = -1;  // kHoldConnect's own connection that fills the backlog
   std::thread m_thread;
-
   std::mutex m_mutex;
   std::condition_variable m_changed;
   Behaviour m_behaviour;
-  bool m_discardNext = false;  // the next accepted connection is m_dummy's
   bool m_stopping = false;
-  size_t m_accepted = 0;
-  std::vector<std::pair<size_t, std::string>> m_ended;
+  std::vector<std::string> m_ended;
 };
 
-// The fixture every library test derives from: its own sandbox root, a fresh fake platform with
-// the shares "photo" and "video" on /volume1 of the sandbox, the log captured, the last error
-// cleared and LOG_LEVEL back at its initial 3.
-class LibraryTest : public ::testing::Test {
+// The fixture of every library test: its own sandbox root with the appliance's directories, a
+// fresh fake platform with the shares "photo" and "video" on /volume1 of the sandbox, the log
+// captured, the last error cleared and LOG_LEVEL back at its initial 3.
+class LibraryTest : public SandboxTest {
  protected:
   LibraryTest();
-  ~LibraryTest() override;
 
   // The sandbox's status.conf, parsed. Fails the test when it is missing or not JSON.
   static Json::Value StatusFile();
 
-  Sandbox sandbox;
+  // The sandbox as the tests written before SandboxTest name it: Path("/x"), Root().
+  struct Paths {
+    const std::string& root;
+    std::string Path(const std::string& relative) const { return root + relative; }
+    const std::string& Root() const { return root; }
+  } sandbox{root_};
   LogCapture log;
   std::string volume;  // the sandbox's /volume1
 };
