@@ -36,24 +36,22 @@ TEST_F(MonitorTest, KeepsOneFilePerClientAndQueue) {
 
   EXPECT_TRUE(MonitorQueue::Delete(queue, "fx", QUEUE_TYPE_FILE));
   EXPECT_NE(access(file.c_str(), F_OK), 0);
-  EXPECT_TRUE(MonitorQueue::Delete(queue, "fx", QUEUE_TYPE_FILE));
-  EXPECT_TRUE(MonitorQueue::Delete(queue, "nobody", QUEUE_TYPE_FILE));
+  EXPECT_TRUE(MonitorQueue::Delete(queue, "fx", QUEUE_TYPE_FILE) &&
+              MonitorQueue::Delete(queue, "nobody", QUEUE_TYPE_FILE));
 }
 
 TEST_F(MonitorTest, RefusesWhatCannotBeARegistrationFile) {
-  const struct {
-    std::string queue;
-    std::string client;
-  } cases[] = {{"/q", ""},
-               {"/q", "a/b"},
-               {"/q", ".."},
-               {"/q", std::string("a\0b", 3)},
-               {std::string(100, '/'), "c"}};
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.client);
-    EXPECT_FALSE(MonitorQueue::Upsert(Entry(c.queue, "/d"), c.client, QUEUE_TYPE_FILE));
+  const std::pair<std::string, std::string> kCases[] = {// queue, client
+                                                        {"/q", ""},
+                                                        {"/q", "a/b"},
+                                                        {"/q", ".."},
+                                                        {"/q", std::string("a\0b", 3)},
+                                                        {std::string(100, '/'), "c"}};
+  for (const auto& [queue, client] : kCases) {
+    SCOPED_TRACE(client);
+    EXPECT_FALSE(MonitorQueue::Upsert(Entry(queue, "/d"), client, QUEUE_TYPE_FILE));
     EXPECT_EQ(WLIBCErrGet(), WLIBC_ERR_BAD_PARAMETERS);
-    EXPECT_FALSE(MonitorQueue::Delete(c.queue, c.client, QUEUE_TYPE_FILE));
+    EXPECT_FALSE(MonitorQueue::Delete(queue, client, QUEUE_TYPE_FILE));
   }
   Write("var/lib/wezotifyd", "not a folder");
   EXPECT_FALSE(MonitorQueue::Upsert(Entry("/q", "/d"), "fx", QUEUE_TYPE_FILE));
