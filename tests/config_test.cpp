@@ -3,11 +3,14 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <ctime>
 #include <filesystem>
 
+#include "file_io.h"
 #include "fileindex/config.h"
 #include "fileindex/error.h"
 #include "fileindex/root.h"
+#include "json_io.h"
 #include "paths.h"
 #include "test_support.h"
 
@@ -44,19 +47,12 @@ class ConfigTest : public testsupport::LibraryTest {
 
 TEST_F(ConfigTest, EveryFixedPathLiesUnderAnAbsoluteRoot) {
   const std::string kept = GetRootPrefix();
-  const struct Case {
-    std::string given;
-    bool accepted;
-    std::string root;  // the prefix afterwards
-  } kCases[] = {{"/srv/a//", true, "/srv/a"},
-                {"/", true, ""},
-                {"relative", false, ""},
-                {std::string("/a\0b", 4), false, ""}};
-  for (const Case& c : kCases) {
-    ASSERT_TRUE(SetRootPrefix(""));
-    EXPECT_EQ(SetRootPrefix(c.given), c.accepted) << c.given;
-    const std::string& root = c.root;
-    EXPECT_EQ(GetRootPrefix(), root) << c.given;
+  EXPECT_FALSE(SetRootPrefix("relative") || SetRootPrefix(std::string("/a\0b", 4)));
+  EXPECT_EQ(GetRootPrefix(), kept);
+  for (const auto& [given, prefix] : {std::pair{"/srv/a//", "/srv/a"}, {"/", ""}}) {
+    ASSERT_TRUE(SetRootPrefix(given));
+    const std::string root = prefix;
+    EXPECT_EQ(GetRootPrefix(), root);
     EXPECT_EQ(FolderConfPath(), root + "/usr/wezo/etc/fileindex/folder.conf");
     EXPECT_EQ(StatusConfPath(), root + "/usr/wezo/etc/fileindex/status.conf");
     EXPECT_EQ(FolderLockPath(), root + "/tmp/fileidx_cfg_folder.lock");
@@ -155,6 +151,60 @@ TEST_F(ConfigTest, LockFileThatOthersCouldHoldIsRefused) {
   }
   EXPECT_EQ(testsupport::ModeOf(other), 0644);  // the linked file is not touched
   EXPECT_EQ(testsupport::ReadFile(other), "precious");
+}
+
+TEST_F(ConfigTest, TextIsOneLineAndOnlyOneWholeValueIsRead) {
+  Json::Value v;
+  v["p"] = "/v/line\nbreak\t\"q\"\\\xC3\xA9";  // UTF-8 stays UTF-8
+  v["list"].append(Json::Value());
+  const std::string text = JsonToString(v);
+  EXPECT_EQ(text, R"({"list":[null],"p":"/v/line\nbreak\t\"q\"\\)"
+                  "\xC3\xA9\"}");
+  // The last is deeper than the reader's nesting limit, which makes it throw.
+  for (const std::string& refused :
+       {std::string("{"), std::string("{}{}"), std::string("[1,]"), std::string(R"({"a":1,"a":2})"),
+        std::string("{} // c"), std::string(5000, '[') + std::string(5000, ']')}) {
+    EXPECT_FALSE(JsonFromString(v, refused)) << refused;
+  }
+  Json::Value back;
+  ASSERT_TRUE(JsonFromString(back, " " + text + "\n"));
+  EXPECT_EQ(JsonToString(back), text);
+}
+
+// A symbolic link in the file's place is replaced, not written through; a failed save leaves
+// the old file and no temporary file.
+TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAll) {
+  const std::string dir = sandbox.Path("/usr/wezo/etc/fileindex");
+  const std::string target = sandbox.Path("/target");
+  testsupport::WriteFile(target, "keep");
+  const std::string path = dir + "/x.conf";
+  ASSERT_EQ(symlink(target.c_str(), path.c_str()), 0);
+  EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kReplaced);
+  EXPECT_EQ(testsupport::ReadFile(target) + testsupport::ReadFile(path), "keep{}\n");
+  // A directory in the file's place makes the final rename fail after the data is written.
+  ASSERT_EQ(unlink(path.c_str()) | mkdir(path.c_str(), 0755), 0);
+  EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kFailed);
+  EXPECT_EQ(std::distance(std::filesystem::directory_iterator(dir), {}), 1);  // no temporary
+  EXPECT_EQ(JsonToFile(Json::Value(1), sandbox.Path("/no/dir/x.conf"), 0644),
+            JsonSaveResult::kFailed);
+}
+
+TEST_F(ConfigTest, RemovesOnlyOldTemporariesOfTheFile) {
+  const std::string dir = sandbox.Path("/usr/wezo/etc/fileindex/");
+  const struct Case {
+    const char* name;
+    bool old, removed;  // a new one's writer may still be saving
+  } kCases[] = {{"folder.conf.a1B2c3", true, true},  {"folder.conf.Z9z9Z9", false, false},
+                {"folder.conf.a1B2c", true, false},  {"folder.conf.a1B2c3d", true, false},
+                {"folder.conf.a1-2c3", true, false}, {"folder.confXa1B2c3", true, false}};
+  const timespec twoHoursAgo[2] = {{time(nullptr) - 7200, 0}, {time(nullptr) - 7200, 0}};
+  for (const Case& c : kCases) {
+    testsupport::WriteFile(dir + c.name, "{");
+    ASSERT_EQ(c.old ? utimensat(AT_FDCWD, (dir + c.name).c_str(), twoHoursAgo, 0) : 0, 0);
+  }
+  RemoveStaleTemporaries(dir + "folder.conf", 3600);
+  for (const Case& c : kCases)
+    EXPECT_EQ(testsupport::ModeOf(dir + c.name) < 0, c.removed) << c.name;
 }
 
 }  // namespace

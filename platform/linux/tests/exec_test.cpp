@@ -1,7 +1,10 @@
+#include <gtest/gtest.h>
 #include <unistd.h>
 #include <wezo/platform.h>
 
+#include <set>
 #include <string>
+#include <thread>
 
 #include "internal.h"
 #include "sandbox.h"
@@ -54,6 +57,59 @@ TEST_F(ExecTest, ControlsServicesThroughSystemctl) {
   EXPECT_STREQ(WLIBCErrorGetFile(), "exec.cpp");
   ASSERT_EQ(unlink(At("usr/bin/systemctl").c_str()), 0);
   EXPECT_LT(WLIBServiceStop("samba", 1), 0);
+}
+
+int Sign(int v) { return (v > 0) - (v < 0); }
+
+TEST(TextTest, ComparesUtf8WithUnicodeCaseFoldingInAStrictWeakOrderOfAnyBytes) {
+  const struct Case {
+    const char* a;
+    const char* b;
+    int sign;
+  } kCases[] = {
+      {"\xC3\x89t\xC3\xA9", "\xC3\xA9T\xC3\x89", 0},  // Été, éTÉ
+      {"Stra\xC3\x9F\x65", "STRASSE", 0},             // Straße: full folding
+      {"\xCE\xA3\xCE\xA3", "\xCF\x83\xCF\x82", 0},    // ΣΣ, σς
+      {"ab", "A", 1},
+      {"\xEF\xBC\xA1", "\xF0\x9F\x98\x80", -1},  // code point order: U+FF21 before U+1F600
+      {"Z\xFF", "a", 1},                         // a stray byte stands for itself, folding goes on
+      {"\xC3", "\xC3\xA9", -1},                  // truncated sequence
+      {"\xC0\xAF", "/", 1},                      // overlong "/" is not "/"
+  };
+  // Hex escapes end where a letter follows: "\x62" is 'b'.
+  std::set<std::string> texts = {
+      "", "b", "\xFF", "\x80", "a\x80\x62", "A\x80\x42", "\xE2\x82\xAC\xFF"};
+  for (const Case& c : kCases) {
+    SCOPED_TRACE(std::string(c.a) + " vs " + c.b);
+    EXPECT_EQ(Sign(WLIBCUnicodeUTF8StrCaseCmp(c.a, c.b)), c.sign);
+    EXPECT_EQ(Sign(WLIBCUnicodeUTF8StrCaseCmp(c.b, c.a)), -c.sign);
+    texts.insert({c.a, c.b});
+  }
+  for (const std::string& a : texts) {
+    for (const std::string& b : texts) {
+      const int ab = Sign(WLIBCUnicodeUTF8StrCaseCmp(a.c_str(), b.c_str()));
+      ASSERT_EQ(ab, -Sign(WLIBCUnicodeUTF8StrCaseCmp(b.c_str(), a.c_str()))) << a << " vs " << b;
+      for (const std::string& c : texts) {
+        const int bc = Sign(WLIBCUnicodeUTF8StrCaseCmp(b.c_str(), c.c_str()));
+        if (ab <= 0 && bc <= 0) {
+          ASSERT_LE(Sign(WLIBCUnicodeUTF8StrCaseCmp(a.c_str(), c.c_str())), ab + bc < 0 ? -1 : 0)
+              << a << " <= " << b << " <= " << c;
+        }
+      }
+    }
+  }
+}
+
+TEST(LastErrorTest, EachThreadHasItsOwn) {
+  WLIBCErrSetEx(0x2900, "here", 7);
+  std::thread([] {
+    EXPECT_EQ(WLIBCErrGet(), 0);
+    WLIBCErrSetEx(1, nullptr, 1);
+    EXPECT_STREQ(WLIBCErrorGetFile(), "");
+  }).join();
+  EXPECT_EQ(WLIBCErrGet(), 0x2900);
+  EXPECT_STREQ(WLIBCErrorGetFile(), "here");
+  EXPECT_EQ(WLIBCErrorGetLine(), 7);
 }
 
 }  // namespace
