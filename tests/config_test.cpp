@@ -63,7 +63,7 @@ TEST_F(ConfigTest, EveryFixedPathLiesUnderAnAbsoluteRoot) {
   ASSERT_TRUE(SetRootPrefix(kept));
 }
 
-TEST_F(ConfigTest, SaveCreatesTheFileWhateverTheUmaskAndRemovesTemporariesOnlyUnderTheLock) {
+TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAllAndLoadTellsItsFailures) {
   const std::string stale = FolderConfPath() + ".a1B2c3";
   for (const bool locked : {false, true}) {
     testsupport::WriteFile(stale, "{\"half");
@@ -77,21 +77,28 @@ TEST_F(ConfigTest, SaveCreatesTheFileWhateverTheUmaskAndRemovesTemporariesOnlyUn
     EXPECT_EQ(testsupport::ModeOf(stale) < 0, locked) << locked;
   }
   EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);
-  // A symbolic link in the file's place counts as no file.
-  ASSERT_EQ(rename(FolderConfPath().c_str(), sandbox.Path("/real.conf").c_str()), 0);
-  ASSERT_EQ(symlink(sandbox.Path("/real.conf").c_str(), FolderConfPath().c_str()), 0);
+  // A symbolic link in the file's place counts as no file; it is replaced, not written through.
+  const std::string real = sandbox.Path("/real.conf");
+  ASSERT_EQ(rename(FolderConfPath().c_str(), real.c_str()), 0);
+  ASSERT_EQ(symlink(real.c_str(), FolderConfPath().c_str()), 0);
   TestConfig cfg;
   ASSERT_TRUE(cfg.LoadJson());
   EXPECT_EQ(cfg.Doc(), Json::Value(Json::objectValue));
-  ASSERT_EQ(unlink(FolderConfPath().c_str()), 0);
+  cfg.Doc()["b"] = 2;
+  ASSERT_TRUE(cfg.SaveJson());
+  EXPECT_EQ(testsupport::ReadFile(real), "{}\n");
+  EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);  // a file of its own
   testsupport::WriteFile(FolderConfPath(), "");
   EXPECT_FALSE(cfg.LoadJson());
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_LOAD_JSON);
+  // A directory in the file's place makes the final rename fail after the data is written.
+  ASSERT_EQ(unlink(FolderConfPath().c_str()) | mkdir(FolderConfPath().c_str(), 0755), 0);
   log.Clear();
-  std::filesystem::remove_all(sandbox.Path("/usr/wezo/etc/fileindex"));
   EXPECT_FALSE(cfg.SaveJson());
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_SAVE_JSON);
   EXPECT_EQ(log.Lines(), Lines{"config:N Failed to save json to " + FolderConfPath()});
+  const auto entries = std::filesystem::directory_iterator(sandbox.Path("/usr/wezo/etc/fileindex"));
+  EXPECT_EQ(std::distance(entries, {}), 1);  // no temporary file is left
 }
 
 TEST_F(ConfigTest, LockAdmitsOnlySharedBesideSharedAndKeepsItsFilePrivate) {
@@ -169,24 +176,6 @@ TEST_F(ConfigTest, TextIsOneLineAndOnlyOneWholeValueIsRead) {
   Json::Value back;
   ASSERT_TRUE(JsonFromString(back, " " + text + "\n"));
   EXPECT_EQ(JsonToString(back), text);
-}
-
-// A symbolic link in the file's place is replaced, not written through; a failed save leaves
-// the old file and no temporary file.
-TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAll) {
-  const std::string dir = sandbox.Path("/usr/wezo/etc/fileindex");
-  const std::string target = sandbox.Path("/target");
-  testsupport::WriteFile(target, "keep");
-  const std::string path = dir + "/x.conf";
-  ASSERT_EQ(symlink(target.c_str(), path.c_str()), 0);
-  EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kReplaced);
-  EXPECT_EQ(testsupport::ReadFile(target) + testsupport::ReadFile(path), "keep{}\n");
-  // A directory in the file's place makes the final rename fail after the data is written.
-  ASSERT_EQ(unlink(path.c_str()) | mkdir(path.c_str(), 0755), 0);
-  EXPECT_EQ(JsonToFile(Json::Value(Json::objectValue), path, 0644), JsonSaveResult::kFailed);
-  EXPECT_EQ(std::distance(std::filesystem::directory_iterator(dir), {}), 1);  // no temporary
-  EXPECT_EQ(JsonToFile(Json::Value(1), sandbox.Path("/no/dir/x.conf"), 0644),
-            JsonSaveResult::kFailed);
 }
 
 TEST_F(ConfigTest, RemovesOnlyOldTemporariesOfTheFile) {
