@@ -6,6 +6,7 @@
 #include <cstdio>
 #include <filesystem>
 #include <string>
+#include <tuple>
 
 #include "internal.h"
 #include "sandbox.h"
@@ -26,40 +27,31 @@ const char* const kConf =
     "[photo2019]\n   directory = /volume1/photo/2019\n[photos]\n   path = /volume1/photos\n"
     "[homes]\n   path = /home\n[printers]\n   path = /var/spool\n[nopath]\n   comment = x\n";
 
-TEST_F(ShareTest, ReadsSharesFromTheSambaConfiguration) {
+TEST_F(ShareTest, ReadsSharesAndFindsTheDeepestHoldingAPath) {
   Write("etc/samba/smb.conf", kConf);
-  const struct Case {
-    const char* name;
-    const char* path;  // null: no such share
-    int readOnly;
-  } kCases[] = {{"photo", "/volume1/photo", 0}, {"docs", "/volume1/docs", 1},
-                {"music", "/volume1/music", 1}, {"PHOTO", nullptr, 0},
-                {"global", nullptr, 0},         {"homes", nullptr, 0},
-                {"nopath", nullptr, 0},         {"commented", nullptr, 0}};
-  for (const Case& c : kCases) {
-    SCOPED_TRACE(c.name);
+  for (const char* absent : {"PHOTO", "global", "homes", "nopath", "commented"}) {
     PWEZOSHARE share = nullptr;
-    int readOnly = -1;
-    EXPECT_EQ(WEZOShareGet(c.name, &share) == 0, c.path != nullptr);
-    if (c.path == nullptr) {
-      EXPECT_EQ(WLIBCErrGet(), WEZO::PLATFORM::kErrNotFound);
-      continue;
-    }
-    EXPECT_STREQ(share->szPath, c.path);
+    EXPECT_LT(WEZOShareGet(absent, &share), 0) << absent;
+    EXPECT_EQ(WLIBCErrGet(), WEZO::PLATFORM::kErrNotFound) << absent;
+  }
+  for (const auto& [name, path, readOnly] : {std::tuple{"photo", "/volume1/photo", 0},
+                                             {"docs", "/volume1/docs", 1},
+                                             {"music", "/volume1/music", 1}}) {
+    PWEZOSHARE share = nullptr;
+    int flag = -1;
+    ASSERT_EQ(WEZOShareGet(name, &share), 0) << name;
+    EXPECT_STREQ(share->szPath, path);
     EXPECT_LT(WLIBShareIsReadOnlyGet(share, nullptr), 0);
-    EXPECT_EQ(WLIBShareIsReadOnlyGet(share, &readOnly), 0);
-    EXPECT_EQ(readOnly, c.readOnly);
+    EXPECT_EQ(WLIBShareIsReadOnlyGet(share, &flag), 0);
+    EXPECT_EQ(flag, readOnly) << name;
     WEZOShareFree(share);
   }
-}
-
-TEST_F(ShareTest, FindsTheDeepestShareHoldingAPathAndItsFolders) {
-  Write("etc/samba/smb.conf", kConf);
-  const struct Case {
+  // The deepest share holding a path, and its recycle bin and snapshot folders.
+  const struct Where {
     const char* full;
     const char* share;  // "": no share holds it
     int recycle, snapshot;
-  } kCases[] = {{"/volume1/photo/2019/x", "photo2019", 0, 0},
+  } kWhere[] = {{"/volume1/photo/2019/x", "photo2019", 0, 0},
                 {"/volume1/photo/20190", "photo", 0, 0},
                 {"/volume1/pho", "", 0, 0},
                 {"/volume1/photo/#recycle", "photo", 1, 0},
@@ -68,7 +60,7 @@ TEST_F(ShareTest, FindsTheDeepestShareHoldingAPathAndItsFolders) {
                 {"/volume1/photo/#recycle-x", "photo", 0, 0},
                 {"/volume1/photo/a/#recycle", "photo", 0, 0},
                 {"/elsewhere/#snapshot", "", 0, 0}};
-  for (const Case& c : kCases) {
+  for (const Where& c : kWhere) {
     SCOPED_TRACE(c.full);
     char name[WEZO_SHARE_NAME_MAX] = "";
     char path[WEZO_SHARE_PATH_MAX] = "";
