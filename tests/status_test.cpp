@@ -7,7 +7,6 @@
 #include "fake_platform.h"
 #include "fileindex/status.h"
 #include "fileindex/utils.h"
-#include "json_io.h"
 #include "paths.h"
 #include "test_support.h"
 
@@ -15,7 +14,7 @@ namespace WEZO::FILEINDEX {
 namespace {
 
 using ::testing::ElementsAre;
-using ::testing::IsEmpty;
+using Lines = std::vector<std::string>;
 
 class StatusTest : public testsupport::LibraryTest {
  protected:
@@ -26,25 +25,40 @@ class StatusTest : public testsupport::LibraryTest {
   }
 };
 
-TEST_F(StatusTest, PauseStateReadsMinusOneWhenAbsentAndRefusesWhatIsNotAnInteger) {
-  const std::pair<const char*, long long> cases[] = {
+TEST_F(StatusTest, ValuesReadWithoutThrowingAndFlagsAreKeptByPresence) {
+  const std::pair<const char*, long long> kPause[] = {
       // 42: refused
       {"{}", -1},
-      {R"({"resume_time":0})", 0},
       {R"({"resume_time":4102444800})", 4102444800LL},
+      {"[1]", 42},
       {R"({"resume_time":"abc"})", 42},
-      {R"({"resume_time":1e30})", 42},
-      {"[1]", 42}};
-  for (const auto& [file, expected] : cases) {
-    Status status;
+      {R"({"resume_time":1e30})", 42}};
+  Status status;
+  for (const auto& [file, expected] : kPause) {
     LoadText(status, file);
     log.Clear();
     long long resumeTime = 42;
     EXPECT_EQ(status.GetPauseInfo(resumeTime), expected != 42) << file;
     EXPECT_EQ(resumeTime, expected) << file;
-    const std::vector<std::string> refused = {"status:N json exception"};
-    EXPECT_EQ(log.Lines(), expected != 42 ? std::vector<std::string>{} : refused);
+    EXPECT_EQ(log.Lines(), expected != 42 ? Lines{} : Lines{"status:N json exception"}) << file;
   }
+  LoadText(status, R"({"one":1,"zero":0,"text":"yes","null":null,"need_reindex":{"video":false},
+                      "no_space":"corrupt"})");
+  for (const char* key : {"zero", "text", "null", "absent"}) EXPECT_FALSE(status.IsUpdated(key));
+  EXPECT_TRUE(status.IsUpdated("one") && status.ShareIsNeedReindex("video"));
+  EXPECT_FALSE(status.ShareIsNoSpace("corrupt"));
+  status.ShareSetNeedReindex("video", false);
+  status.ShareSetNeedReindex("photo", false);
+  status.ShareSetNoSpace("photo", true);
+  ASSERT_TRUE(status.Save());
+  EXPECT_EQ(StatusFile()["need_reindex"], Json::Value(Json::objectValue));
+  EXPECT_EQ(StatusFile()["no_space"], testsupport::ParseJson(R"({"photo":true})"));
+  // A status file that is not an object holds nothing; the first change starts a new one.
+  LoadText(status, "[true]");
+  EXPECT_FALSE(status.IsUpdated("0") || status.ShareIsNoSpace("photo"));
+  status.SetUpdated("x");
+  ASSERT_TRUE(status.Save());
+  EXPECT_EQ(StatusFile(), testsupport::ParseJson(R"({"x":true})"));
 }
 
 TEST_F(StatusTest, NoSpaceNotifiesTheAdministratorsWithTheExactCommandLine) {
@@ -60,50 +74,12 @@ TEST_F(StatusTest, NoSpaceNotifiesTheAdministratorsWithTheExactCommandLine) {
                                         "data-wezo-fn=\"WEZO.RKS.AdminCenter.MediaIndex.Main\" "
                                         "data-wezo-tab=\"fileIndex\">",
                                         "</a>", "1"));
-
   // A notice that fails does not keep the flag from being set.
   status.ShareSetNoSpace("photo", false);
   fake::Get().execResult = 1;
   EXPECT_TRUE(status.ShareSetNoSpace("photo", true));
   EXPECT_TRUE(status.ShareIsNoSpace("photo"));
-  EXPECT_THAT(log.Lines(), ElementsAre("status:N NotifyNoSpace failed"));
-  EXPECT_FALSE(NotifyNoSpace());
-}
-
-TEST_F(StatusTest, ShareFlagsAreAddedAndRemovedByPresence) {
-  Status status;
-  LoadText(status, R"({"need_reindex":{"video":false},"no_space":"corrupt","marker":true})");
-  EXPECT_TRUE(status.ShareIsNeedReindex("video"));
-  EXPECT_FALSE(status.ShareIsNoSpace("corrupt"));
-  status.ShareSetNeedReindex("video", false);
-  status.ShareSetNeedReindex("photo", false);
-  status.ShareSetNoSpace("photo", true);
-  ASSERT_TRUE(status.Save());
-  EXPECT_EQ(StatusFile(), testsupport::ParseJson(R"({"need_reindex":{},"no_space":{"photo":true},
-                                                    "marker":true})"));
-
-  status.ShareSetNeedReindex("photo", true);
-  EXPECT_TRUE(status.ShareIsNeedReindex("photo"));
-  EXPECT_FALSE(status.ShareIsNeedReindex("Photo"));
-}
-
-TEST_F(StatusTest, MarkersReadAsBooleansWithoutThrowing) {
-  Status status;
-  LoadText(status, R"({"t":true,"f":false,"one":1,"zero":0,"text":"yes","obj":{},"null":null})");
-  for (const char* key : {"t", "f", "one", "zero", "text", "obj", "null", "absent"}) {
-    EXPECT_EQ(status.IsUpdated(key), key == std::string("t") || key == std::string("one")) << key;
-  }
-  status.SetUpdated("absent");
-  EXPECT_TRUE(status.IsUpdated("absent"));
-
-  // A status file that is not an object holds nothing; the first change starts a new one.
-  Status odd;
-  LoadText(odd, "[true]");
-  EXPECT_FALSE(odd.IsUpdated("0"));
-  EXPECT_FALSE(odd.ShareIsNoSpace("photo"));
-  odd.SetUpdated("x");
-  ASSERT_TRUE(odd.Save());
-  EXPECT_EQ(StatusFile(), testsupport::ParseJson(R"({"x":true})"));
+  EXPECT_EQ(log.Lines(), Lines{"status:N NotifyNoSpace failed"});
 }
 
 }  // namespace
