@@ -1,14 +1,12 @@
 #include "utils/queue_reader.h"
 
-#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <random>
+#include <sstream>
 
 #include "fileindex/utils.h"
 #include "test_support.h"
@@ -17,7 +15,6 @@ namespace WEZO::FILEINDEX {
 namespace {
 
 using ::testing::ElementsAre;
-using ::testing::IsEmpty;
 using namespace std::string_literals;
 
 // {"event":<code>,"path":"<path>"<rest>}
@@ -86,43 +83,21 @@ TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
   }
 }
 
+// A queue that is missing or is no file is no error; a path outside every share is.
 TEST_F(QueueReaderTest, QueueThatCannotBeReadAnswersFalse) {
-  const std::string p = volume + "/photo/a";
   ASSERT_EQ(mkdir(sandbox.Path("/dir").c_str(), 0755), 0);
   for (const std::string& none : {sandbox.Path("/missing"), sandbox.Path("/dir")}) {
-    EXPECT_FALSE(IsReindexQueued(p, none));
+    EXPECT_FALSE(IsReindexQueued(volume + "/photo/a", none));
     EXPECT_FALSE(QueueHasFolderEvent("/photo/a", none));
   }
-  EXPECT_THAT(log.Lines(), IsEmpty());
-
-  Queue(Ev("65536", p) + "\n");
-  EXPECT_FALSE(QueueHasFolderEvent("/nosuch/a", queue));
-  // Every open() fails (EMFILE) while lstat() still works: the tests run as root, for whom no
-  // mode makes a file unreadable.
-  rlimit saved{};
-  getrlimit(RLIMIT_NOFILE, &saved);
-  const int lowest = open("/dev/null", O_RDONLY | O_CLOEXEC);
-  close(lowest);
-  rlimit tight = saved;
-  tight.rlim_cur = static_cast<rlim_t>(lowest);
-  setrlimit(RLIMIT_NOFILE, &tight);
-  const bool answers[2] = {IsReindexQueued(p, queue), QueueHasFolderEvent("/photo/a", queue)};
-  setrlimit(RLIMIT_NOFILE, &saved);
-  EXPECT_THAT(answers, ElementsAre(false, false));
-  const std::string reason = "Failed to open queue=" + queue + ", reason=Too many open files";
-  EXPECT_THAT(log.Lines(), ElementsAre("status_mgr:N Cannot get full path: /nosuch/a",
-                                       "utils:N " + reason, "status_mgr:N " + reason));
+  EXPECT_FALSE(QueueHasFolderEvent("/nosuch/a", Queue(Ev("65536", volume + "/nosuch/a") + "\n")));
+  EXPECT_THAT(log.Lines(), ElementsAre("status_mgr:N Cannot get full path: /nosuch/a"));
 }
 
 std::vector<std::string> Split(const std::string& text, char by) {
-  std::vector<std::string> parts(1);
-  for (const char c : text) {
-    if (c == by) {
-      parts.emplace_back();
-    } else {
-      parts.back() += c;
-    }
-  }
+  std::vector<std::string> parts;
+  std::istringstream in(text + by);
+  for (std::string part; std::getline(in, part, by);) parts.push_back(part);
   return parts;
 }
 
