@@ -4,7 +4,6 @@
 
 #include <algorithm>
 #include <filesystem>
-#include <set>
 #include <sstream>
 
 #include "fake_platform.h"
@@ -102,44 +101,19 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
     log.Clear();
     const std::string fullPath = volume + (*c.folder != '\0' ? c.folder : "/photo/2019");
     Arrange(c.setup, fake::Get().facts[fullPath]);
-    EXPECT_EQ(CanFullPathBeIndexed(fullPath), c.rule == IndexRule::kIndexable);
+    EXPECT_EQ(FullPathIndexRule(fullPath), c.rule);
     // Calls after the deciding one are bookkeeping (releasing the share record).
     std::vector<std::string> ops = fake::Get().OpNames();
     while (ops.size() > 1 && ops.back() == "WLIBCErrGet") ops.pop_back();
     EXPECT_EQ(ops.back(), c.decidingCall);
+    EXPECT_EQ(fake::Get().openShareRecords, 0);
     EXPECT_EQ(ErrorHandler::GetError(),
               c.rule == R::kNoShare ? FILEINDEX_ERR_PATH : FILEINDEX_ERR_NONE);
     std::string line = *c.logLine ? std::string("utils:N ") + c.logLine : "";
     if (line.find("%s") != std::string::npos) line.replace(line.find("%s"), 2, fullPath);
     EXPECT_EQ(log.Lines().empty() ? "" : log.Lines().back(), line);
-
-    // The rule that decides comes out of the very same questions and lines.
-    const std::vector<std::string> asked = fake::Get().OpNames();
-    const std::vector<std::string> logged = log.Lines();
-    fake::Get().calls.clear();
-    log.Clear();
-    EXPECT_EQ(FullPathIndexRule(fullPath), c.rule);
-    EXPECT_EQ(fake::Get().OpNames(), asked);
-    EXPECT_EQ(log.Lines(), logged);
-    EXPECT_EQ(fake::Get().openShareRecords, 0);
     ErrorHandler::SetError(FILEINDEX_ERR_NONE);
   }
-}
-
-// Values outside the rules share the key "unknown" and one description.
-TEST_F(EligibilityTest, EveryRuleHasItsOwnKeyAndDescription) {
-  constexpr int kRules = static_cast<int>(IndexRule::kResolvesElsewhere) + 1;
-  std::set<std::string> keys = {"unknown"};
-  std::set<std::string> descriptions = {""};
-  for (int value = 0; value < kRules; ++value) {
-    keys.insert(IndexRuleKey(static_cast<IndexRule>(value)));
-    descriptions.insert(DescribeIndexRule(static_cast<IndexRule>(value)));
-  }
-  EXPECT_EQ(keys.size(), kRules + 1U);
-  EXPECT_EQ(descriptions.size(), kRules + 1U);
-  EXPECT_EQ(IndexRuleKey(static_cast<IndexRule>(kRules)), "unknown");
-  EXPECT_EQ(DescribeIndexRule(static_cast<IndexRule>(-1)),
-            DescribeIndexRule(static_cast<IndexRule>(kRules)));
 }
 
 TEST_F(EligibilityTest, SharePathThatCannotBeResolvedSetsThePathCode) {
