@@ -93,6 +93,7 @@ TEST_F(EventQueueTest, AQueuedReindexOfExactlyThePathCoversEveryEvent) {
 TEST_F(EventQueueTest, LinesOfWritersInSeveralProcessesNeverInterleave) {
   const std::string payload(3000, 'x');  // several pages per line
   std::vector<pid_t> writers;
+  writers.reserve(4);
   for (int w = 0; w < 4; ++w) {
     writers.push_back(Spawn([&] {
       for (int i = 0; i < 150; ++i) AddCustomEvent(kEventUpdate, folder, Json::Value(payload));
