@@ -68,35 +68,35 @@ TEST_F(EventQueueTest, AppendsOneCompactLinePerEventToANewFileOfMode0644) {
   EXPECT_FALSE(std::filesystem::exists(StatusConfPath()));
 }
 
+// Only a reindex of exactly the path, in the queue itself, makes a new event redundant.
 TEST_F(EventQueueTest, AQueuedReindexOfExactlyThePathCoversEveryEvent) {
   const struct {
-    std::string inQueue;
-    std::string inTmp;
+    std::string inQueue, inTmp;
     int event;
-    bool written;
-  } cases[] = {{Line(kEventReindex, folder), "", 2, false},
-               {"", Line(kEventReindex, folder), kEventUpdate, false},  // only in the .tmp file
-               {Line(kEventReindex, folder + "/"), "", kEventUpdate, true},
-               {Line(kEventUpdate, folder), "", kEventUpdate, true},
-               {Line(kEventReindex, volume + "/photo"), "", kEventUpdate, true}};
+  } cases[] = {{Line(kEventReindex, folder), "", 2},
+               {"", Line(kEventReindex, folder), kEventUpdate},
+               {Line(kEventReindex, folder + "/"), "", kEventUpdate},
+               {Line(kEventUpdate, folder), "", kEventUpdate},
+               {Line(kEventReindex, volume + "/photo"), "", kEventUpdate}};
   for (const auto& c : cases) {
     WriteFile(queue, c.inQueue);
     WriteFile(queue + ".tmp", c.inTmp);
-    ASSERT_TRUE(AddCustomEvent(c.event, folder, Json::Value())) << c.inQueue;
-    EXPECT_EQ(ReadFile(queue), c.inQueue + (c.written ? Line(c.event, folder) : "")) << c.inTmp;
+    ASSERT_TRUE(AddCustomEvent(c.event, folder, Json::Value()));
+    const bool covered = &c - cases < 2;
+    EXPECT_EQ(ReadFile(queue), c.inQueue + (covered ? "" : Line(c.event, folder))) << c.inQueue;
     EXPECT_EQ(ReadFile(queue + ".tmp"), c.inTmp);
   }
 }
 
+// A writer that finds the queue busy three times running drops its event, so some may be
+// missing; none may be torn.
 TEST_F(EventQueueTest, LinesOfWritersInSeveralProcessesNeverInterleave) {
   const std::string payload(3000, 'x');  // several pages per line
   std::vector<pid_t> writers;
   writers.reserve(4);
   for (int w = 0; w < 4; ++w) {
     writers.push_back(Spawn([&] {
-      for (int i = 0; i < 150; ++i) {
-        AddCustomEvent(kEventUpdate, folder + "/" + std::to_string(w), Json::Value(payload));
-      }
+      for (int i = 0; i < 150; ++i) AddCustomEvent(kEventUpdate, folder, Json::Value(payload));
       return true;
     }));
   }
@@ -106,10 +106,7 @@ TEST_F(EventQueueTest, LinesOfWritersInSeveralProcessesNeverInterleave) {
   for (std::string line; std::getline(lines, line); ++count) {
     EXPECT_EQ(ParseJson(line)["data"].asString(), payload);
   }
-  // A writer that finds the queue busy three times running drops its event, so some may be
-  // missing; none may be torn.
   EXPECT_GT(count, 0);
-  EXPECT_LE(count, 600);
 }
 
 TEST_F(EventQueueTest, AQueueKeptLockedByAnotherProcessDropsTheEventAndSucceeds) {
@@ -128,6 +125,7 @@ TEST_F(EventQueueTest, AnEventThatCannotBeQueuedFlagsItsShareForAFullReindex) {
   const std::string target = volume + "/photo/victim";
   WriteFile(target, "keep");
   const std::string refused = "utils:N Failed to open queue=" + queue + ", reason=";
+  const std::string noDir = volume + "/video/@eaDir";
   const struct {
     std::string what;  // outside every share; a link or a FIFO as the queue; no metadata folder
     std::string path;
@@ -140,10 +138,9 @@ TEST_F(EventQueueTest, AnEventThatCannotBeQueuedFlagsItsShareForAFullReindex) {
       {"no metadata folder",
        volume + "/video/a",
        "video",
-       {"utils:N WEZOEAMKDir failed, path=" + volume + "/video/@eaDir, code=3585",
-        "utils:N Failed to open queue=" + volume +
-            "/video/@eaDir/WEZO@file_index_queue, reason=No such file or directory"}},
-  };
+       {"utils:N WEZOEAMKDir failed, path=" + noDir + ", code=3585",
+        "utils:N Failed to open queue=" + noDir +
+            "/WEZO@file_index_queue, reason=No such file or directory"}}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.what);
     std::filesystem::remove(StatusConfPath());
@@ -171,12 +168,9 @@ TEST_F(EventQueueTest, AnEventThatCannotBeQueuedFlagsItsShareForAFullReindex) {
 TEST_F(EventQueueTest, TheQueueStaysLineAlignedWhenAWriteFallsShort) {
   const std::string line = Line(kEventUpdate, folder);
   const auto add = [&] { return AddCustomEvent(kEventUpdate, folder, Json::Value()); };
-  // Another writer's partial line is ended first.
-  WriteFile(queue, R"({"event":655)");
+  WriteFile(queue, "{\"event\":655");  // another writer's partial line is ended first
   EXPECT_EQ(Exit(Spawn(add)), 0);
-  EXPECT_EQ(ReadFile(queue), R"({"event":655)"
-                             "\n" +
-                                 line);
+  EXPECT_EQ(ReadFile(queue), "{\"event\":655\n" + line);
   EXPECT_FALSE(std::filesystem::exists(StatusConfPath()));
 
   // A short write is cut off again and flags the share. The queue is long enough that the

@@ -46,32 +46,30 @@ class FoldersTest : public testsupport::LibraryTest {
   }
 };
 
+// An unknown name is passed over; a name that is not a string ends the list.
 TEST_F(FoldersTest, AdditionalValuesKeepGoingPastAnUnknownNameButNotPastANonString) {
   std::filesystem::create_directories(volume + "/photo/2019");
   Folder folder;
   ASSERT_TRUE(folder.SetPath("/photo/2019"));
-  Json::Value obj = folder.asJson(ParseJson(R"(["bogus","is_valid"])"));
-  EXPECT_EQ(obj["additional"], ParseJson(R"({"bogus":null,"is_valid":true})"));
-  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_BAD_PARAM);
-  EXPECT_THAT(log.Lines(), ElementsAre("folder:N Unknown additional: bogus",
-                                       "folder:N Failed to get additional: bogus"));
   const struct {
     const char* names;
     const char* additional;
-    const char* badParam;
-  } cases[] = {{R"("is_valid")", "{}", R"("is_valid")"},
-               {R"(["is_valid",1,"bogus"])", R"({"is_valid":true})", "1"}};
+    std::vector<std::string> lines;
+  } cases[] = {{R"(["bogus","is_valid"])",
+                R"({"bogus":null,"is_valid":true})",
+                {"folder:N Unknown additional: bogus", "folder:N Failed to get additional: bogus"}},
+               {R"(["is_valid",1,"bogus"])",
+                R"({"is_valid":true})",
+                {"folder:N Bad param: 1", "folder:N GetAdditional failed"}}};
   for (const auto& c : cases) {
     log.Clear();
-    obj = folder.asJson(ParseJson(c.names));
-    EXPECT_EQ(obj["additional"], ParseJson(c.additional)) << c.names;
-    EXPECT_EQ(obj["path"], "/photo/2019");
-    EXPECT_THAT(log.Lines(), ElementsAre(std::string("folder:N Bad param: ") + c.badParam,
-                                         "folder:N GetAdditional failed"));
+    EXPECT_EQ(folder.asJson(ParseJson(c.names))["additional"], ParseJson(c.additional));
+    EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_BAD_PARAM);
+    EXPECT_EQ(log.Lines(), c.lines) << c.names;
   }
 }
 
-// A folder takes the members of the right type; one whose share is gone is kept as it is.
+// Members of the wrong type are dropped; a folder whose share is gone is kept as it is.
 TEST_F(FoldersTest, FileRoundTripWritesKeyOrderAndIgnoresTheStoredPath) {
   Folders folders;
   LoadText(folders, R"({"/video/b":{"path":"/elsewhere","name":"B","video":true},
@@ -82,66 +80,36 @@ TEST_F(FoldersTest, FileRoundTripWritesKeyOrderAndIgnoresTheStoredPath) {
   EXPECT_THAT(PathsOf(all), ElementsAre("/gone/a", "/photo", "/photo/2019", "/video/b"));
   EXPECT_EQ(all[0].GetFullPath(), "");
   EXPECT_THAT(log.Lines(), ElementsAre("folder:N Failed to get full path from /gone/a"));
-  EXPECT_EQ(all[2].GetFullPath(), volume + "/photo/2019");
   Json::Value get;
   ASSERT_TRUE(folders.Get(get, "/photo/2019"));
   EXPECT_EQ(get, ParseJson(R"({"path":"/photo/2019","name":"2019","document":false,
                            "audio":false,"video":false,"photo":true})"));
   log.Clear();
-  Json::Value out = "untouched";
-  EXPECT_FALSE(folders.Get(out, "/photo/"));
-  EXPECT_EQ(out, "untouched");
-  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_NO_SUCH_FOLDER);
+  EXPECT_FALSE(folders.Get(get, "/photo/"));
   EXPECT_THAT(log.Lines(), ElementsAre("folders:N No such folder: /photo/"));
-
   ASSERT_TRUE(folders.Save());
   const std::string text = testsupport::ReadFile(FolderConfPath());
-  EXPECT_LT(text.find("\"/gone/a\""), text.find("\"/photo\""));
-  EXPECT_LT(text.find("\"/photo\""), text.find("\"/photo/2019\""));
-  EXPECT_LT(text.find("\"/photo/2019\""), text.find("\"/video/b\""));
+  size_t at = 0;
+  for (const char* key : {"\"/gone/a\"", "\"/photo\"", "\"/photo/2019\"", "\"/video/b\""}) {
+    EXPECT_LT(at, text.find(key)) << key;
+    at = text.find(key);
+  }
   const Json::Value saved = ParseJson(text);
   EXPECT_EQ(saved["/video/b"]["path"], "/video/b");
   EXPECT_EQ(saved["/gone/a"], ParseJson(R"({"path":"/gone/a","name":"A","document":false,
                                         "audio":false,"video":false,"photo":false})"));
-  EXPECT_EQ(saved["/photo"]["name"], "");
   EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);
 }
 
 TEST_F(FoldersTest, OnlyAnObjectIsAFolderList) {
-  const struct {
-    const char* text;  // nullptr: no file
-    _tag_fileindex_err_ code;
-    std::string line;
-  } cases[] = {
-      {nullptr, FILEINDEX_ERR_NONE, ""},
-      {"{}", FILEINDEX_ERR_NONE, ""},
-      {"[1, 2]", FILEINDEX_ERR_MALFORMED_FOLDERS, "folders:N Malformed folders: [1,2]"},
-      {"{", FILEINDEX_ERR_LOAD_JSON, "config:N Failed to load json from " + FolderConfPath()}};
-  for (const auto& c : cases) {
-    std::filesystem::remove(FolderConfPath());
-    if (c.text != nullptr) testsupport::WriteFile(FolderConfPath(), c.text);
-    ErrorHandler::SetError(FILEINDEX_ERR_NONE);
-    log.Clear();
-    Folders folders;
-    EXPECT_EQ(folders.Load(), c.code == FILEINDEX_ERR_NONE) << c.line;
-    EXPECT_EQ(ErrorHandler::GetError(), c.code);
-    EXPECT_EQ(log.Lines(), c.line.empty() ? std::vector<std::string>{} : std::vector{c.line});
-    std::vector<Folder> all;
-    folders.List(all);
-    EXPECT_THAT(all, IsEmpty());
-  }
-}
-
-TEST_F(FoldersTest, ListingByShareMatchesTheWholeShareName) {
+  testsupport::WriteFile(FolderConfPath(), "[1, 2]");
   Folders folders;
-  LoadText(folders, R"({"":{},"/photo":{},"/photo/2019":{},"/photos":{},"/video":{}})");
-  std::vector<Folder> photo;
-  folders.List(photo, "photo");
-  EXPECT_THAT(PathsOf(photo), ElementsAre("/photo", "/photo/2019"));
-  folders.List(photo, "Photo");
-  EXPECT_THAT(photo, IsEmpty());
-  folders.List(photo, "");
-  EXPECT_EQ(photo.size(), 5U);
+  EXPECT_FALSE(folders.Load());
+  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_MALFORMED_FOLDERS);
+  EXPECT_THAT(log.Lines(), ElementsAre("folders:N Malformed folders: [1,2]"));
+  std::vector<Folder> all;
+  folders.List(all);
+  EXPECT_THAT(all, IsEmpty());
 }
 
 TEST_F(FoldersTest, PagedListingSortsAndPages) {
@@ -153,32 +121,35 @@ TEST_F(FoldersTest, PagedListingSortsAndPages) {
     const char* sortBy;
     const char* direction;
     std::vector<std::string> paths;
-  } cases[] = {{0, 10, "", "ASC", {"/photo/a", "/photo/B", "/photo/c", "/video/d"}},
-               {1, 2, "path", "", {"/photo/B", "/photo/c"}},
+  } cases[] = {{1, 2, "path", "", {"/photo/B", "/photo/c"}},
                {0, 10, "name", "ASC", {"/video/d", "/photo/c", "/photo/B", "/photo/a"}},
                {0, 10, "Name", "ASC", {"/photo/a", "/photo/B", "/photo/c", "/video/d"}},
                {3, 10, "name", "asc", {"/photo/a"}},
                {0, 0, "name", "ASC", {}},
                {4, 10, "name", "ASC", {}},
                // Descending pages come from the start of the ascending order, whatever the offset.
-               {0, 2, "name", "DESC", {"/photo/c", "/video/d"}},
                {2, 10, "name", "DESC", {"/photo/c", "/video/d"}},
                {9, 10, "name", "DESC", {}},
                {0, 10, "name", "desc", {"/video/d", "/photo/c", "/photo/B", "/photo/a"}},
                // Sorting by a kind puts the folders without it first.
                {0, 10, "photo", "ASC", {"/photo/B", "/video/d", "/photo/a", "/photo/c"}}};
   for (const auto& c : cases) {
+    SCOPED_TRACE(std::to_string(c.offset) + " " + std::to_string(c.limit) + " " + c.sortBy + " " +
+                 c.direction);
     Json::Value page;
     ASSERT_TRUE(folders.List(page, c.offset, c.limit, c.sortBy, c.direction,
                              Json::Value(Json::arrayValue)));
     EXPECT_EQ(page["total"], 4U);
     EXPECT_EQ(page["offset"].asUInt64(), c.offset);
-    EXPECT_EQ(PathsOf(page), c.paths)
-        << c.offset << " " << c.limit << " " << c.sortBy << " " << c.direction;
-    if (!c.paths.empty()) {
-      EXPECT_EQ(page["folder"][0]["additional"], Json::Value(Json::objectValue));
-    }
+    EXPECT_EQ(PathsOf(page), c.paths);
   }
+  Folders shares;
+  LoadText(shares, R"({"/photo":{},"/photo/2019":{},"/photos":{}})");
+  std::vector<Folder> byShare;
+  shares.List(byShare, "photo");  // the whole share name, case and all
+  EXPECT_THAT(PathsOf(byShare), ElementsAre("/photo", "/photo/2019"));
+  shares.List(byShare, "Photo");
+  EXPECT_THAT(byShare, IsEmpty());
 }
 
 TEST_F(FoldersTest, PagedListingNeedsNoConsistentOrderFromThePlatform) {
@@ -205,6 +176,7 @@ TEST_F(FoldersTest, PagedListingNeedsNoConsistentOrderFromThePlatform) {
   }
 }
 
+// A changed folder takes only what the request carries; the rest goes back to empty.
 TEST_F(FoldersTest, ChangeReportsCompareWithTheSettingThatApplied) {
   const char* photo = R"({"/photo":{"photo":true,"name":"P"}})";
   const char* nested = R"({"/photo":{"photo":true},"/photo/2019":{"photo":true}})";
@@ -212,103 +184,84 @@ TEST_F(FoldersTest, ChangeReportsCompareWithTheSettingThatApplied) {
     const char* list;
     const char* request;  // upsert; nullptr: delete `deleted`
     const char* deleted;
-    const char* report;
+    const char* report;  // nullptr: none, the share being unknown
   } cases[] = {{"{}", R"({"path":"/photo","photo":true})", nullptr, "1111"},
-               {photo, R"({"path":"/photo/2019","photo":true})", nullptr, "0000"},
                {photo, R"({"path":"/photo/2019","photo":true,"audio":true})", nullptr, "0100"},
                {photo, R"({"path":"/video/x","photo":true})", nullptr, "1111"},
-               {photo, R"({"path":"/photo","photo":false})", nullptr, "0001"},
+               {photo, R"({"path":"/photo","audio":true})", nullptr, "0101"},
                {nested, nullptr, "/photo/2019", "0000"},
                {nested, nullptr, "/photo", "1111"},
-               {photo, nullptr, "/photo", "1111"}};
+               {photo, nullptr, "/photo", "1111"},
+               {R"({"/gone/a":{}})", nullptr, "/gone/a", nullptr}};
   for (const auto& c : cases) {
+    SCOPED_TRACE(std::string(c.list) + " " + (c.request ? c.request : c.deleted));
     Folders folders;
     LoadText(folders, c.list);
     Json::Value result = "untouched";
-    Json::Value expected = Report(c.report);
+    Json::Value expected = c.report ? Report(c.report) : Json::Value("untouched");
     if (c.request != nullptr) {
       ASSERT_TRUE(folders.Upsert(result, ParseJson(c.request)));
     } else {
       ASSERT_TRUE(folders.Delete(result, c.deleted));
-      expected = Json::Value();
-      expected[c.deleted] = Report(c.report);
+      EXPECT_FALSE(folders.Get(result, c.deleted));
+      if (c.report) expected = Json::Value(), expected[c.deleted] = Report(c.report);
     }
-    EXPECT_EQ(result, expected) << c.list << " " << (c.request ? c.request : c.deleted);
+    EXPECT_EQ(result, expected);
   }
-
-  // A changed folder takes only what the request carries; the rest goes back to empty.
   Folders folders;
   LoadText(folders, photo);
   Json::Value result;
   ASSERT_TRUE(folders.Upsert(result, ParseJson(R"({"path":"/photo","audio":true})")));
-  Json::Value changed;
-  folders.Get(changed, "/photo");
-  EXPECT_EQ(changed, ParseJson(R"({"path":"/photo","name":"","document":false,"audio":true,
-                               "video":false,"photo":false})"));
-
-  // Deleting where the share is unknown still removes the folder.
-  Folders gone;
-  LoadText(gone, R"({"/gone/a":{}})");
-  result = "untouched";
-  EXPECT_TRUE(gone.Delete(result, "/gone/a"));
-  EXPECT_EQ(result, "untouched");
-  std::vector<Folder> all;
-  gone.List(all);
-  EXPECT_THAT(all, IsEmpty());
+  folders.Get(result, "/photo");
+  EXPECT_EQ(result, ParseJson(R"({"path":"/photo","name":"","document":false,"audio":true,
+                              "video":false,"photo":false})"));
 }
 
-TEST_F(FoldersTest, UpsertRefusesARequestWithoutAPathInAKnownShare) {
-  for (const char* request :
-       {R"({})", R"({"path":5})", R"({"path":"/nosuch/a"})", R"({"path":""})", R"({"path":"/"})"}) {
+TEST_F(FoldersTest, UpsertRefusesARequestWithoutAPathInAKnownShareOrPastAThousandFolders) {
+  for (const char* request : {R"({"path":5})", R"({"path":"/nosuch/a"})", R"({"path":"/"})"}) {
+    SCOPED_TRACE(request);
     Folders folders;
     LoadText(folders, R"({"/photo":{"photo":true}})");
-    ErrorHandler::SetError(FILEINDEX_ERR_NONE);
     Json::Value result = "untouched";
-    EXPECT_FALSE(folders.Upsert(result, ParseJson(request))) << request;
-    EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_BAD_PARAM) << request;
+    EXPECT_FALSE(folders.Upsert(result, ParseJson(request)));
+    EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_BAD_PARAM);
     EXPECT_EQ(log.Lines().back(), "folders:N Bad param: " + JsonToString(ParseJson(request)));
     EXPECT_EQ(result, "untouched");
     std::vector<Folder> all;
     folders.List(all);
-    EXPECT_THAT(PathsOf(all), ElementsAre("/photo")) << request;
+    EXPECT_THAT(PathsOf(all), ElementsAre("/photo"));
   }
-}
-
-TEST_F(FoldersTest, ListHoldsAtMostAThousandFoldersButAFullListCanStillChange) {
   Json::Value list(Json::objectValue);
   for (int i = 0; i < 999; ++i) list["/photo/" + std::to_string(i)]["photo"] = true;
   Folders folders;
   LoadText(folders, JsonToString(list));
+  log.Clear();
   Json::Value result;
   ASSERT_TRUE(folders.Upsert(result, ParseJson(R"({"path":"/video/1000"})")));
-  ASSERT_TRUE(folders.Save());
   EXPECT_FALSE(folders.Upsert(result, ParseJson(R"({"path":"/video/1001"})")));
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_EXCEED_MAX_FOLDER);
   EXPECT_THAT(log.Lines(), ElementsAre("folders:N Exceed max folder size"));
-
-  Folders full;
-  ASSERT_TRUE(full.Load());
-  EXPECT_TRUE(full.Upsert(result, ParseJson(R"({"path":"/photo/5","audio":true})")));
+  // A full list can still change.
+  EXPECT_TRUE(folders.Upsert(result, ParseJson(R"({"path":"/photo/5","audio":true})")));
   EXPECT_EQ(result, Report("0101"));
 }
 
+// The folder whose share is gone is passed over without a word.
 TEST_F(FoldersTest, MostSuitableSettingIsTheLastEnclosingFolder) {
-  EXPECT_EQ(GetMostSuitableCfg({}, volume + "/photo"), Json::Value(Json::objectValue));
   std::vector<Folder> folders(3);
   folders[0].Load("/gone", ParseJson(R"({"name":"gone"})"));
   folders[1].Load("/photo", ParseJson(R"({"name":"outer"})"));
   folders[2].Load("/photo/2019", ParseJson(R"({"name":"inner"})"));
   log.Clear();
-  ErrorHandler::SetError(FILEINDEX_ERR_NONE);
-  EXPECT_EQ(GetMostSuitableCfg(folders, volume + "/photo/2019/x")["name"], "inner");
-  EXPECT_EQ(GetMostSuitableCfg(folders, volume + "/photo/2019")["name"], "inner");
-  EXPECT_EQ(GetMostSuitableCfg(folders, volume + "/photo/20")["name"], "outer");
-  EXPECT_EQ(GetMostSuitableCfg(folders, volume + "/photos"), Json::Value(Json::objectValue));
+  for (const std::string row : {"/photo/2019/x inner", "/photo/2019 inner", "/photo/20 outer",
+                                "/photos none", "/gone none"}) {
+    const std::string path = row.substr(0, row.find(' '));
+    EXPECT_EQ(GetMostSuitableCfg(folders, volume + path).get("name", "none"),
+              row.substr(path.size() + 1));
+  }
   std::swap(folders[1], folders[2]);
   EXPECT_EQ(GetMostSuitableCfg(folders, volume + "/photo/2019/x")["name"], "outer");
-  // The folder whose share is gone is passed over without a word.
   EXPECT_THAT(log.Lines(), IsEmpty());
-  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_NONE);
 }
 
 }  // namespace

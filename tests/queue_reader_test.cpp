@@ -1,14 +1,12 @@
 #include "utils/queue_reader.h"
 
-#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <sys/resource.h>
 #include <sys/stat.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <random>
+#include <sstream>
 
 #include "fileindex/utils.h"
 #include "test_support.h"
@@ -17,7 +15,6 @@ namespace WEZO::FILEINDEX {
 namespace {
 
 using ::testing::ElementsAre;
-using ::testing::IsEmpty;
 using namespace std::string_literals;
 
 // {"event":<code>,"path":"<path>"<rest>}
@@ -86,43 +83,21 @@ TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
   }
 }
 
+// A queue that is missing or is no file is no error; a path outside every share is.
 TEST_F(QueueReaderTest, QueueThatCannotBeReadAnswersFalse) {
-  const std::string p = volume + "/photo/a";
   ASSERT_EQ(mkdir(sandbox.Path("/dir").c_str(), 0755), 0);
   for (const std::string& none : {sandbox.Path("/missing"), sandbox.Path("/dir")}) {
-    EXPECT_FALSE(IsReindexQueued(p, none));
+    EXPECT_FALSE(IsReindexQueued(volume + "/photo/a", none));
     EXPECT_FALSE(QueueHasFolderEvent("/photo/a", none));
   }
-  EXPECT_THAT(log.Lines(), IsEmpty());
-
-  Queue(Ev("65536", p) + "\n");
-  EXPECT_FALSE(QueueHasFolderEvent("/nosuch/a", queue));
-  // Every open() fails (EMFILE) while lstat() still works: the tests run as root, for whom no
-  // mode makes a file unreadable.
-  rlimit saved{};
-  getrlimit(RLIMIT_NOFILE, &saved);
-  const int lowest = open("/dev/null", O_RDONLY | O_CLOEXEC);
-  close(lowest);
-  rlimit tight = saved;
-  tight.rlim_cur = static_cast<rlim_t>(lowest);
-  setrlimit(RLIMIT_NOFILE, &tight);
-  const bool answers[2] = {IsReindexQueued(p, queue), QueueHasFolderEvent("/photo/a", queue)};
-  setrlimit(RLIMIT_NOFILE, &saved);
-  EXPECT_THAT(answers, ElementsAre(false, false));
-  const std::string reason = "Failed to open queue=" + queue + ", reason=Too many open files";
-  EXPECT_THAT(log.Lines(), ElementsAre("status_mgr:N Cannot get full path: /nosuch/a",
-                                       "utils:N " + reason, "status_mgr:N " + reason));
+  EXPECT_FALSE(QueueHasFolderEvent("/nosuch/a", Queue(Ev("65536", volume + "/nosuch/a") + "\n")));
+  EXPECT_THAT(log.Lines(), ElementsAre("status_mgr:N Cannot get full path: /nosuch/a"));
 }
 
 std::vector<std::string> Split(const std::string& text, char by) {
-  std::vector<std::string> parts(1);
-  for (const char c : text) {
-    if (c == by) {
-      parts.emplace_back();
-    } else {
-      parts.back() += c;
-    }
-  }
+  std::vector<std::string> parts;
+  std::istringstream in(text + by);
+  for (std::string part; std::getline(in, part, by);) parts.push_back(part);
   return parts;
 }
 
@@ -159,6 +134,14 @@ std::string MixedQueue(const std::string& volume, std::mt19937& rng, int count) 
                  R"({"a":{"b":{"c":[[["deep"]]]}},"x":12345678901234567890})",
                  R"({"k":"\")" + p + R"(\""})"});
   };
+  // Damage at the end, after "{", before "}", at the start or in the middle of a line.
+  const std::vector<std::string> damage[] = {
+      {" ", " x", ",", "}", "\0tail"s, "/*c*/", "\r"},
+      {"/*c*/", " ", "\t", R"("event":3,)", R"("path":"/d",)", ","},
+      {",", R"(,"data":1,"data":2)", R"(,"":1,)", " ", "\f", R"(,"data":tru)", R"(,"data":[1,])",
+       R"(,"data":1.)", R"(,"data":-)", R"(,"data":{"a":1,"a":2})"},
+      {"\xEF\xBB\xBF"},
+      {"\xFF", "\x01", "\0"s, "\\", "\"", "}"}};
   std::string text;
   for (int i = 0; i < count; ++i) {
     std::string line = "{";
@@ -178,18 +161,10 @@ std::string MixedQueue(const std::string& volume, std::mt19937& rng, int count) 
         line += (m == 0 ? "" : rng() % 4 == 0 ? " , " : ",") + members[m];
       }
       line += "}";
-      const unsigned damage = rng() % 30;
-      if (damage == 0) line.resize(rng() % line.size());
-      if (damage == 1) line += pick({" ", " x", ",", "}", "\0tail"s, "/*c*/", "\r"});
-      if (damage == 2)
-        line.insert(1, pick({"/*c*/", " ", "\t", R"("event":3,)", R"("path":"/d",)", ","}));
-      if (damage == 3) {
-        line.insert(line.size() - 1, pick({",", R"(,"data":1,"data":2)", R"(,"":1,)", " ", "\f",
-                                           R"(,"data":tru)", R"(,"data":[1,])", R"(,"data":1.)",
-                                           R"(,"data":-)", R"(,"data":{"a":1,"a":2})"}));
-      }
-      if (damage == 4) line.insert(0, "\xEF\xBB\xBF");
-      if (damage == 5) line.insert(line.size() / 2, pick({"\xFF", "\x01", "\0"s, "\\", "\"", "}"}));
+      const unsigned kind = rng() % 30;
+      if (kind == 0) line.resize(rng() % line.size());
+      const size_t at[] = {line.size(), 1, line.size() - 1, 0, line.size() / 2};
+      if (kind >= 1 && kind <= 5) line.insert(at[kind - 1], pick(damage[kind - 1]));
     }
     text += line + (i + 1 < count ? "\n" : "");
   }
@@ -206,10 +181,9 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
     Queue(text);
     std::vector<QueueEvent> events;
     std::vector<std::string> malformed;
-    for (size_t start = 0; start < text.size();) {
-      const size_t end = std::min(text.find('\n', start), text.size());
-      const std::string line = text.substr(start, end - start);
-      start = end + 1;
+    std::vector<std::string> lines = Split(text, '\n');
+    if (lines.back().empty()) lines.pop_back();  // no line after the last "\n"
+    for (const std::string& line : lines) {
       // The quick scan may give up on any line, but never answers otherwise than the parser.
       const std::string scanned = Scanned(line);
       EXPECT_TRUE(scanned == "unsure" || scanned == Parsed(line)) << line;
