@@ -93,9 +93,6 @@ TEST_F(WezotifydTest, WritesOneLinePerChangeAndNoneForARemovedRegistration) {
     const std::string head = R"({"event":)" + std::to_string(event) + R"(,"path":")" + f + path;
     return head + (old.empty() ? "\"}\n" : R"(","path_old":")" + f + old + "\"}\n");
   };
-  const auto move = [](const std::string& from, const std::string& to) {
-    ASSERT_EQ(rename(from.c_str(), to.c_str()), 0) << from;
-  };
   const struct {
     const char* what;
     std::function<void()> change;
@@ -103,11 +100,11 @@ TEST_F(WezotifydTest, WritesOneLinePerChangeAndNoneForARemovedRegistration) {
   } cases[] = {
       {"create and write", [&] { Create(f + "/a"); },
        line(256, "/a") + line(2, "/a") + line(8, "/a")},
-      {"rename within", [&] { move(f + "/a", f + "/b"); }, line(256, "/b", "/a")},
-      {"rename out", [&] { move(f + "/b", At("outside/b")); }, line(64, "/b")},
-      {"rename in", [&] { move(At("outside/b"), f + "/c"); }, line(256, "/c")},
-      {"remove", [&] { unlink((f + "/c").c_str()); }, line(512, "/c")},
-      {"ignored name", [&] { mkdir((f + "/@eaDir").c_str(), 0755), Create(f + "/@eaDir/z"); }, ""},
+      {"rename within", [&] { fs::rename(f + "/a", f + "/b"); }, line(256, "/b", "/a")},
+      {"rename out", [&] { fs::rename(f + "/b", At("outside/b")); }, line(64, "/b")},
+      {"rename in", [&] { fs::rename(At("outside/b"), f + "/c"); }, line(256, "/c")},
+      {"remove", [&] { fs::remove(f + "/c"); }, line(512, "/c")},
+      {"ignored name", [&] { fs::create_directory(f + "/@eaDir"), Create(f + "/@eaDir/z"); }, ""},
       {"new folder filled before its watch",
        [&] {
          kill(pid_, SIGSTOP);  // only a scan of the new folder can find what is made in it now
@@ -117,7 +114,7 @@ TEST_F(WezotifydTest, WritesOneLinePerChangeAndNoneForARemovedRegistration) {
        },
        line(256, "/n") + line(256, "/n/d") + line(256, "/n/d/x")},
       {"renamed folder keeps its watch",
-       [&] { move(f + "/n", f + "/m"), unlink((f + "/m/d/x").c_str()); },
+       [&] { fs::rename(f + "/n", f + "/m"), fs::remove(f + "/m/d/x"); },
        line(256, "/m", "/n") + line(512, "/m/d/x")},
   };
   size_t seen = 0;
@@ -141,20 +138,16 @@ TEST_F(WezotifydTest, FlagsTheShareForAReindexWhenTheKernelDropsEvents) {
     Write("etc/samba/smb.conf", "[s1]\n\tpath = " + At("volume1/s1") + "\n");
     const timespec old[2] = {{time(nullptr) - 10, 0}, {time(nullptr) - 10, 0}};
     ASSERT_EQ(utimensat(AT_FDCWD, At("etc/samba/smb.conf").c_str(), old, 0), 0);
-    fs::create_directories(At("tmp"));
-    fs::create_directories(At("usr/wezo/etc/fileindex"));
+    fs::create_directories(At("tmp")), fs::create_directories(At("usr/wezo/etc/fileindex"));
   });
   // Writes to two files in turn: the kernel merges only an event equal to the one before it.
   int queued = 0;
   std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> queued;
-  const int fds[] = {open((Folder(1) + "/a").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644),
-                     open((Folder(1) + "/b").c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0644)};
+  std::ofstream files[] = {std::ofstream(Folder(1) + "/a"), std::ofstream(Folder(1) + "/b")};
   kill(pid_, SIGSTOP);
   for (int i = 0; i <= queued; ++i) {
-    ASSERT_EQ(pwrite(fds[i % 2], "x", 1, 0), 1);
+    files[i % 2] << 'x' << std::flush;
   }
-  close(fds[0]);
-  close(fds[1]);
   kill(pid_, SIGCONT);
   Json::Value status;
   EXPECT_TRUE(WaitFor([&] {
