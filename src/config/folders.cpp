@@ -182,7 +182,7 @@ bool Folders::Get(Json::Value& out, const std::string& path) const {
   const auto it = m_folders.find(path);
   if (it == m_folders.end()) {
     FILEINDEX_LOG("No such folder: %s", path.c_str());
-    (void)0;
+    ErrorHandler::SetError(FILEINDEX_ERR_NO_SUCH_FOLDER);
     return false;
   }
   out = it->second.asJson();
