@@ -148,6 +148,7 @@ TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
       // The library refuses: its code and the code's meaning.
       {{"get", "/photo/none"}, 1, "get /photo/none failed: error 4 (no such indexed folder)", ""},
       {{"pause", "99999999"}, 1, "pause failed: error 1 (bad parameter)", ""},
+      {{"add", "--request", "{}"}, 1, "add failed: error 1 (bad parameter)", ""},
       {{"reindex", "/music"}, 1, "error 0 (a path lies in a share without indexed folders)", ""},
       {{"storage", "nosuch"}, 1, "storage nosuch failed: error 0 (no share named nosuch)", ""},
       // Accepted by the library, but not what the user expects: a warning, or a refusal under
