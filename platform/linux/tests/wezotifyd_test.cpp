@@ -2,6 +2,7 @@
 // own sandbox root; registrations are written through the platform's client API.
 #include <fcntl.h>
 #include <spawn.h>
+#include <sys/file.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -154,6 +155,19 @@ TEST_F(WezotifydTest, FlagsTheShareForAReindexWhenTheKernelDropsEvents) {
     return WEZO::FILEINDEX::JsonFromFile(status, At("usr/wezo/etc/fileindex/status.conf")) &&
            status["need_reindex"]["s1"] == true;
   })) << Read("log");
+}
+
+// The consumer takes a queue by removing it under its lock: a change that came meanwhile goes to
+// a new queue, not to the file nobody reads any more.
+TEST_F(WezotifydTest, WritesToANewQueueWhenTheOneItWaitedForIsTaken) {
+  Start(1);
+  const int taken = open(Queue(1).c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644);
+  ASSERT_EQ(flock(taken, LOCK_EX), 0);
+  Create(Folder(1) + "/x");
+  std::this_thread::sleep_for(std::chrono::milliseconds(100));  // lets the daemon reach the lock
+  ASSERT_EQ(unlink(Queue(1).c_str()), 0);
+  close(taken);
+  EXPECT_TRUE(WaitFor([&] { return QueueText(1).find(Folder(1) + "/x") != std::string::npos; }));
 }
 
 TEST_F(WezotifydTest, RefusesAQueueThatIsNotARegularFileOfItsOwnFolder) {
