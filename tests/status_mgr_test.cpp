@@ -5,16 +5,13 @@
 #include <sys/file.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <climits>
 #include <ctime>
 #include <filesystem>
 #include <string>
-#include <thread>
 
 #include "fake_platform.h"
 #include "fileindex/error.h"
-#include "fileindex/folder.h"
 #include "fileindex/status_mgr.h"
 #include "paths.h"
 #include "test_support.h"
@@ -67,27 +64,6 @@ TEST_F(StatusMgrTest, PauseAndResumeStoreTheStateThenTellTheDaemon) {
                                     std::to_string(end) + "}}"),
                           ::testing::_));
   EXPECT_THAT(log.Lines(), ::testing::IsEmpty());
-}
-
-TEST_F(StatusMgrTest, TheDaemonIsToldAfterTheSaveWhileTheLockIsStillHeld) {
-  FakeDaemon daemon(FakeDaemon::Behaviour::kHoldConnect);
-  bool paused = false;
-  std::thread caller([&] { paused = StatusMgr::Pause(0); });
-  // The caller blocks in connect until the daemon accepts; by then the file must say paused and
-  // the lock must still be held.
-  for (int i = 0; i < 5000 && !std::filesystem::exists(StatusConfPath()); ++i) {
-    std::this_thread::sleep_for(std::chrono::milliseconds(1));
-  }
-  EXPECT_EQ(StatusFile(), ParseJson(R"({"resume_time":0})"));
-  for (int i = 0; i < 20; ++i) {
-    EXPECT_TRUE(StatusLockHeld());
-    std::this_thread::sleep_for(std::chrono::milliseconds(5));
-  }
-  daemon.Release();
-  caller.join();
-  EXPECT_TRUE(paused);
-  EXPECT_EQ(daemon.Commands(1).size(), 1U);
-  EXPECT_FALSE(StatusLockHeld());
 }
 
 TEST_F(StatusMgrTest, AnUnreachableDaemonFailsTheCallButTheChangeStays) {
@@ -214,11 +190,6 @@ TEST_F(ProgressTest, AFolderReportsOnlyTheEventsAtOrBelowIt) {
     Arrange(c.queue, c.tmp, "{}");
     EXPECT_EQ(StatusMgr::GetFolderStatus("/photo/a"), c.word) << c.queue << c.tmp;
   }
-  Folder folder;
-  ASSERT_TRUE(folder.Load("/photo/a", ParseJson("{}")));
-  Json::Value additional;
-  ASSERT_TRUE(folder.GetAdditional(additional, ParseJson(R"(["status","is_valid"])")));
-  EXPECT_EQ(additional, ParseJson(R"({"status":"processing","is_valid":true})"));
 }
 
 }  // namespace
