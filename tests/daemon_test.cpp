@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 #include <json/value.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 

@@ -135,6 +135,8 @@ TEST_F(ProgressTest, TheServiceIsFinishedWhenNoIndexableShareHasAQueueFile) {
     const char* folder;
   } cases[] = {
       {event, "-", "{}", "processing", "processing"},
+      {Event("/photo/ab/x"), "-", "{}", "processing", "finished"},  // a sibling's events
+      {Event("/photo/ab"), Event("/photo/a/y"), "{}", "processing", "processing"},
       {event, "-", R"({"resume_time":-1})", "processing", "processing"},
       {event, "-", R"({"resume_time":0})", "paused", "paused"},
       {event, "-", R"({"resume_time":)" + std::to_string(now - 60) + "}", "processing",
@@ -171,25 +173,6 @@ TEST_F(ProgressTest, TheServiceIsFinishedWhenNoIndexableShareHasAQueueFile) {
   std::filesystem::remove(FolderConfPath());
   ASSERT_TRUE(StatusMgr::GetStatus(word));
   EXPECT_EQ(word, "finished");
-}
-
-TEST_F(ProgressTest, AFolderReportsOnlyTheEventsAtOrBelowIt) {
-  const struct {
-    std::string queue, tmp;
-    const char* word;
-  } cases[] = {
-      {"-", "-", "finished"},
-      {Event("/photo/ab/x"), "-", "finished"},  // a sibling's events
-      {Event("/photo/a"), "-", "processing"},   // the folder itself
-      {Event("/photo/ab"), Event("/photo/a/y"), "processing"},
-      {R"({"event":256,"path":")" + volume + R"(/video/z","path_old":")" + volume +
-           "/photo/a/y\"}\n",
-       "-", "processing"},  // moved away from it
-  };
-  for (const auto& c : cases) {
-    Arrange(c.queue, c.tmp, "{}");
-    EXPECT_EQ(StatusMgr::GetFolderStatus("/photo/a"), c.word) << c.queue << c.tmp;
-  }
 }
 
 }  // namespace
