@@ -88,14 +88,12 @@ TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
 
 class MonitorRegistrationTest : public testsupport::LibraryTest {
  protected:
-  MonitorRegistrationTest() : queue(volume + "/photo/@eaDir/WEZO@file_index_queue") {
-    std::filesystem::create_directories(volume + "/photo");
-    WriteFile(FolderConfPath(), R"({"/photo/b":{"photo":true},"/photo/a":{},"/video/c":{}})");
-  }
-  std::string queue;
+  MonitorRegistrationTest() { std::filesystem::create_directories(volume + "/photo"); }
+  const std::string queue = volume + "/photo/@eaDir/WEZO@file_index_queue";
 };
 
 TEST_F(MonitorRegistrationTest, RegistersEveryFolderOfTheShareInListOrderAndDeletesTheShare) {
+  WriteFile(FolderConfPath(), R"({"/photo/b":{"photo":true},"/photo/a":{},"/video/c":{}})");
   ASSERT_TRUE(IndexMgr::UpsertWEZotifydCfg("photo"));
   Json::Value expected = ParseJson(R"({"config":[]})");
   expected["queue"] = queue;
