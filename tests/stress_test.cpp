@@ -264,14 +264,27 @@ TEST_F(StressTest, ConcurrentWritersKeepEveryDoneChangeAndReadersSeeUntouchedFol
   ASSERT_TRUE(IndexMgr::Upsert(testsupport::ParseJson(
       R"([{"path":"/photo/seed","name":"keep"},{"path":"/video/seed","name":"keep"}])")));
   // Exit codes: 1 an unexpected failure, 2 a writer's lost change, 3 a reader's wrong answer.
+  daemon.Connections(1);  // the seed's command served
+  // All children are forked before any starts: a fork while the daemon's thread serves a child
+  // could copy a lock that thread holds into the next child, which would then wait forever.
+  int go[2];
+  ASSERT_EQ(pipe(go), 0);
+  const auto started = [go](const std::function<int()>& body) {
+    return [go, body] {
+      char byte;
+      close(go[1]);
+      return read(go[0], &byte, 1) == 0 ? body() : 1;
+    };
+  };
   std::vector<std::function<int()>> children;
-  children.reserve(5);
   for (int w = 0; w < 3; ++w) {
-    children.push_back(Spawn([w, rounds] { return Writer(w, rounds); }));
+    children.push_back(Spawn(started([w, rounds] { return Writer(w, rounds); })));
   }
   for (int r = 0; r < 2; ++r) {
-    children.push_back(Spawn([rounds] { return Reader(rounds * 4); }));
+    children.push_back(Spawn(started([rounds] { return Reader(rounds * 4); })));
   }
+  close(go[1]);
+  close(go[0]);
   for (const auto& wait : children) {
     EXPECT_EQ(wait(), 0);
   }
