@@ -3,7 +3,6 @@
 #include <gtest/gtest.h>
 #include <json/value.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -50,11 +49,7 @@ TEST_F(DaemonTest, EachCallIsOneConnectionWithOneExactFrame) {
     expected.push_back(std::string(reinterpret_cast<const char*>(&size), 4) + R"({"data":")" + s +
                        R"(","type":"t"})" + '\0');
   }
-  const std::vector<std::string> received = daemon.Connections(expected.size());
-  ASSERT_EQ(received.size(), expected.size());
-  for (size_t i = 0; i < expected.size(); ++i) {
-    EXPECT_TRUE(received[i] == expected[i]) << "frame of " << expected[i].size() << " bytes";
-  }
+  EXPECT_TRUE(daemon.Connections(expected.size()) == expected);  // not printed: a MiB of x
 }
 
 TEST_F(DaemonTest, NobodyListeningFailsAtOnceWithoutLeakingADescriptor) {

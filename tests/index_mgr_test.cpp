@@ -86,31 +86,14 @@ TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
   }
 }
 
-TEST_F(QueryTest, ListPagesAndGetReadsOneFolder) {
-  WriteFile(FolderConfPath(), R"({"/photo":{},"/video/clips":{"video":true}})");
-  Json::Value page;
-  ASSERT_TRUE(IndexMgr::List(page, 1, 5, "name", "ASC", ParseJson(R"(["is_valid"])")));
-  EXPECT_EQ(page["total"].asInt(), 2);
-  ASSERT_EQ(page["folder"].size(), 1U);
-  EXPECT_EQ(page["folder"][0]["path"], "/video/clips");
-  EXPECT_TRUE(page["folder"][0]["additional"].isMember("is_valid"));
-  Json::Value folder;
-  ASSERT_TRUE(IndexMgr::Get(folder, "/video/clips"));
-  EXPECT_EQ(folder["video"], true);
-  EXPECT_FALSE(IndexMgr::Get(folder, "/video"));
-  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_NO_SUCH_FOLDER);
-}
-
 class MonitorRegistrationTest : public testsupport::LibraryTest {
  protected:
-  MonitorRegistrationTest() : queue(volume + "/photo/@eaDir/WEZO@file_index_queue") {
-    std::filesystem::create_directories(volume + "/photo");
-    WriteFile(FolderConfPath(), R"({"/photo/b":{"photo":true},"/photo/a":{},"/video/c":{}})");
-  }
-  std::string queue;
+  MonitorRegistrationTest() { std::filesystem::create_directories(volume + "/photo"); }
+  const std::string queue = volume + "/photo/@eaDir/WEZO@file_index_queue";
 };
 
 TEST_F(MonitorRegistrationTest, RegistersEveryFolderOfTheShareInListOrderAndDeletesTheShare) {
+  WriteFile(FolderConfPath(), R"({"/photo/b":{"photo":true},"/photo/a":{},"/video/c":{}})");
   ASSERT_TRUE(IndexMgr::UpsertWEZotifydCfg("photo"));
   Json::Value expected = ParseJson(R"({"config":[]})");
   expected["queue"] = queue;

@@ -5,16 +5,13 @@
 #include <sys/file.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <climits>
 #include <ctime>
 #include <filesystem>
 #include <string>
-#include <thread>
 
 #include "fake_platform.h"
 #include "fileindex/error.h"
-#include "fileindex/folder.h"
 #include "fileindex/status_mgr.h"
 #include "paths.h"
 #include "test_support.h"
@@ -56,9 +53,6 @@ TEST_F(StatusMgrTest, PauseAndResumeStoreTheStateThenTellTheDaemon) {
   const long long end = StatusFile()["resume_time"].asInt64();
   EXPECT_GE(end, before + 7200);
   EXPECT_LE(end, time(nullptr) + 7200);
-  long long stored = 0;
-  ASSERT_TRUE(StatusMgr::GetPauseInfo(stored));
-  EXPECT_EQ(stored, end);
   EXPECT_TRUE(StatusMgr::Pause(lastHour));
   EXPECT_THAT(daemon.Commands(4),
               ElementsAre(ParseJson(R"({"type":"resume","data":{}})"),
@@ -67,27 +61,6 @@ TEST_F(StatusMgrTest, PauseAndResumeStoreTheStateThenTellTheDaemon) {
                                     std::to_string(end) + "}}"),
                           ::testing::_));
   EXPECT_THAT(log.Lines(), ::testing::IsEmpty());
-}
-
-TEST_F(StatusMgrTest, TheDaemonIsToldAfterTheSaveWhileTheLockIsStillHeld) {
-  FakeDaemon daemon(FakeDaemon::Behaviour::kHoldConnect);
-  bool paused = false;
-  std::thread caller([&] { paused = StatusMgr::Pause(0); });
-  // The caller blocks in connect until the daemon accepts; by then the file must say paused and
-  // the lock must still be held.
-  for (int i = 0; i < 5000 && !std::filesystem::exists(StatusConfPath()); ++i) {
-    std::this_thread::sleep_for(std::chrono::milliseconds(1));
-  }
-  EXPECT_EQ(StatusFile(), ParseJson(R"({"resume_time":0})"));
-  for (int i = 0; i < 20; ++i) {
-    EXPECT_TRUE(StatusLockHeld());
-    std::this_thread::sleep_for(std::chrono::milliseconds(5));
-  }
-  daemon.Release();
-  caller.join();
-  EXPECT_TRUE(paused);
-  EXPECT_EQ(daemon.Commands(1).size(), 1U);
-  EXPECT_FALSE(StatusLockHeld());
 }
 
 TEST_F(StatusMgrTest, AnUnreachableDaemonFailsTheCallButTheChangeStays) {
@@ -123,18 +96,18 @@ TEST_F(StatusMgrTest, QueriesAnswerWhileAnotherProcessHoldsTheLockAndChangesGive
   EXPECT_THAT(log.Lines(), ElementsAre("config:N Failed to lock folder"));
 }
 
+using ProgressTest = testsupport::LibraryTest;
+
 // Progress reports, against the clock and the queue files.
-class ProgressTest : public testsupport::LibraryTest {
- protected:
-  ProgressTest() : queue(volume + "/photo/@eaDir/WEZO@file_index_queue") {
-    for (const char* dir : {"/photo/a", "/photo/ab", "/photo/@eaDir"}) {
-      std::filesystem::create_directories(volume + dir);
-    }
-    WriteFile(FolderConfPath(), R"({"/photo/a":{"name":"a","photo":true}})");
+TEST_F(ProgressTest, TheServiceIsFinishedWhenNoIndexableShareHasAQueueFile) {
+  for (const char* dir : {"/photo/a", "/photo/ab", "/photo/@eaDir"}) {
+    std::filesystem::create_directories(volume + dir);
   }
+  WriteFile(FolderConfPath(), R"({"/photo/a":{"name":"a","photo":true}})");
+  const std::string queue = volume + "/photo/@eaDir/WEZO@file_index_queue";
   // The queue and its .tmp file as given ("-": none), and status.conf.
-  void Arrange(const std::string& queueText, const std::string& tmpText,
-               const std::string& status) const {
+  const auto Arrange = [&](const std::string& queueText, const std::string& tmpText,
+                           const std::string& status) {
     for (const auto& [path, text] : {std::pair{queue, queueText}, {queue + ".tmp", tmpText}}) {
       std::filesystem::remove(path);
       if (text != "-") {
@@ -142,15 +115,10 @@ class ProgressTest : public testsupport::LibraryTest {
       }
     }
     WriteFile(StatusConfPath(), status);
-  }
-  std::string Event(const std::string& path) const {
+  };
+  const auto Event = [&](const std::string& path) {
     return R"({"event":2,"path":")" + volume + path + "\"}\n";
-  }
-
-  std::string queue;
-};
-
-TEST_F(ProgressTest, TheServiceIsFinishedWhenNoIndexableShareHasAQueueFile) {
+  };
   const long long now = time(nullptr);
   const std::string event = Event("/photo/a/x.jpg");
   const struct {
@@ -159,6 +127,8 @@ TEST_F(ProgressTest, TheServiceIsFinishedWhenNoIndexableShareHasAQueueFile) {
     const char* folder;
   } cases[] = {
       {event, "-", "{}", "processing", "processing"},
+      {Event("/photo/ab/x"), "-", "{}", "processing", "finished"},  // a sibling's events
+      {Event("/photo/ab"), Event("/photo/a/y"), "{}", "processing", "processing"},
       {event, "-", R"({"resume_time":-1})", "processing", "processing"},
       {event, "-", R"({"resume_time":0})", "paused", "paused"},
       {event, "-", R"({"resume_time":)" + std::to_string(now - 60) + "}", "processing",
@@ -195,30 +165,6 @@ TEST_F(ProgressTest, TheServiceIsFinishedWhenNoIndexableShareHasAQueueFile) {
   std::filesystem::remove(FolderConfPath());
   ASSERT_TRUE(StatusMgr::GetStatus(word));
   EXPECT_EQ(word, "finished");
-}
-
-TEST_F(ProgressTest, AFolderReportsOnlyTheEventsAtOrBelowIt) {
-  const struct {
-    std::string queue, tmp;
-    const char* word;
-  } cases[] = {
-      {"-", "-", "finished"},
-      {Event("/photo/ab/x"), "-", "finished"},  // a sibling's events
-      {Event("/photo/a"), "-", "processing"},   // the folder itself
-      {Event("/photo/ab"), Event("/photo/a/y"), "processing"},
-      {R"({"event":256,"path":")" + volume + R"(/video/z","path_old":")" + volume +
-           "/photo/a/y\"}\n",
-       "-", "processing"},  // moved away from it
-  };
-  for (const auto& c : cases) {
-    Arrange(c.queue, c.tmp, "{}");
-    EXPECT_EQ(StatusMgr::GetFolderStatus("/photo/a"), c.word) << c.queue << c.tmp;
-  }
-  Folder folder;
-  ASSERT_TRUE(folder.Load("/photo/a", ParseJson("{}")));
-  Json::Value additional;
-  ASSERT_TRUE(folder.GetAdditional(additional, ParseJson(R"(["status","is_valid"])")));
-  EXPECT_EQ(additional, ParseJson(R"({"status":"processing","is_valid":true})"));
 }
 
 }  // namespace

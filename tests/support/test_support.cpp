@@ -1,6 +1,5 @@
 #include "test_support.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <poll.h>
 #include <sys/file.h>
@@ -88,15 +87,8 @@ int ModeOf(const std::string& path) {
 }
 
 int OpenDescriptorCount() {
-  int count = 0;
-  DIR* dir = opendir("/proc/self/fd");
-  while (dir != nullptr && readdir(dir) != nullptr) {
-    ++count;
-  }
-  if (dir != nullptr) {
-    closedir(dir);
-  }
-  return count - 3;  // ".", ".." and the directory's own descriptor
+  const auto fds = std::filesystem::directory_iterator("/proc/self/fd");
+  return static_cast<int>(std::distance(begin(fds), end(fds))) - 1;  // less the iterator's own
 }
 
 LockHolder::LockHolder(const std::string& path, bool exclusive) {
@@ -135,8 +127,8 @@ LockHolder::~LockHolder() {
 
 FakeDaemon::FakeDaemon(Behaviour behaviour)
     : m_path(WEZO::FILEINDEX::DaemonSocketPath()), m_behaviour(behaviour) {
-  // A path that fills sun_path to its last byte is still taken, so that a test can put a daemon
-  // where the library must refuse to look.
+  // A path filling sun_path to its last byte is taken: a test puts a daemon where the library
+  // must refuse to look.
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
   if (m_path.size() > sizeof(address.sun_path)) {

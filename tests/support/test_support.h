@@ -25,9 +25,8 @@ inline void PrintTo(const Value& value, std::ostream* os) { *os << value.toStyle
 
 namespace testsupport {
 
-// Reads back what the library logged. Lines() replaces each line's source line number by "N"
-// ("config:N Failed to lock folder") and prefixes a line logged at any priority but LOG_ERR with
-// "priority=<n> ".
+// What the library logged; Lines() shows line numbers as N ("config:N Failed to lock folder") and
+// prefixes lines not logged at LOG_ERR with "priority=<n> ".
 class LogCapture {
  public:
   LogCapture();
@@ -40,15 +39,10 @@ class LogCapture {
   void Clear();
 };
 
-// `text` parsed as JSON. Fails the test when it is not JSON.
-Json::Value ParseJson(const std::string& text);
-// Writes `text` to `path`, replacing it. Fails the test on error.
+Json::Value ParseJson(const std::string& text);  // fails the test when it is not JSON
 void WriteFile(const std::string& path, const std::string& text);
-// The file's content, or "<missing>" when it cannot be read.
-std::string ReadFile(const std::string& path);
-// The permission bits of `path`, or -1.
-int ModeOf(const std::string& path);
-// How many descriptors this process has open.
+std::string ReadFile(const std::string& path);  // "<missing>" when it cannot be read
+int ModeOf(const std::string& path);            // the permission bits, or -1
 int OpenDescriptorCount();
 
 // Another process that holds a flock on `path` (opened, created if need be) until destroyed.
@@ -67,9 +61,8 @@ class LockHolder {
   bool m_holding = false;
 };
 
-// A stand-in for the indexing daemon: a listening Unix socket at the sandbox's daemon socket
-// path, served one connection at a time by a thread that never calls into the library. Create
-// it after the root prefix is set.
+// A stand-in for the indexing daemon on the sandbox's socket path, served one connection at a time
+// by a thread that never calls into the library. Create it after the root prefix is set.
 class FakeDaemon {
  public:
   enum class Behaviour {
@@ -84,14 +77,12 @@ class FakeDaemon {
   FakeDaemon(const FakeDaemon&) = delete;
   FakeDaemon& operator=(const FakeDaemon&) = delete;
 
-  // For kHoldConnect: from now on behave as kRead.
-  void Release();
-  // The bytes received on each ended connection, in order (length field included; empty for a
-  // connection closed unread), once `count` have ended or `timeout` passed.
+  void Release();  // kHoldConnect: from now on behave as kRead
+  // The bytes of each ended connection in order (empty when closed unread), once `count` have
+  // ended or `timeout` passed.
   std::vector<std::string> Connections(size_t count,
                                        std::chrono::milliseconds timeout = std::chrono::seconds(5));
-  // The same, each decoded: fails the test on a bad frame (a length field that is not the rest's
-  // size, no single terminating zero) and parses the JSON text.
+  // The same decoded; a length field that is not the rest's size, or no single final zero, fails.
   std::vector<Json::Value> Commands(size_t count,
                                     std::chrono::milliseconds timeout = std::chrono::seconds(5));
 
@@ -111,17 +102,15 @@ class FakeDaemon {
   std::vector<std::string> m_ended;
 };
 
-// The fixture of every library test: its own sandbox root with the appliance's directories, a
-// fresh fake platform with the shares "photo" and "video" on /volume1 of the sandbox, the log
-// captured, the last error cleared and LOG_LEVEL back at its initial 3.
+// Every library test's fixture: a sandbox root with the appliance's directories, a fresh fake
+// platform with shares "photo" and "video" on its /volume1, the log captured, no error,
+// LOG_LEVEL 3.
 class LibraryTest : public SandboxTest {
  protected:
   LibraryTest();
 
-  // The sandbox's status.conf, parsed. Fails the test when it is missing or not JSON.
-  static Json::Value StatusFile();
-
-  // The sandbox as the tests written before SandboxTest name it: Path("/x"), Root().
+  static Json::Value StatusFile();  // status.conf parsed; fails the test when it is not JSON
+  // The sandbox as older tests name it: Path("/x"), Root().
   struct Paths {
     const std::string& root;
     std::string Path(const std::string& relative) const { return root + relative; }
