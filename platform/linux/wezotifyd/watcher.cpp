@@ -49,6 +49,24 @@ bool IsDirAt(int dirFd, const dirent& entry) {
   return fstatat(dirFd, entry.d_name, &st, AT_SYMLINK_NOFOLLOW) == 0 && S_ISDIR(st.st_mode);
 }
 
+// Reads every event the inotify descriptor `fd` holds now and hands each to `handle` with its
+// name ("" when it has none).
+template <typename Handle>
+void DrainEvents(int fd, Handle handle) {
+  alignas(inotify_event) char buffer[65536];
+  for (;;) {
+    const ssize_t got = read(fd, buffer, sizeof buffer);
+    if (got <= 0) {
+      return;
+    }
+    for (ssize_t at = 0; at < got;) {
+      const auto* event = reinterpret_cast<const inotify_event*>(buffer + at);
+      handle(*event, event->len > 0 ? std::string(event->name) : std::string());
+      at += static_cast<ssize_t>(sizeof(inotify_event) + event->len);
+    }
+  }
+}
+
 }  // namespace
 
 Watcher::Watcher(std::string registryDir, LostEvents lost)
@@ -248,22 +266,12 @@ bool Watcher::InAnyTree(const std::string& path) const {
 }
 
 void Watcher::ReadRegistryEvents() {
-  alignas(inotify_event) char buffer[16384];
   bool changed = false;
-  for (;;) {
-    const ssize_t got = read(m_registry.get(), buffer, sizeof buffer);
-    if (got <= 0) {
-      break;
-    }
-    for (ssize_t at = 0; at < got;) {
-      const auto* event = reinterpret_cast<const inotify_event*>(buffer + at);
-      const std::string name = event->len > 0 ? event->name : "";
-      // A writer's temporary files come and go without changing a registration.
-      changed = changed || (event->mask & (IN_ISDIR | IN_Q_OVERFLOW | IN_DELETE_SELF)) != 0 ||
-                (name.size() > 5 && name.compare(name.size() - 5, 5, ".json") == 0);
-      at += static_cast<ssize_t>(sizeof(inotify_event) + event->len);
-    }
-  }
+  DrainEvents(m_registry.get(), [&](const inotify_event& event, const std::string& name) {
+    // A writer's temporary files come and go without changing a registration.
+    changed = changed || (event.mask & (IN_ISDIR | IN_Q_OVERFLOW | IN_DELETE_SELF)) != 0 ||
+              (name.size() > 5 && name.compare(name.size() - 5, 5, ".json") == 0);
+  });
   if (changed) {
     Reload();
   }
@@ -271,18 +279,9 @@ void Watcher::ReadRegistryEvents() {
 
 void Watcher::ReadTreeEvents() {
   ClearFlags();
-  alignas(inotify_event) char buffer[65536];
-  for (;;) {
-    const ssize_t got = read(m_tree.get(), buffer, sizeof buffer);
-    if (got <= 0) {
-      return;
-    }
-    for (ssize_t at = 0; at < got;) {
-      const auto* event = reinterpret_cast<const inotify_event*>(buffer + at);
-      Handle(event->wd, event->mask, event->cookie, event->len > 0 ? event->name : "");
-      at += static_cast<ssize_t>(sizeof(inotify_event) + event->len);
-    }
-  }
+  DrainEvents(m_tree.get(), [&](const inotify_event& event, const std::string& name) {
+    Handle(event.wd, event.mask, event.cookie, name);
+  });
 }
 
 void Watcher::Handle(int wd, uint32_t mask, uint32_t cookie, const std::string& name) {
