@@ -19,7 +19,6 @@
 #include <fcntl.h>
 #include <json/value.h>
 #include <poll.h>
-#include <signal.h>
 #include <sys/file.h>
 #include <sys/prctl.h>
 #include <sys/socket.h>
@@ -31,6 +30,7 @@
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
+#include <csignal>
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
@@ -74,7 +74,7 @@ constexpr int kFoldersPerShare = 100;
 constexpr int kLinesPerShare = 100000;
 constexpr int kBigLines = 1000000;
 constexpr size_t kBlock = 1 << 20;
-constexpr size_t kHugeLine = 32u << 20;
+constexpr size_t kHugeLine = 32U << 20;
 constexpr char kSandboxScript[] = FILEINDEX_SANDBOX_SCRIPT;
 
 void DropLine(int /*priority*/, const char* /*line*/) {}
@@ -97,7 +97,7 @@ struct Rng {
 
 // The folder j of a share, relative to the share: depth 1, 2 or 3.
 std::string FolderRel(int j) {
-  const std::string leaf = "f" + std::to_string(j);
+  std::string leaf = "f" + std::to_string(j);
   const std::string group = "g" + std::to_string(j % 10);
   switch (j % 3) {
     case 0:
@@ -135,7 +135,7 @@ class BulkWriter {
   }
 
  private:
-  static constexpr size_t kFlushAt = 8u << 20;
+  static constexpr size_t kFlushAt = 8U << 20;
   void Flush() {
     size_t done = 0;
     while (m_fd >= 0 && done < m_buffer.size()) {
@@ -223,6 +223,7 @@ pid_t StartDaemonStandIn(const std::vector<std::string>& roots) {
   }
   prctl(PR_SET_PDEATHSIG, SIGKILL);
   std::vector<pollfd> polls;
+  polls.reserve(listeners.size());
   for (const int fd : listeners) {
     polls.push_back({fd, POLLIN, 0});
   }
@@ -305,7 +306,7 @@ class Sandbox {
   Sandbox() {
     const char* tmp = getenv("TMPDIR");
     std::string pattern =
-        std::string(tmp != nullptr && *tmp != '\0' ? tmp : "/tmp") + "/fileindex-rpbench.XXXXXX";
+        std::string(tmp != nullptr && *tmp != '\0' ? tmp : "/tmp") + "/fi-rp.XXXXXX";
     if (mkdtemp(pattern.data()) == nullptr) {
       m_error = "mkdtemp failed";
       return;
@@ -314,6 +315,7 @@ class Sandbox {
     m_a = m_base + "/a";
     m_b = m_base + "/b";
     std::vector<std::string> sharesA;
+    sharesA.reserve(kShares);
     for (int i = 0; i < kShares; ++i) {
       sharesA.push_back("share" + std::to_string(i));
     }
@@ -492,6 +494,18 @@ bool RawRead(const std::vector<std::string>& files) {
   return true;
 }
 
+// " (<n> MB)": the files' size in all, for the labels.
+std::string SizeOf(const std::vector<std::string>& files) {
+  double bytes = 0;
+  for (const std::string& file : files) {
+    struct stat st {};
+    bytes += stat(file.c_str(), &st) == 0 ? static_cast<double>(st.st_size) : 0;
+  }
+  char text[32];
+  std::snprintf(text, sizeof(text), " (%.0f MB)", bytes / 1e6);
+  return text;
+}
+
 // What a durable change of folder.conf costs at least: parse it, render it, replace a file beside
 // it atomically (temporary file, fsync, rename, fsync of the folder).
 bool DurableSave() {
@@ -629,7 +643,7 @@ void CollectShares(const Json::Value& value, std::set<std::string>& shares) {
 
 // P2: the listing with "status" and "is_valid", whole (1000) or a page of 50.
 void BM_List(benchmark::State& state) {
-  const unsigned long limit = static_cast<unsigned long>(state.range(0));
+  const auto limit = static_cast<unsigned long>(state.range(0));
   const bool cold = state.range(1) != 0;
   Sandbox* box = Prepare(state, true);
   if (box == nullptr) {
@@ -646,6 +660,7 @@ void BM_List(benchmark::State& state) {
   }
   CollectShares(result, shares);
   std::vector<std::string> queues;
+  queues.reserve(shares.size());
   for (const std::string& share : shares) {
     queues.push_back(Sandbox::QueueFile(box->A(), share));
   }
@@ -661,7 +676,8 @@ void BM_List(benchmark::State& state) {
   }
   ratio.Report("P2 IndexMgr::List " + std::to_string(limit) +
                    " of 1000 folders, status+is_valid, " + (cold ? "cold" : "warm") +
-                   " vs raw read of " + std::to_string(queues.size()) + " queue(s)",
+                   " vs raw read of " + std::to_string(queues.size()) + " queue(s)" +
+                   SizeOf(queues),
                cold ? (limit >= 1000 ? 5 : 3) : 0);
 }
 BENCHMARK(BM_List)
@@ -692,7 +708,8 @@ void BM_GetFolderStatus(benchmark::State& state) {
     ratio.Floor([&] { benchmark::DoNotOptimize(RawRead(queue)); });
   }
   ratio.Report(std::string("StatusMgr::GetFolderStatus, folder without events, ") +
-                   (cold ? "cold" : "warm") + " vs raw read of its 1,000,000-line queue",
+                   (cold ? "cold" : "warm") + " vs raw read of its 1,000,000-line queue" +
+                   SizeOf(queue),
                cold ? 2 : 0);
 }
 BENCHMARK(BM_GetFolderStatus)
@@ -731,7 +748,8 @@ void BM_AddCustomEvent(benchmark::State& state) {
     ratio.Floor([&] { benchmark::DoNotOptimize(RawRead(queue)); });
   }
   ratio.Report(std::string("P1 AddCustomEvent, ") + (escapes ? "10% escapes" : "plain") + ", " +
-                   (cold ? "cold" : "warm") + " vs raw read of the 1,000,000-line queue",
+                   (cold ? "cold" : "warm") + " vs raw read of the 1,000,000-line queue" +
+                   SizeOf(queue),
                2);
 }
 BENCHMARK(BM_AddCustomEvent)
@@ -920,6 +938,7 @@ void BM_ConcurrentWriters(benchmark::State& state) {
       return;
     }
     std::vector<pid_t> writers;
+    writers.reserve(kWriters);
     for (int k = 0; k < kWriters; ++k) {
       writers.push_back(ForkWriter("/share" + std::to_string(k) + "/" + FolderRel(2), kChangesEach,
                                    go[0], report[1]));
