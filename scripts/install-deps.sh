@@ -21,6 +21,8 @@ packages=(
   # the fuzz targets (scripts/fuzz.sh): clang with libFuzzer and the sanitizers' runtimes
   clang
   libclang-rt-14-dev
+  # scripts/bench.sh reads the benchmarks' JSON with it; a minimal Debian has no Python
+  python3
 )
 
 if [ "${1:-}" = "--packaging" ]; then
