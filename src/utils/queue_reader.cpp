@@ -40,6 +40,7 @@ constexpr const char* kFolderUnit = "status_mgr";
 // Bytes at the start of a queue and just before the point read to that must be unchanged for
 // the rest of what was read to count as unchanged.
 constexpr size_t kWindow = 4096;
+constexpr size_t kBlockSize = size_t{1} << 20;
 // Of a malformed line longer than the block, what its log line shows.
 constexpr size_t kLogHead = size_t{64} << 10;
 // Reindex paths up to this length are remembered; a longer one makes the file's entry go.
@@ -562,7 +563,8 @@ class BlockReader {
   // window before the point read to is at hand even when little was appended.
   BlockReader(int fd, off_t from, size_t blockSize)
       : m_fd(fd),
-        m_buffer(std::max<size_t>(blockSize, 1) + kWindow),
+        m_size(std::max<size_t>(blockSize, 1) + kWindow),
+        m_buffer(new char[m_size]),
         m_base(from - std::min<off_t>(from, static_cast<off_t>(kWindow))),
         m_skip(static_cast<size_t>(from - m_base)) {}
 
@@ -576,7 +578,7 @@ class BlockReader {
       m_pos = std::min(m_skip, m_fill);
       m_skip = 0;
     }
-    char* data = m_buffer.data();
+    char* data = m_buffer.get();
     const char* newline = nullptr;
     size_t searched = m_pos;
     for (;;) {
@@ -586,12 +588,12 @@ class BlockReader {
         break;
       }
       searched = m_fill;
-      if (m_eof || m_fill - m_pos + kWindow >= m_buffer.size()) {
+      if (m_eof || m_fill - m_pos + kWindow >= m_size) {
         break;  // the whole rest of the file, or a line longer than the block
       }
       const size_t kept = Compact(m_pos);
       searched -= kept;
-      data = m_buffer.data();
+      data = m_buffer.get();
       Fill();
     }
     if (newline == nullptr && m_pos == m_fill) {
@@ -620,7 +622,7 @@ class BlockReader {
       return false;
     }
     const size_t at = static_cast<size_t>(end - m_base);
-    hash = Hash(m_buffer.data() + at - size, size);
+    hash = Hash(m_buffer.get() + at - size, size);
     return true;
   }
 
@@ -644,7 +646,7 @@ class BlockReader {
   size_t Compact(size_t from) {
     const size_t keep = from > kWindow ? from - kWindow : 0;
     if (keep > 0) {
-      std::memmove(m_buffer.data(), m_buffer.data() + keep, m_fill - keep);
+      std::memmove(m_buffer.get(), m_buffer.get() + keep, m_fill - keep);
       m_fill -= keep;
       m_pos -= std::min(m_pos, keep);
       m_base += static_cast<off_t>(keep);
@@ -653,9 +655,8 @@ class BlockReader {
   }
 
   void Fill() {
-    while (!m_eof && m_fill < m_buffer.size()) {
-      const ssize_t got =
-          pread(m_fd, m_buffer.data() + m_fill, m_buffer.size() - m_fill, Offset(m_fill));
+    while (!m_eof && m_fill < m_size) {
+      const ssize_t got = pread(m_fd, m_buffer.get() + m_fill, m_size - m_fill, Offset(m_fill));
       if (got < 0 && errno == EINTR) {
         continue;
       }
@@ -667,7 +668,7 @@ class BlockReader {
         const size_t from = m_fill;
         const size_t upto = std::min(m_fill + static_cast<size_t>(got), kWindow);
         if (from < upto) {
-          m_head.append(m_buffer.data() + from, upto - from);
+          m_head.append(m_buffer.get() + from, upto - from);
         }
       }
       m_fill += static_cast<size_t>(got);
@@ -680,9 +681,9 @@ class BlockReader {
     if (m_lineEnded) {
       return false;
     }
-    m_pos = static_cast<size_t>(source.p - m_buffer.data());
+    m_pos = static_cast<size_t>(source.p - m_buffer.get());
     for (;;) {
-      const char* data = m_buffer.data();
+      const char* data = m_buffer.get();
       if (m_pos < m_fill) {
         const void* newline = std::memchr(data + m_pos, '\n', m_fill - m_pos);
         source.p = data + m_pos;
@@ -723,11 +724,11 @@ class BlockReader {
 
   // A line longer than the block: scanned as it streams past, with its start kept for the log.
   void Stream(ReadLine& line, size_t limit) {
-    const char* begin = m_buffer.data() + m_pos;
+    const char* begin = m_buffer.get() + m_pos;
     const auto held = static_cast<size_t>(m_fill - m_pos);
     m_logHead.assign(begin, std::min(held, kLogHead));
     m_lineEnded = false;
-    StreamSource source(*this, begin, m_buffer.data() + m_fill);
+    StreamSource source(*this, begin, m_buffer.get() + m_fill);
     const LineVerdict verdict =
         LineScanner(source, limit).Event(line.event, line.pathSize, line.pathOldSize);
     // Up to the end of the line, whatever the scanner left.
@@ -735,7 +736,7 @@ class BlockReader {
     while (source.More()) {
       source.p = source.end;
     }
-    m_pos = static_cast<size_t>(source.p - m_buffer.data());
+    m_pos = static_cast<size_t>(source.p - m_buffer.get());
     line.ended = m_pos < m_fill && m_buffer[m_pos] == '\n';
     if (line.ended) {
       ++m_pos;
@@ -757,11 +758,12 @@ class BlockReader {
   }
 
   int m_fd;
-  std::vector<char> m_buffer;
-  off_t m_base;       // the file offset of the buffer's first byte
-  size_t m_skip;      // bytes at the start read only for the window
-  size_t m_pos = 0;   // where the part not yet handed out begins
-  size_t m_fill = 0;  // how much of the buffer holds read bytes
+  size_t m_size;
+  std::unique_ptr<char[]> m_buffer;  // left uninitialised: a short file touches little of it
+  off_t m_base;                      // the file offset of the buffer's first byte
+  size_t m_skip;                     // bytes at the start read only for the window
+  size_t m_pos = 0;                  // where the part not yet handed out begins
+  size_t m_fill = 0;                 // how much of the buffer holds read bytes
   bool m_eof = false;
   bool m_lineEnded = false;
   std::string m_head;
@@ -1131,7 +1133,8 @@ bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile
     return false;
   }
   std::vector<bool> found;
-  return QueueFoldersWithEvents({full}, queueFile, found) && found[0];
+  return detail::QueueFoldersWithEvents({full}, queueFile, found, ReadOptions{kBlockSize, false}) &&
+         found[0];
 }
 
 bool QueueFoldersWithEvents(const std::vector<std::string>& fullPaths, const std::string& queueFile,

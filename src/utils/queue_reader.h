@@ -49,8 +49,10 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile);
 // True when the queue file `queueFile` holds an event inside the folder `folder` (a share path,
 // resolved with GetFullPath): its "path", or on a moved event its "path_old", is the folder's
 // full path or lies below it at a "/" boundary. False, logged, when the folder cannot be resolved
-// or the file cannot be opened; false without a line when the file is missing. Malformed lines
-// are logged ("status_mgr: Malformed command: <line>") as QueueFoldersWithEvents logs them.
+// or the file cannot be opened; false without a line when the file is missing. Reads the file
+// plainly, without what the process remembers, up to the first such event, and logs each
+// malformed line on the way ("status_mgr: Malformed command: <line>"): the folder-by-folder
+// reading that QueueFoldersWithEvents answers as.
 bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile);
 
 // For each full path in `fullPaths`, whether the queue file `queueFile` holds an event inside
