@@ -175,6 +175,21 @@ class LineScanner {
     uint64_t hash;
   };
 
+  enum class TopKey { kOther, kEvent, kPath, kPathOld };
+
+  static TopKey Which(const std::string& name) {
+    switch (name.size()) {
+      case 4:
+        return std::memcmp(name.data(), "path", 4) == 0 ? TopKey::kPath : TopKey::kOther;
+      case 5:
+        return std::memcmp(name.data(), "event", 5) == 0 ? TopKey::kEvent : TopKey::kOther;
+      case 8:
+        return std::memcmp(name.data(), "path_old", 8) == 0 ? TopKey::kPathOld : TopKey::kOther;
+      default:
+        return TopKey::kOther;
+    }
+  }
+
   bool Avail() { return m_src.p != m_src.end || m_src.More(); }
 
   // The next byte, taken; false at the end of the line.
@@ -488,19 +503,20 @@ class LineScanner {
         return step;
       }
       SkipSpace();
-      if (top && name == "event") {
+      const TopKey which = top ? Which(name) : TopKey::kOther;
+      if (which == TopKey::kEvent) {
         if (!Avail()) {
           return Step::kMalformed;
         }
         step = Unsigned(m_out->event);
         m_event = step == Step::kOk;
-      } else if (top && name == "path") {
+      } else if (which == TopKey::kPath) {
         Capture path;
         path.out = &m_out->path;
         path.limit = m_limit;
         step = PathValue(depth, path, m_path);
         m_pathSize = path.size;
-      } else if (top && name == "path_old") {
+      } else if (which == TopKey::kPathOld) {
         Capture pathOld;
         pathOld.out = &m_out->pathOld;
         pathOld.limit = m_limit;
@@ -546,8 +562,10 @@ class LineScanner {
 // of each path, and where the line lies.
 struct ReadLine {
   bool isEvent = false;
-  QueueEvent event;
-  size_t pathSize = 0;
+  QueueEvent event;       // the code; the paths when they had to be decoded
+  std::string_view path;  // at most the capture limit of each path
+  std::string_view pathOld;
+  size_t pathSize = 0;  // their whole lengths
   size_t pathOldSize = 0;
   off_t start = 0;        // offset of its first byte
   off_t stop = 0;         // offset after its "\n", or of its end when it has none
@@ -625,6 +643,9 @@ class BlockReader {
     hash = Hash(m_buffer.get() + at - size, size);
     return true;
   }
+
+  // Lines that cannot be reindex events are then only told apart from them, not read.
+  void OnlyReindexEvents() { m_onlyReindex = true; }
 
   // The first bytes of the file, up to `kWindow`, when this reader started at the file's start.
   const std::string& Head() const { return m_head; }
@@ -705,11 +726,114 @@ class BlockReader {
     }
   }
 
+  // The shapes the writers produce, {"event":N,"path":"P"} and {"event":N,"path":"P",
+  // "path_old":"O"} with plain decimals and strings without a backslash, are taken straight from
+  // the buffer; the parser reads them exactly so.
+  static bool Plain(ReadLine& line, const char* p, const char* end) {
+    static constexpr char kEvent[] = "{\"event\":";
+    static constexpr char kPath[] = ",\"path\":\"";
+    static constexpr char kPathOld[] = "\",\"path_old\":\"";
+    const auto take = [&p, end](const char* text, size_t size) {
+      if (static_cast<size_t>(end - p) < size || std::memcmp(p, text, size) != 0) {
+        return false;
+      }
+      p += size;
+      return true;
+    };
+    const auto string = [&p, end](std::string_view& out) {
+      const void* quote = std::memchr(p, '"', static_cast<size_t>(end - p));
+      if (quote == nullptr) {
+        return false;
+      }
+      const auto size = static_cast<size_t>(static_cast<const char*>(quote) - p);
+      if (std::memchr(p, '\\', size) != nullptr) {
+        return false;
+      }
+      out = std::string_view(p, size);
+      p += size;
+      return true;
+    };
+    if (!take(kEvent, sizeof kEvent - 1)) {
+      return false;
+    }
+    uint64_t code = 0;
+    const char* digits = p;
+    while (p != end && *p >= '0' && *p <= '9' && p - digits < 11) {
+      code = code * 10 + static_cast<uint64_t>(*p++ - '0');
+    }
+    if (p == digits || p - digits > 10 || code > UINT_MAX || !take(kPath, sizeof kPath - 1) ||
+        !string(line.path)) {
+      return false;
+    }
+    line.pathOld = std::string_view();
+    if (end - p == 2 && p[0] == '"' && p[1] == '}') {
+      // done
+    } else if (!take(kPathOld, sizeof kPathOld - 1) || !string(line.pathOld) || end - p != 2 ||
+               p[0] != '"' || p[1] != '}') {
+      return false;
+    }
+    line.isEvent = true;
+    line.event.event = static_cast<unsigned int>(code);
+    line.pathSize = line.path.size();
+    line.pathOldSize = line.pathOld.size();
+    return true;
+  }
+
+  static void Decoded(ReadLine& line) {
+    line.path = line.event.path;
+    line.pathOld = line.event.pathOld;
+  }
+
+  // Whether a line that is not plain may be a reindex event: its "event" must then be a number
+  // whose text holds "65536", or rounds up from "65535.", or has an exponent.
+  static bool MayBeReindex(const char* begin, const char* end) {
+    const auto at = [end](const char* q, const char* text, size_t size) {
+      return static_cast<size_t>(end - q) >= size && std::memcmp(q, text, size) == 0;
+    };
+    for (const char* q = begin;; ++q) {
+      q = static_cast<const char*>(std::memchr(q, '6', static_cast<size_t>(end - q)));
+      if (q == nullptr) {
+        break;
+      }
+      if (at(q, "65536", 5) || at(q, "65535.", 6)) {
+        return true;
+      }
+    }
+    // An exponent follows a digit or a point.
+    for (const char e : {'e', 'E'}) {
+      for (const char* q = begin + 1;; ++q) {
+        q = static_cast<const char*>(std::memchr(q, e, static_cast<size_t>(end - q)));
+        if (q == nullptr) {
+          break;
+        }
+        if (!((q[-1] >= '0' && q[-1] <= '9') || q[-1] == '.')) {
+          continue;
+        }
+        const char* next = q + 1;
+        if (next != end && (*next == '+' || *next == '-')) {
+          ++next;
+        }
+        if (next != end && *next >= '0' && *next <= '9') {
+          return true;
+        }
+      }
+    }
+    return false;
+  }
+
   void Classify(ReadLine& line, const char* begin, const char* end, size_t limit) {
+    if (Plain(line, begin, end)) {
+      return;
+    }
+    if (m_onlyReindex && !MayBeReindex(begin, end)) {
+      line.isEvent = false;
+      return;
+    }
     LineSource source(begin, end);
     switch (LineScanner(source, limit).Event(line.event, line.pathSize, line.pathOldSize)) {
       case LineVerdict::kEvent:
         line.isEvent = true;
+        Decoded(line);
         return;
       case LineVerdict::kNoEvent:
         line.isEvent = false;
@@ -720,6 +844,7 @@ class BlockReader {
     line.isEvent = ParseQueueLine(begin, static_cast<size_t>(end - begin), line.event);
     line.pathSize = line.event.path.size();
     line.pathOldSize = line.event.pathOld.size();
+    Decoded(line);
   }
 
   // A line longer than the block: scanned as it streams past, with its start kept for the log.
@@ -744,6 +869,7 @@ class BlockReader {
     line.stop = Offset(m_pos);
     line.text = m_logHead;
     line.isEvent = verdict == LineVerdict::kEvent;
+    Decoded(line);
     if (verdict == LineVerdict::kUnsure) {
       // The one case that needs the whole line at once: the parser reads it a second time.
       const off_t size = line.stop - line.start - (line.ended ? 1 : 0);
@@ -753,6 +879,7 @@ class BlockReader {
       if (line.isEvent) {
         line.pathSize = line.event.path.size();
         line.pathOldSize = line.event.pathOld.size();
+        Decoded(line);
       }
     }
   }
@@ -766,6 +893,7 @@ class BlockReader {
   size_t m_fill = 0;                 // how much of the buffer holds read bytes
   bool m_eof = false;
   bool m_lineEnded = false;
+  bool m_onlyReindex = false;
   std::string m_head;
   std::string m_logHead;
 };
@@ -934,6 +1062,16 @@ class FolderSet {
         continue;
       }
       m_byPath[path].push_back(i);
+      if (m_byPath.size() == 1) {
+        m_common = path;
+        m_minSize = path.size();
+      }
+      size_t same = 0;
+      while (same < m_common.size() && same < path.size() && m_common[same] == path[same]) {
+        ++same;
+      }
+      m_common.resize(same);
+      m_minSize = std::min(m_minSize, path.size());
       m_maxSize = std::max(m_maxSize, path.size());
       if (m_sizes.size() <= path.size()) {
         m_sizes.resize(path.size() + 1, false);
@@ -943,6 +1081,7 @@ class FolderSet {
     for (const size_t i : m_odd) {
       m_maxSize = std::max(m_maxSize, m_paths[i].size());
     }
+    m_sizes.resize(m_maxSize + 1, false);
   }
 
   // Bytes of an event's path that the test needs.
@@ -951,28 +1090,37 @@ class FolderSet {
 
   // Marks in `found` the folders that hold the path (its first `path.size()` bytes of
   // `fullSize`); returns how many of those marked anew are `asked`.
-  size_t Mark(const std::string& path, size_t fullSize, const std::vector<bool>& asked,
-              std::vector<bool>& found) const {
+  size_t Mark(std::string_view path, size_t fullSize, const std::vector<bool>& asked,
+              std::vector<bool>& found, std::vector<size_t>& marks) const {
     size_t marked = 0;
     const size_t upto = std::min(fullSize, m_maxSize);
-    for (size_t i = 0; i <= upto && i < m_sizes.size(); ++i) {
-      if (!m_sizes[i] || (i < fullSize && path[i] != '/')) {
-        continue;
-      }
-      const auto it = m_byPath.find(std::string_view(path.data(), i));
-      if (it == m_byPath.end()) {
-        continue;
-      }
-      for (const size_t f : it->second) {
-        if (!found[f]) {
-          found[f] = true;
-          marked += asked[f] ? 1 : 0;
+    // Every folder begins with the folders' common start; then only the ends of the path's
+    // components can be folders.
+    if (!m_byPath.empty() && fullSize >= m_minSize &&
+        path.compare(0, m_common.size(), m_common) == 0) {
+      for (size_t i = m_minSize; i <= upto;) {
+        const size_t slash = i < path.size() ? path.find('/', i) : std::string_view::npos;
+        const size_t end = slash != std::string_view::npos ? slash : fullSize;
+        if (end > upto) {
+          break;
         }
+        const auto it = m_sizes[end] ? m_byPath.find(path.substr(0, end)) : m_byPath.end();
+        if (it != m_byPath.end()) {
+          for (const size_t f : it->second) {
+            if (!found[f]) {
+              found[f] = true;
+              marks.push_back(f);
+              marked += asked[f] ? 1 : 0;
+            }
+          }
+        }
+        i = end + 1;
       }
     }
     for (const size_t f : m_odd) {
       if (!found[f] && HoldsOdd(m_paths[f], path, fullSize)) {
         found[f] = true;
+        marks.push_back(f);
         marked += asked[f] ? 1 : 0;
       }
     }
@@ -980,7 +1128,7 @@ class FolderSet {
   }
 
  private:
-  static bool HoldsOdd(const std::string& folder, const std::string& path, size_t fullSize) {
+  static bool HoldsOdd(const std::string& folder, std::string_view path, size_t fullSize) {
     if (folder.size() > fullSize) {
       return false;
     }
@@ -1001,6 +1149,8 @@ class FolderSet {
   std::unordered_map<std::string_view, std::vector<size_t>> m_byPath;
   std::vector<size_t> m_odd;
   std::vector<bool> m_sizes;
+  std::string m_common;  // what all folders without a NUL begin with
+  size_t m_minSize = 0;
   size_t m_maxSize = 0;
 };
 
@@ -1051,7 +1201,8 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
 
   const off_t from = subset ? entry.file.offset : 0;
   const off_t quietUpTo = have ? entry.logged : 0;
-  std::vector<bool> complete = wantedFound;  // as of the end of the last complete line
+  std::vector<size_t> marks;  // folders found in the line read last
+  bool lastEnded = true;
   off_t end = from;
   std::unique_ptr<BlockReader> reader;
   if (left > 0) {
@@ -1059,21 +1210,29 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
     reader = std::make_unique<BlockReader>(fd, from, options.blockSize);
     ReadLine line;
     while (left > 0 && reader->Next(line, set.Limit())) {
+      marks.clear();
       if (!line.isEvent) {
         if (line.stop > quietUpTo) {
           detail::WriteLog(false, kFolderUnit, __LINE__, "Malformed command: %.*s",
                            LogWidth(line.text.size()), line.text.data());
         }
       } else {
-        left -= set.Mark(line.event.path, line.pathSize, asked, wantedFound);
+        left -= set.Mark(line.path, line.pathSize, asked, wantedFound, marks);
         if (line.event.event == static_cast<unsigned int>(kEventMoved)) {
-          left -= set.Mark(line.event.pathOld, line.pathOldSize, asked, wantedFound);
+          left -= set.Mark(line.pathOld, line.pathOldSize, asked, wantedFound, marks);
         }
       }
+      lastEnded = line.ended;
       if (line.ended) {
         end = line.stop;
-        complete = wantedFound;
       }
+    }
+  }
+  // What a last line without "\n" found counts now, but is not remembered.
+  std::vector<bool> complete = wantedFound;
+  if (!lastEnded) {
+    for (const size_t f : marks) {
+      complete[f] = false;
     }
   }
   for (size_t i = 0; i < fullPaths.size(); ++i) {
@@ -1176,6 +1335,7 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile,
   bool keep = options.remember;
   const size_t limit = std::max(path.size() + 1, kRememberedPath);
   BlockReader reader(fd.get(), have ? entry.file.offset : 0, options.blockSize);
+  reader.OnlyReindexEvents();
   ReadLine line;
   bool queued = false;
   off_t end = have ? entry.file.offset : 0;
@@ -1186,7 +1346,7 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile,
       }
       continue;
     }
-    queued = line.pathSize == path.size() && line.event.path == path;
+    queued = line.pathSize == path.size() && line.path == path;
     if (!line.ended) {
       continue;
     }
@@ -1194,7 +1354,7 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile,
     if (keep) {
       keep = line.pathSize <= kRememberedPath && entry.paths.size() < kMaxRemembered;
       if (keep) {
-        entry.paths.insert(line.event.path);
+        entry.paths.emplace(line.path);
       }
     }
   }
