@@ -139,7 +139,7 @@ std::string MixedQueue(const std::string& volume, std::mt19937& rng, int count) 
   // Mostly what the writers use, then what the parser accepts or refuses in odd ways.
   const std::vector<std::string> codes = Split(
       "2 2 8 8 256 256 131072 65536 2 8 256 1 4 65536.0 01 +1 -1 null true 1e2 -0 4294967296 "
-      "4294967295 \"65536\" [256] 256.9 2.5",
+      "4294967295 \"65536\" [256] 256.9 2.5 6.5536e4 65535.99999999999999999 655.36E+2 6553.6e1",
       ' ');
   const std::vector<std::string> loose = Split(
       "not json||{}|[]|null|{\"\":1,}|\t|\xEF\xBB\xBF{}|{|\"x\"|\x01\x02|"

@@ -790,7 +790,7 @@ class BlockReader {
     const auto at = [end](const char* q, const char* text, size_t size) {
       return static_cast<size_t>(end - q) >= size && std::memcmp(q, text, size) == 0;
     };
-    for (const char* q = begin;; ++q) {
+    for (const char* q = begin; q < end; ++q) {
       q = static_cast<const char*>(std::memchr(q, '6', static_cast<size_t>(end - q)));
       if (q == nullptr) {
         break;
@@ -801,7 +801,7 @@ class BlockReader {
     }
     // An exponent follows a digit or a point.
     for (const char e : {'e', 'E'}) {
-      for (const char* q = begin + 1;; ++q) {
+      for (const char* q = begin + 1; q < end; ++q) {
         q = static_cast<const char*>(std::memchr(q, e, static_cast<size_t>(end - q)));
         if (q == nullptr) {
           break;
