@@ -639,7 +639,7 @@ class BlockReader {
     if (end - static_cast<off_t>(size) < m_base || end > Offset(m_fill)) {
       return false;
     }
-    const size_t at = static_cast<size_t>(end - m_base);
+    const auto at = static_cast<size_t>(end - m_base);
     hash = Hash(m_buffer.get() + at - size, size);
     return true;
   }
@@ -730,9 +730,9 @@ class BlockReader {
   // "path_old":"O"} with plain decimals and strings without a backslash, are taken straight from
   // the buffer; the parser reads them exactly so.
   static bool Plain(ReadLine& line, const char* p, const char* end) {
-    static constexpr char kEvent[] = "{\"event\":";
-    static constexpr char kPath[] = ",\"path\":\"";
-    static constexpr char kPathOld[] = "\",\"path_old\":\"";
+    static constexpr char kEvent[] = R"({"event":)";
+    static constexpr char kPath[] = R"(,"path":")";
+    static constexpr char kPathOld[] = R"(","path_old":")";
     const auto take = [&p, end](const char* text, size_t size) {
       if (static_cast<size_t>(end - p) < size || std::memcmp(p, text, size) != 0) {
         return false;
@@ -821,7 +821,7 @@ class BlockReader {
     return false;
   }
 
-  void Classify(ReadLine& line, const char* begin, const char* end, size_t limit) {
+  void Classify(ReadLine& line, const char* begin, const char* end, size_t limit) const {
     if (Plain(line, begin, end)) {
       return;
     }
@@ -874,7 +874,7 @@ class BlockReader {
       // The one case that needs the whole line at once: the parser reads it a second time.
       const off_t size = line.stop - line.start - (line.ended ? 1 : 0);
       std::string whole(static_cast<size_t>(size), '\0');
-      const ssize_t got = pread(m_fd, &whole[0], whole.size(), line.start);
+      const ssize_t got = pread(m_fd, whole.data(), whole.size(), line.start);
       line.isEvent = got == size && ParseQueueLine(whole.data(), whole.size(), line.event);
       if (line.isEvent) {
         line.pathSize = line.event.path.size();
