@@ -15,6 +15,7 @@
 #include <map>
 #include <memory>
 #include <mutex>
+#include <new>
 #include <string_view>
 #include <unordered_map>
 #include <unordered_set>
@@ -872,9 +873,24 @@ class BlockReader {
     Decoded(line);
     if (verdict == LineVerdict::kUnsure) {
       // The one case that needs the whole line at once: the parser reads it a second time.
-      const off_t size = line.stop - line.start - (line.ended ? 1 : 0);
-      std::string whole(static_cast<size_t>(size), '\0');
-      const ssize_t got = pread(m_fd, whole.data(), whole.size(), line.start);
+      // A line the process cannot hold counts as no event, as the parser could not hold it.
+      const auto size = static_cast<size_t>(line.stop - line.start - (line.ended ? 1 : 0));
+      std::string whole;
+      try {
+        whole.resize(size);
+      } catch (const std::bad_alloc&) {
+        line.isEvent = false;
+        return;
+      }
+      size_t got = 0;
+      while (got < size) {
+        const ssize_t n =
+            pread(m_fd, &whole[got], size - got, line.start + static_cast<off_t>(got));
+        if (n <= 0 && !(n < 0 && errno == EINTR)) {
+          break;
+        }
+        got += n > 0 ? static_cast<size_t>(n) : 0;
+      }
       line.isEvent = got == size && ParseQueueLine(whole.data(), whole.size(), line.event);
       if (line.isEvent) {
         line.pathSize = line.event.path.size();
