@@ -727,9 +727,9 @@ class BlockReader {
     }
   }
 
-  // The shapes the writers produce, {"event":N,"path":"P"} and {"event":N,"path":"P",
-  // "path_old":"O"} with plain decimals and strings without a backslash, are taken straight from
-  // the buffer; the parser reads them exactly so.
+  // The shapes the writers produce most, {"event":N,"path":"P"}, {"event":N,"path":"P",
+  // "path_old":"O"} and {"data":null,"event":N,"path":"P"}, with plain decimals and strings
+  // without a backslash, are taken straight from the buffer; the parser reads them exactly so.
   static bool Plain(ReadLine& line, const char* p, const char* end) {
     static constexpr char kEvent[] = R"({"event":)";
     static constexpr char kPath[] = R"(,"path":")";
@@ -754,7 +754,9 @@ class BlockReader {
       p += size;
       return true;
     };
-    if (!take(kEvent, sizeof kEvent - 1)) {
+    // The library's own reindex events carry a null "data" first.
+    static constexpr char kNullData[] = R"({"data":null,"event":)";
+    if (!take(kEvent, sizeof kEvent - 1) && !take(kNullData, sizeof kNullData - 1)) {
       return false;
     }
     uint64_t code = 0;
