@@ -824,7 +824,35 @@ class BlockReader {
     return false;
   }
 
+  // Whether a line surely is no reindex event because it begins as a plain line with another
+  // code: valid or not, it cannot be one.
+  static bool OtherCode(const char* p, const char* end) {
+    static constexpr char kEvent[] = R"({"event":)";
+    static constexpr char kNullData[] = R"({"data":null,"event":)";
+    const auto take = [&p, end](const char* text, size_t size) {
+      if (static_cast<size_t>(end - p) < size || std::memcmp(p, text, size) != 0) {
+        return false;
+      }
+      p += size;
+      return true;
+    };
+    if (!take(kEvent, sizeof kEvent - 1) && !take(kNullData, sizeof kNullData - 1)) {
+      return false;
+    }
+    uint64_t code = 0;
+    const char* digits = p;
+    while (p != end && *p >= '0' && *p <= '9' && p - digits < 11) {
+      code = code * 10 + static_cast<uint64_t>(*p++ - '0');
+    }
+    return p != digits && p - digits <= 10 && p != end && (*p == ',' || *p == '}') &&
+           code != static_cast<uint64_t>(kEventReindex);
+  }
+
   void Classify(ReadLine& line, const char* begin, const char* end, size_t limit) const {
+    if (m_onlyReindex && OtherCode(begin, end)) {
+      line.isEvent = false;
+      return;
+    }
     if (Plain(line, begin, end)) {
       return;
     }
