@@ -6,14 +6,17 @@
 //
 //   build/bench/fileindex_bench --benchmark_filter=Queue
 #include <benchmark/benchmark.h>
+#include <fcntl.h>
 #include <ftw.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cstdio>
 #include <cstdlib>
 #include <fstream>
 #include <random>
 #include <string>
+#include <vector>
 
 #include "fake_platform.h"
 #include "utils/log.h"
@@ -95,6 +98,7 @@ void BM_QueueReindexNoMatch(benchmark::State& state) {
   const Queue& queue = Queue::Get();
   const std::string path = queue.Volume() + "/photo/2015/Album 7 - holidays and family";
   for (auto _ : state) {
+    WEZO::FILEINDEX::detail::ForgetQueueScans();  // a cold read each time
     benchmark::DoNotOptimize(IsReindexQueued(path, queue.Path()));
   }
 }
@@ -103,6 +107,7 @@ BENCHMARK(BM_QueueReindexNoMatch)->Unit(benchmark::kMillisecond);
 void BM_QueueFolderNoMatch(benchmark::State& state) {
   const Queue& queue = Queue::Get();
   for (auto _ : state) {
+    WEZO::FILEINDEX::detail::ForgetQueueScans();  // a cold read each time
     benchmark::DoNotOptimize(QueueHasFolderEvent("/photo/none", queue.Path()));
   }
 }
@@ -111,10 +116,24 @@ BENCHMARK(BM_QueueFolderNoMatch)->Unit(benchmark::kMillisecond);
 void BM_QueueFolderFewMatches(benchmark::State& state) {
   const Queue& queue = Queue::Get();
   for (auto _ : state) {
+    WEZO::FILEINDEX::detail::ForgetQueueScans();  // a cold read each time
     benchmark::DoNotOptimize(QueueHasFolderEvent("/photo/rare", queue.Path()));
   }
 }
 BENCHMARK(BM_QueueFolderFewMatches)->Unit(benchmark::kMillisecond);
+
+// The floor: the queue read in 1 MiB blocks, nothing done with the bytes.
+void BM_QueueRawRead(benchmark::State& state) {
+  const Queue& queue = Queue::Get();
+  std::vector<char> block(size_t{1} << 20);
+  for (auto _ : state) {
+    const int fd = open(queue.Path().c_str(), O_RDONLY | O_CLOEXEC);
+    while (read(fd, block.data(), block.size()) > 0) {
+    }
+    close(fd);
+  }
+}
+BENCHMARK(BM_QueueRawRead)->Unit(benchmark::kMillisecond);
 
 // The readers' definition, line by line: what the block readers are measured against.
 void BM_QueueParseEveryLine(benchmark::State& state) {

@@ -1,10 +1,12 @@
 // The queue readers against a reader that parses every line.
 //
-// Input: one byte choosing the read block size, then a line with the full path asked about
-// ("/volume1/photo/a"), then the queue file's content. The folder asked about is the same
-// location as a share path. Both readers must answer exactly as the reference below, the folder
-// reader must log each malformed line once, and the quick scan of a line must never claim an
-// event the parser does not give.
+// Input: one byte choosing the read block size and where the queue is cut in two, then a line
+// with the full path asked about ("/volume1/photo/a"), then the queue file's content. The folder
+// asked about is the same location as a share path. Both readers must answer exactly as the
+// reference below, read plainly and through what the process remembers, with the file's second
+// part appended between two questions; the folder reader must log each malformed line it reads
+// once and stop at the first event in the folder; the scanner must never answer otherwise than
+// the parser.
 #include <json/value.h>
 
 #include <cstddef>
@@ -66,17 +68,17 @@ bool Inside(const std::string& path, const std::string& folder) {
 }
 
 void CheckScanAgreesWithParse(const std::string& line) {
-  WEZO::FILEINDEX::detail::ScannedEvent scanned;
-  if (!WEZO::FILEINDEX::detail::ScanQueueLine(line.data(), line.size(), scanned)) {
+  QueueEvent scanned;
+  const auto verdict = WEZO::FILEINDEX::detail::ScanQueueLine(line.data(), line.size(), scanned);
+  if (verdict == WEZO::FILEINDEX::detail::LineVerdict::kUnsure) {
     return;
   }
   QueueEvent parsed;
-  if (!WEZO::FILEINDEX::ParseQueueLine(line.data(), line.size(), parsed) ||
-      scanned.event != parsed.event || std::string(scanned.path, scanned.pathSize) != parsed.path ||
-      (scanned.pathOld == nullptr
-           ? std::string()
-           : std::string(scanned.pathOld, scanned.pathOldSize)) != parsed.pathOld) {
-    fuzzsupport::Fail("the quick scan and the parser disagree on: " + line);
+  const bool isEvent = WEZO::FILEINDEX::ParseQueueLine(line.data(), line.size(), parsed);
+  if (isEvent != (verdict == WEZO::FILEINDEX::detail::LineVerdict::kEvent) ||
+      (isEvent && (scanned.event != parsed.event || scanned.path != parsed.path ||
+                   scanned.pathOld != parsed.pathOld))) {
+    fuzzsupport::Fail("the scanner and the parser disagree on: " + line);
   }
 }
 
@@ -89,12 +91,13 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const std::string& root = fuzzsupport::Root();
   fuzzsupport::ResetPlatform(kVolume);
   const size_t blockSize = data[0] == 0xFF ? size_t{1} << 20 : size_t{1} + data[0] % 64;
+  const WEZO::FILEINDEX::detail::ReadOptions plain{blockSize, false};
   const std::string rest(reinterpret_cast<const char*>(data) + 1, size - 1);
   const size_t newline = rest.find('\n');
   const std::string fullPath = rest.substr(0, newline);
   const std::string content = newline == std::string::npos ? "" : rest.substr(newline + 1);
+  const size_t cut = content.size() * (data[0] % 5) / 4;
   const std::string queue = root + "/queue";
-  fuzzsupport::WriteBytes(queue, reinterpret_cast<const uint8_t*>(content.data()), content.size());
 
   // The folder reader's share path for the same location; a path outside the volume has none.
   const bool onVolume = fullPath.rfind(std::string(kVolume) + "/", 0) == 0;
@@ -104,12 +107,12 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
 
   bool reindexQueued = false;
   bool folderEvent = false;
-  size_t malformed = 0;
+  size_t malformed = 0;  // up to the first event in the folder
   for (const std::string& line : SplitLines(content)) {
     CheckScanAgreesWithParse(line);
     QueueEvent event;
     if (!ReferenceParse(line, event)) {
-      ++malformed;
+      malformed += folderEvent ? 0 : 1;
       continue;
     }
     reindexQueued =
@@ -120,20 +123,36 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
                    Inside(event.pathOld, folderFull));
   }
 
-  if (WEZO::FILEINDEX::detail::IsReindexQueued(fullPath, queue, blockSize) != reindexQueued) {
+  // Through what the process remembers: asked once with the first part only, then again.
+  WEZO::FILEINDEX::detail::ForgetQueueScans();
+  fuzzsupport::WriteBytes(queue, reinterpret_cast<const uint8_t*>(content.data()), cut);
+  std::vector<bool> found;
+  (void)WEZO::FILEINDEX::IsReindexQueued(fullPath, queue);
+  (void)WEZO::FILEINDEX::QueueFoldersWithEvents({folderFull}, queue, found);
+  fuzzsupport::WriteBytes(queue, reinterpret_cast<const uint8_t*>(content.data()), content.size());
+  if (WEZO::FILEINDEX::IsReindexQueued(fullPath, queue) != reindexQueued) {
+    fuzzsupport::Fail("IsReindexQueued, remembering, answered " + std::to_string(!reindexQueued));
+  }
+  WEZO::FILEINDEX::QueueFoldersWithEvents({folderFull}, queue, found);
+  if (resolvable && found[0] != folderEvent) {
+    fuzzsupport::Fail("QueueFoldersWithEvents, remembering, answered " + std::to_string(found[0]));
+  }
+
+  if (WEZO::FILEINDEX::detail::IsReindexQueued(fullPath, queue, plain) != reindexQueued) {
     fuzzsupport::Fail("IsReindexQueued answered " + std::to_string(!reindexQueued));
   }
   (void)fuzzsupport::TakeMalformedLineCount();
-  const bool answer = WEZO::FILEINDEX::detail::QueueHasFolderEvent(folder, queue, blockSize);
-  const size_t logged = fuzzsupport::TakeMalformedLineCount();
   if (!resolvable) {
-    if (answer || logged != 0) {
+    if (WEZO::FILEINDEX::QueueHasFolderEvent(folder, queue) ||
+        fuzzsupport::TakeMalformedLineCount() != 0) {
       fuzzsupport::Fail("QueueHasFolderEvent read the queue of a folder it cannot place");
     }
     return 0;
   }
-  if (answer != folderEvent) {
-    fuzzsupport::Fail("QueueHasFolderEvent answered " + std::to_string(answer));
+  WEZO::FILEINDEX::detail::QueueFoldersWithEvents({folderFull}, queue, found, plain);
+  const size_t logged = fuzzsupport::TakeMalformedLineCount();
+  if (found[0] != folderEvent) {
+    fuzzsupport::Fail("QueueFoldersWithEvents answered " + std::to_string(found[0]));
   }
   if (logged != malformed) {
     fuzzsupport::Fail("logged " + std::to_string(logged) + " malformed lines of " +

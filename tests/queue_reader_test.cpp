@@ -5,6 +5,8 @@
 #include <sys/stat.h>
 
 #include <algorithm>
+#include <fstream>
+#include <functional>
 #include <random>
 #include <sstream>
 
@@ -22,12 +24,6 @@ std::string Ev(const std::string& code, const std::string& path, const std::stri
   return R"({"event":)" + code + R"(,"path":")" + path + '"' + rest + "}";
 }
 
-std::string EscapeSlashes(const std::string& path) {
-  std::string out;
-  for (const char c : path) out += c == '/' ? "\\/"s : std::string(1, c);
-  return out;
-}
-
 // "<event> <path> <path_old>" as the parser, or the quick scan, reads the line; "none" for no
 // event, "unsure" when the scan gives up.
 std::string Parsed(const std::string& line) {
@@ -37,11 +33,22 @@ std::string Parsed(const std::string& line) {
              : "none";
 }
 std::string Scanned(const std::string& line) {
-  detail::ScannedEvent e;
-  return detail::ScanQueueLine(line.data(), line.size(), e)
-             ? std::to_string(e.event) + " " + std::string(e.path, e.pathSize) + " " +
-                   (e.pathOld == nullptr ? "" : std::string(e.pathOld, e.pathOldSize))
-             : "unsure";
+  QueueEvent e;
+  switch (detail::ScanQueueLine(line.data(), line.size(), e)) {
+    case detail::LineVerdict::kEvent:
+      return std::to_string(e.event) + " " + e.path + " " + e.pathOld;
+    case detail::LineVerdict::kNoEvent:
+      return "none";
+    case detail::LineVerdict::kUnsure:
+      break;
+  }
+  return "unsure";
+}
+
+const detail::ReadOptions kPlain{size_t{1} << 20, false};
+
+void Append(const std::string& path, const std::string& text) {
+  std::ofstream(path, std::ios::app | std::ios::binary) << text;
 }
 
 class QueueReaderTest : public testsupport::LibraryTest {
@@ -56,7 +63,7 @@ class QueueReaderTest : public testsupport::LibraryTest {
 TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
   const struct {
     std::string line;
-    const char* event;
+    std::string event;
     bool quick;  // what the writers produce must not need the parser
   } cases[] = {{R"({"event":2,"path":"/p"})", "2 /p ", true},
                {R"( {"path_old":"/o", "path":"/p","event":256 } )", "256 /p /o", true},
@@ -68,7 +75,22 @@ TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
                {R"({"event":1.5,"path":"/p"})", "1 /p ", false},
                {R"({"event":true,"path":"/p"})", "1 /p ", false},
                {"{\"event\":2,\"path\":\"/p\"}\0 x"s, "2 /p ", false},
-               {R"({"event":2,"path":"/caf\u00e9\/x"})", "2 /caf\xC3\xA9/x ", false},
+               {R"({"event":2,"path":"/caf\u00e9\/x\"\\\b\f\n\r\t"})",
+                "2 /caf\xC3\xA9/x\"\\\b\f\n\r\t ", true},
+               {R"({"event":2,"path":"\uD83D\uDE00\uD800\u0041\uDC00\u0000"})",
+                "2 \xF0\x9F\x98\x80\xF0\x90\x81\x81\xED\xB0\x80\0 "s, true},
+               {"{\"event\":2,\"path\":\"\x01\t\xFF\"}", "2 \x01\t\xFF ", true},
+               {R"({"ev\u0065nt":2,"pa\u0074h":"/p","path_ol\u0064":"/o"})", "2 /p /o", true},
+               {R"({"event":2,"path":"\uD800"})", "none", true},
+               {R"({"event":2,"path":"\uD800\n"})", "none", true},
+               {R"({"event":2,"path":"\uD800\uDC0"})", "none", true},
+               {R"({"event":2,"path":"\u12G4"})", "none", true},
+               {R"({"event":2,"path":"\x"})", "none", true},
+               {R"({"event":2,"path":"/p\)", "none", true},
+               {R"({"event":2,"path":"/p","data":{"a":[1,2)", "none", true},
+               {R"({"event":2,"path":"/p","pa\u0074h":"/q"})", "none", false},
+               {R"({"event":2,"path":"/p","data":nul)", "none", true},
+               {R"({"event":2,"path":"/p"} {})", "none", false},
                {R"({"event":4294967296,"path":"/p"})", "none", false},
                {R"({"event":2,"path":3})", "none", false},
                {R"({"event":2})", "none", false},
@@ -110,22 +132,44 @@ std::string MixedQueue(const std::string& volume, std::mt19937& rng, int count) 
   for (const std::string& p :
        {"/photo/a"s, "/photo/a/"s, "/photo/a/x.jpg"s, "/photo/a/b/c"s, "/photo/ab"s, "/photo/ab/x"s,
         "/photo"s, "/video/a"s, "/video/a/b"s, "/photo/a\x01\xFF/x"s, "/photo/caf\xC3\xA9"s,
-        "/photo/caf\xC3\xA9/x"s, "/photo/a\0b/x"s, "/photo/cafe\xCC\x81"s}) {
+        "/photo/caf\xC3\xA9/x"s, "/photo/a\0b/x"s, "/photo/cafe\xCC\x81"s, "/photo/q\"\\/x"s,
+        "/photo/\xF0\x9F\x98\x80/x"s, "/photo/a/" + std::string(300, 'l')}) {
     paths.push_back(volume + p);
   }
   // Mostly what the writers use, then what the parser accepts or refuses in odd ways.
   const std::vector<std::string> codes = Split(
       "2 2 8 8 256 256 131072 65536 2 8 256 1 4 65536.0 01 +1 -1 null true 1e2 -0 4294967296 "
-      "4294967295 \"65536\" [256] 256.9 2.5",
+      "4294967295 \"65536\" [256] 256.9 2.5 6.5536e4 65535.99999999999999999 655.36E+2 6553.6e1",
       ' ');
   const std::vector<std::string> loose = Split(
       "not json||{}|[]|null|{\"\":1,}|\t|\xEF\xBB\xBF{}|{|\"x\"|\x01\x02|"
       "{\"event\":2,\"path\":\"/x\"}/**/|{\"event\":2,/*quirk*/\"path\":\"/v\"}",
       '|');
+  // As the writers put a path in a line, or with any character escaped.
   const auto render = [&](const std::string& path) {
-    std::string out = rng() % 6 == 0 ? EscapeSlashes(path) : path;
-    const size_t at = out.find("caf\xC3\xA9");
-    return at == std::string::npos || rng() % 2 == 0 ? out : out.replace(at, 5, "caf\\u00e9");
+    std::string out;
+    const bool escapeMore = rng() % 3 == 0;
+    for (size_t i = 0; i < path.size(); ++i) {
+      const auto c = static_cast<unsigned char>(path[i]);
+      char hex[8];
+      snprintf(hex, sizeof hex, "\\u%04x", c);
+      if (path.compare(i, 4, "\xF0\x9F\x98\x80") == 0 && escapeMore) {
+        out += "\\uD83D\\uDE00";
+        i += 3;
+      } else if (path.compare(i, 2, "\xC3\xA9") == 0 && escapeMore) {
+        out += "\\u00E9";
+        ++i;
+      } else if (c == '"' || c == '\\') {
+        out += '\\' + std::string(1, static_cast<char>(c));
+      } else if (c == '/' && escapeMore) {
+        out += "\\/";
+      } else if (c < 0x80 && escapeMore && rng() % 8 == 0) {
+        out += hex;
+      } else {
+        out += static_cast<char>(c);
+      }
+    }
+    return out;
   };
   const auto data = [&]() -> std::string {
     const std::string& p = pick(paths);
@@ -141,7 +185,7 @@ std::string MixedQueue(const std::string& volume, std::mt19937& rng, int count) 
       {",", R"(,"data":1,"data":2)", R"(,"":1,)", " ", "\f", R"(,"data":tru)", R"(,"data":[1,])",
        R"(,"data":1.)", R"(,"data":-)", R"(,"data":{"a":1,"a":2})"},
       {"\xEF\xBB\xBF"},
-      {"\xFF", "\x01", "\0"s, "\\", "\"", "}"}};
+      {"\xFF", "\x01", "\0"s, "\\", "\"", "}", "\\u12", "\\uD800", "\\q"}};
   std::string text;
   for (int i = 0; i < count; ++i) {
     std::string line = "{";
@@ -177,48 +221,144 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
   int answers[2] = {0, 0};
   for (int round = 0; round < 40; ++round) {
     // Short queues give "no" answers, long ones "yes"; the first is empty.
+    detail::ForgetQueueScans();
     const std::string text = MixedQueue(volume, rng, round == 0 ? 0 : round % 2 == 0 ? 6 : 100);
     Queue(text);
-    std::vector<QueueEvent> events;
-    std::vector<std::string> malformed;
     std::vector<std::string> lines = Split(text, '\n');
     if (lines.back().empty()) lines.pop_back();  // no line after the last "\n"
-    for (const std::string& line : lines) {
+    std::vector<QueueEvent> events(lines.size());
+    std::vector<bool> isEvent(lines.size());
+    for (size_t i = 0; i < lines.size(); ++i) {
       // The quick scan may give up on any line, but never answers otherwise than the parser.
-      const std::string scanned = Scanned(line);
-      EXPECT_TRUE(scanned == "unsure" || scanned == Parsed(line)) << line;
-      QueueEvent event;
-      if (ParseQueueLine(line.data(), line.size(), event)) {
-        events.push_back(event);
-      } else {  // the log line ends where the line has a NUL byte
-        malformed.push_back("status_mgr:N Malformed command: " + line.substr(0, line.find('\0')));
-      }
+      const std::string scanned = Scanned(lines[i]);
+      EXPECT_TRUE(scanned == "unsure" || scanned == Parsed(lines[i])) << lines[i];
+      isEvent[i] = ParseQueueLine(lines[i].data(), lines[i].size(), events[i]);
     }
+    std::vector<std::string> folders;
+    std::vector<bool> inFolders;
+    size_t lastNeeded = 0;  // a read for all folders ends after this line
     for (const std::string& relative :
          {"/photo/a"s, "/photo/a/"s, "/photo/a/x.jpg"s, "/photo/a/b/c"s, "/photo/ab"s, "/photo"s,
-          "/photo/caf\xC3\xA9"s, "/video/a"s, "/video/a/b"s, "/photo/a\x01\xFF"s, "/photo/a\0c"s}) {
+          "/photo/caf\xC3\xA9"s, "/video/a"s, "/video/a/b"s, "/photo/a\x01\xFF"s, "/photo/a\0c"s,
+          "/photo/q\"\\"s, "/photo/\xF0\x9F\x98\x80"s, "/photo/a/" + std::string(300, 'l')}) {
       const std::string path = volume + relative;
       bool reindex = false;
-      bool inFolder = false;
-      for (const QueueEvent& event : events) {
-        reindex = reindex || (event.event == 65536 && event.path == path);
-        inFolder = inFolder || StringStartWith(event.path + "/", path + "/") ||
-                   (event.event == 256 && StringStartWith(event.pathOld + "/", path + "/"));
+      size_t first = lines.size();
+      for (size_t i = 0; i < lines.size(); ++i) {
+        const QueueEvent& event = events[i];
+        reindex = reindex || (isEvent[i] && event.event == 65536 && event.path == path);
+        if (first == lines.size() && isEvent[i] &&
+            (StringStartWith(event.path + "/", path + "/") ||
+             (event.event == 256 && StringStartWith(event.pathOld + "/", path + "/")))) {
+          first = i;
+        }
       }
+      const bool inFolder = first < lines.size();
+      lastNeeded = std::max(lastNeeded, inFolder ? first : lines.size());
       ++answers[reindex];
       ++answers[inFolder];
-      for (const size_t blockSize : {size_t{1} << 20, size_t{61}, size_t{1}}) {
+      folders.push_back(path);
+      inFolders.push_back(inFolder);
+      for (const size_t blockSize : {size_t{1} << 20, size_t{61}, size_t{7}, size_t{1}}) {
         SCOPED_TRACE(std::to_string(round) + " " + relative + " / " + std::to_string(blockSize));
-        EXPECT_EQ(detail::IsReindexQueued(path, queue, blockSize), reindex);
-        log.Clear();
-        EXPECT_EQ(detail::QueueHasFolderEvent(relative, queue, blockSize), inFolder);
-        EXPECT_EQ(log.Lines(), malformed);
+        EXPECT_EQ(detail::IsReindexQueued(path, queue, {blockSize, false}), reindex);
+      }
+      // What the process remembers answers the same, whatever was asked before.
+      EXPECT_EQ(IsReindexQueued(path, queue), reindex);
+    }
+    std::vector<std::string> malformed;  // the log line ends where the line has a NUL byte
+    for (size_t i = 0; i < lines.size() && i <= lastNeeded; ++i) {
+      if (!isEvent[i]) {
+        malformed.push_back("status_mgr:N Malformed command: " +
+                            lines[i].substr(0, lines[i].find('\0')));
       }
     }
+    // All folders in one read, wherever blocks end; each malformed line read is logged once.
+    for (const size_t blockSize : {size_t{1} << 20, size_t{61}, size_t{7}, size_t{1}}) {
+      SCOPED_TRACE(std::to_string(round) + " / " + std::to_string(blockSize));
+      log.Clear();
+      std::vector<bool> found;
+      detail::QueueFoldersWithEvents(folders, queue, found, {blockSize, false});
+      EXPECT_EQ(found, inFolders);
+      EXPECT_EQ(log.Lines(), malformed);
+    }
+    // One folder at a time, then all again, through what the process remembers: a line is
+    // logged the first time the process reads it (a last line without "\n" every time).
+    detail::ForgetQueueScans();
+    Queue(text.empty() ? text : text + "\n");
+    log.Clear();
+    for (int pass = 0; pass < 2; ++pass) {
+      for (size_t i = 0; i < folders.size(); ++i) {
+        std::vector<bool> found;
+        QueueFoldersWithEvents({folders[i]}, queue, found);
+        EXPECT_EQ(found[0], inFolders[i]) << folders[i];
+      }
+    }
+    EXPECT_EQ(log.Lines(), malformed);
   }
   // Both answers come up often, or the comparison would prove little.
   EXPECT_GT(answers[0], 200);
   EXPECT_GT(answers[1], 200);
+}
+
+// The process reads only what was appended to the same file; a queue that the daemon replaced or
+// truncated and wrote again, at the same size too, is read again from its start.
+TEST_F(QueueReaderTest, RemembersWhatItReadOnlyWhileTheQueueIsTheSameFileWithTheSameBytes) {
+  const std::string a = volume + "/photo/a";
+  const std::string b = volume + "/photo/b";
+  const auto line = [](const char* code, const std::string& path) { return Ev(code, path) + "\n"; };
+  const auto rewrite = [this](const std::string& text) {  // same inode
+    FILE* f = fopen(queue.c_str(), "r+");
+    ASSERT_NE(f, nullptr);
+    ASSERT_EQ(ftruncate(fileno(f), 0), 0);
+    fputs(text.c_str(), f);
+    fclose(f);
+  };
+  const auto replace = [this](const std::string& text) {  // a new inode renamed over it
+    testsupport::WriteFile(queue + ".new", text);
+    ASSERT_EQ(rename((queue + ".new").c_str(), queue.c_str()), 0);
+  };
+  const std::string start = line("65536", a) + "junk\n" + line("2", b + "/x");
+  const std::string swapped = line("65536", b) + "knuj\n" + line("2", a + "/x");
+  const struct {
+    std::function<void()> change;
+    const char* logged;  // what a read through the memory logs, "" for nothing
+  } steps[] = {
+      {[&] { Queue(start); }, "junk"},
+      {[&] { Append(queue, line("2", a + "/y")); }, ""},
+      {[&] { Append(queue, "{\"event\":65536,\"path\":\"" + b); }, ""},
+      // Every folder has an event: nothing more is read.
+      {[&] { Append(queue, "\"}\n" + std::string("tail\n")); }, ""},
+      {[&] {
+         rewrite(swapped + line("2", b + "/y") + "{\"event\":65536,\"path\":\"" + a +
+                 "\"}\nliat\n");
+       },
+       "liat"},
+      {[&] {
+         replace(start + line("2", a + "/y") + "{\"event\":65536,\"path\":\"" + b + "\"}\ntail\n");
+       },
+       "junk"},
+      {[&] { rewrite(line("2", b + "/z")); }, ""},
+      {[&] { rewrite(""); }, ""},
+  };
+  for (size_t s = 0; s < std::size(steps); ++s) {
+    SCOPED_TRACE(s);
+    steps[s].change();
+    const std::vector<std::string> folders = {a, b, b + "/x", a + "/y", volume + "/photo"};
+    std::vector<bool> plain;
+    std::vector<bool> remembered;
+    detail::QueueFoldersWithEvents(folders, queue, plain, kPlain);
+    log.Clear();
+    QueueFoldersWithEvents(folders, queue, remembered);
+    EXPECT_EQ(remembered, plain);
+    const std::vector<std::string> logged = log.Lines();
+    EXPECT_EQ(
+        logged.empty() ? "" : logged.back(),
+        *steps[s].logged == '\0' ? "" : "status_mgr:N Malformed command: "s + steps[s].logged);
+    for (const std::string& path : folders) {
+      EXPECT_EQ(IsReindexQueued(path, queue), detail::IsReindexQueued(path, queue, kPlain)) << path;
+    }
+  }
 }
 
 }  // namespace

@@ -2,6 +2,7 @@
 
 #include "fileindex/folder.h"
 
+#include "config/folder_additional.h"
 #include "fileindex/eligibility.h"
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
@@ -11,6 +12,47 @@
 
 namespace WEZO {
 namespace FILEINDEX {
+namespace {
+
+bool AdditionalOf(const Folder& folder, Json::Value& out, const std::string& name,
+                  const KnownAdditional& known) {
+  if (name == "is_valid") {
+    out = known.isValid != nullptr ? *known.isValid : CanPathBeIndexed(folder.GetPath());
+    return true;
+  }
+  if (name == "status") {
+    out = known.status != nullptr ? *known.status : FoldersProgress({folder.GetPath()}).front();
+    return true;
+  }
+  FILEINDEX_LOG("Unknown additional: %s", name.c_str());
+  ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
+  return false;
+}
+
+bool AdditionalsOf(const Folder& folder, Json::Value& out, const Json::Value& names,
+                   const KnownAdditional& known) {
+  out = Json::Value(Json::objectValue);
+  if (!names.isArray()) {
+    FILEINDEX_LOG("Bad param: %s", JsonToString(names).c_str());
+    ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
+    return false;
+  }
+  for (const Json::Value& element : names) {
+    if (!element.isString()) {
+      FILEINDEX_LOG("Bad param: %s", JsonToString(element).c_str());
+      ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
+      return false;
+    }
+    const std::string name = element.asString();
+    // A name that fails keeps its member, as null, so the caller sees what was asked.
+    if (!AdditionalOf(folder, out[name], name, known)) {
+      FILEINDEX_LOG("Failed to get additional: %s", name.c_str());
+    }
+  }
+  return true;
+}
+
+}  // namespace
 
 bool Folder::Load(const std::string& path, const Json::Value& obj) {
   m_path = path;
@@ -57,11 +99,7 @@ Json::Value Folder::asJson() const {
 }
 
 Json::Value Folder::asJson(const Json::Value& additional) const {
-  Json::Value obj = asJson();
-  if (!GetAdditional(obj["additional"], additional)) {
-    FILEINDEX_LOG("GetAdditional failed");
-  }
-  return obj;
+  return FolderJsonWith(*this, additional, KnownAdditional());
 }
 
 bool Folder::AddToJson(Json::Value& obj) const {
@@ -73,39 +111,20 @@ bool Folder::AddToJson(Json::Value& obj) const {
 }
 
 bool Folder::GetAdditional(Json::Value& out, const std::string& name) const {
-  if (name == "is_valid") {
-    out = CanPathBeIndexed(m_path);
-    return true;
-  }
-  if (name == "status") {
-    out = FolderProgress(m_path);
-    return true;
-  }
-  FILEINDEX_LOG("Unknown additional: %s", name.c_str());
-  ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
-  return false;
+  return AdditionalOf(*this, out, name, KnownAdditional());
 }
 
 bool Folder::GetAdditional(Json::Value& out, const Json::Value& names) const {
-  out = Json::Value(Json::objectValue);
-  if (!names.isArray()) {
-    FILEINDEX_LOG("Bad param: %s", JsonToString(names).c_str());
-    ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
-    return false;
+  return AdditionalsOf(*this, out, names, KnownAdditional());
+}
+
+Json::Value FolderJsonWith(const Folder& folder, const Json::Value& names,
+                           const KnownAdditional& known) {
+  Json::Value obj = folder.asJson();
+  if (!AdditionalsOf(folder, obj["additional"], names, known)) {
+    FILEINDEX_LOG("GetAdditional failed");
   }
-  for (const Json::Value& element : names) {
-    if (!element.isString()) {
-      FILEINDEX_LOG("Bad param: %s", JsonToString(element).c_str());
-      ErrorHandler::SetError(FILEINDEX_ERR_BAD_PARAM);
-      return false;
-    }
-    const std::string name = element.asString();
-    // A name that fails keeps its member, as null, so the caller sees what was asked.
-    if (!GetAdditional(out[name], name)) {
-      FILEINDEX_LOG("Failed to get additional: %s", name.c_str());
-    }
-  }
-  return true;
+  return obj;
 }
 
 }  // namespace FILEINDEX

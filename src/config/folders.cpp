@@ -9,10 +9,13 @@
 #include <utility>
 #include <vector>
 
+#include "config/folder_additional.h"
+#include "fileindex/eligibility.h"
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
 #include "paths.h"
+#include "status_mgr/progress.h"
 #include "utils/log.h"
 
 namespace WEZO {
@@ -162,17 +165,51 @@ bool Folders::List(Json::Value& out, unsigned long offset, unsigned long limit,
   const std::vector<const Folder*> sorted = SortedFolders(folders, OrderBy(sort_by));
 
   const size_t count = offset >= total ? 0 : std::min<size_t>(total - offset, limit);
+  // A descending page is the start of the ascending order, reversed, whatever the offset; the
+  // management interface has always paged this way.
+  std::vector<const Folder*> onPage;
+  onPage.reserve(count);
+  for (size_t i = 0; i < count; ++i) {
+    onPage.push_back(sort_direction == "DESC" ? sorted[count - 1 - i] : sorted[offset + i]);
+  }
+
+  // The page's additional values in one pass: the names asked for before any that is not a
+  // string, as each folder goes through them.
+  bool wantStatus = false;
+  bool wantValid = false;
+  if (additional.isArray()) {
+    for (const Json::Value& name : additional) {
+      if (!name.isString()) {
+        break;
+      }
+      wantStatus = wantStatus || name.asString() == "status";
+      wantValid = wantValid || name.asString() == "is_valid";
+    }
+  }
+  std::vector<bool> valid;
+  std::vector<std::string> states;
+  std::vector<std::string> paths;
+  for (const Folder* folder : onPage) {
+    paths.push_back(folder->GetPath());
+    if (wantValid) {
+      valid.push_back(CanPathBeIndexed(folder->GetPath()));
+    }
+  }
+  if (wantStatus) {
+    states = FoldersProgress(paths, wantValid ? &valid : nullptr);
+  }
+
   Json::Value page(Json::arrayValue);
-  if (sort_direction == "DESC") {
-    // A descending page is the start of the ascending order, reversed, whatever the offset; the
-    // management interface has always paged this way.
-    for (size_t i = count; i > 0; --i) {
-      page.append(sorted[i - 1]->asJson(additional));
+  for (size_t i = 0; i < onPage.size(); ++i) {
+    KnownAdditional known;
+    const bool isValid = wantValid && valid[i];
+    if (wantValid) {
+      known.isValid = &isValid;
     }
-  } else {
-    for (size_t i = 0; i < count; ++i) {
-      page.append(sorted[offset + i]->asJson(additional));
+    if (wantStatus) {
+      known.status = &states[i];
     }
+    page.append(FolderJsonWith(*onPage[i], additional, known));
   }
   out["folder"] = std::move(page);
   return true;

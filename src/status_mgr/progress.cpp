@@ -4,6 +4,7 @@
 #include "status_mgr/progress.h"
 
 #include <ctime>
+#include <map>
 #include <set>
 
 #include "fileindex/eligibility.h"
@@ -101,6 +102,102 @@ std::string FolderProgress(const std::string& path) {
     return kFinished;
   }
   return RunningOrPaused(resumeTime);
+}
+
+std::vector<std::string> FoldersProgress(const std::vector<std::string>& paths,
+                                         const std::vector<bool>* indexable) {
+  std::vector<std::string> states(paths.size(), kFinished);
+  std::map<std::string, std::vector<size_t>> byShare;
+  for (size_t i = 0; i < paths.size(); ++i) {
+    if (!(indexable != nullptr ? (*indexable)[i] : CanPathBeIndexed(paths[i]))) {
+      states[i] = kPaused;
+      continue;
+    }
+    std::string share;
+    if (!GetShareNameByPath(share, paths[i])) {
+      FILEINDEX_LOG("Failed to get share name from path: %s", paths[i].c_str());
+      continue;
+    }
+    byShare[share].push_back(i);
+  }
+  if (byShare.empty()) {
+    return states;
+  }
+
+  // The status file once: the shares' no-space flags and, when some share's queue is to be read,
+  // the pause state (one that cannot be read counts as not paused).
+  std::map<std::string, std::string> queues;
+  long long resumeTime = kNotPaused;
+  const auto decide = [&](const Status* status) {
+    for (const auto& share : byShare) {
+      if (status != nullptr && status->ShareIsNoSpace(share.first)) {
+        for (const size_t i : share.second) {
+          states[i] = kNoSpace;
+        }
+        continue;
+      }
+      std::string queue;
+      if (!ShareQueuePath(share.first, queue)) {
+        FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", share.first.c_str());
+        continue;
+      }
+      queues.emplace(share.first, queue);
+    }
+    if (!queues.empty() && (status == nullptr || !status->GetPauseInfo(resumeTime))) {
+      resumeTime = kNotPaused;
+    }
+  };
+  bool loaded = false;
+  QueryStatus([&](const Status& status) {
+    loaded = true;
+    decide(&status);
+    return true;
+  });
+  if (!loaded) {
+    decide(nullptr);
+  }
+
+  for (const auto& shareQueue : queues) {
+    const std::string& queue = shareQueue.second;
+    const std::string tmp = QueueTmpOf(queue);
+    if (!LocationFileExists(queue) && !LocationFileExists(tmp)) {
+      continue;
+    }
+    std::vector<size_t> folders;
+    std::vector<std::string> fullPaths;
+    for (const size_t i : byShare[shareQueue.first]) {
+      std::string full;
+      if (!GetFullPath(full, paths[i])) {
+        FILEINDEX_LOG("Cannot get full path: %s", paths[i].c_str());
+        continue;
+      }
+      folders.push_back(i);
+      fullPaths.push_back(full);
+    }
+    // The companion is read only for the folders the queue has nothing for.
+    std::vector<bool> found;
+    QueueFoldersWithEvents(fullPaths, queue, found);
+    std::vector<size_t> rest;
+    std::vector<std::string> restPaths;
+    for (size_t k = 0; k < folders.size(); ++k) {
+      if (found[k]) {
+        states[folders[k]] = RunningOrPaused(resumeTime);
+      } else {
+        rest.push_back(folders[k]);
+        restPaths.push_back(fullPaths[k]);
+      }
+    }
+    if (rest.empty()) {
+      continue;
+    }
+    QueueFoldersWithEvents(restPaths, tmp, found);
+    for (size_t k = 0; k < rest.size(); ++k) {
+      if (found[k]) {
+        states[rest[k]] = RunningOrPaused(resumeTime);
+      }
+    }
+  }
+  return states;
 }
 
 }  // namespace FILEINDEX

@@ -88,7 +88,9 @@ bool StatusMgr::GetStatus(std::string& status) {
   return OverallProgress(paths, status);
 }
 
-std::string StatusMgr::GetFolderStatus(const std::string& path) { return FolderProgress(path); }
+std::string StatusMgr::GetFolderStatus(const std::string& path) {
+  return FoldersProgress({path}).front();
+}
 
 }  // namespace FILEINDEX
 }  // namespace WEZO

@@ -4,6 +4,7 @@
 
 #include <fcntl.h>
 #include <json/value.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -11,51 +12,673 @@
 #include <climits>
 #include <cstdint>
 #include <cstring>
-#include <vector>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <new>
+#include <string_view>
+#include <unordered_map>
+#include <unordered_set>
+#include <utility>
 
 #include "fileindex/queue.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
+#include "unique_fd.h"
 #include "utils/log.h"
 #include "utils/storage.h"
-#include "unique_fd.h"
 
 namespace WEZO {
 namespace FILEINDEX {
 namespace {
 
-constexpr size_t kBlockSize = size_t{1} << 20;
+using detail::LineVerdict;
+using detail::ReadOptions;
 
-// The unit under which the folder test logs: its callers report progress under that name.
+// The unit under which the folder reader logs: its callers report progress under that name.
 constexpr const char* kFolderUnit = "status_mgr";
 
-const Json::Value* Member(const Json::Value& object, const char* key) {
-  return object.find(key, key + std::strlen(key));
+// Bytes at the start of a queue and just before the point read to that must be unchanged for
+// the rest of what was read to count as unchanged.
+constexpr size_t kWindow = 4096;
+constexpr size_t kBlockSize = size_t{1} << 20;
+// Of a malformed line longer than the block, what its log line shows.
+constexpr size_t kLogHead = size_t{64} << 10;
+// Reindex paths up to this length are remembered; a longer one makes the file's entry go.
+constexpr size_t kRememberedPath = 4096;
+// Past this many reindex paths, or folders asked about, a file's entry goes.
+constexpr size_t kMaxRemembered = 4096;
+// Queue files remembered at once; past it, the entry read longest ago goes.
+constexpr size_t kMaxFiles = 64;
+
+int LogWidth(size_t size) { return static_cast<int>(std::min<size_t>(size, INT_MAX)); }
+
+uint64_t Hash(const char* data, size_t size, uint64_t h = 1469598103934665603ULL) {
+  for (size_t i = 0; i < size; ++i) {
+    h = (h ^ static_cast<unsigned char>(data[i])) * 1099511628211ULL;
+  }
+  return h;
 }
 
-// Hands out a file's lines a run at a time, straight from the read buffer. A run holds whole
-// lines, each ended by "\n"; at the end of the file it is the last line when that has no "\n".
-// The buffer holds one block, and grows only while a single line does not fit in it.
-class LineRuns {
- public:
-  LineRuns(int fd, size_t blockSize) : m_fd(fd), m_buffer(std::max<size_t>(blockSize, 1)) {}
+// ---------------------------------------------------------------------------------------------
+// The line scanner.
 
-  // Stores the next run in [begin, end); false when the file has nothing left. A read error ends
-  // the file where it happened.
-  bool Next(const char*& begin, const char*& end) {
-    char* data = m_buffer.data();
-    if (m_start > 0) {
-      // The unfinished line of the last run moves to the front, where the next read completes it.
-      std::memmove(data, data + m_start, m_fill - m_start);
-      m_fill -= m_start;
-      m_start = 0;
+// The bytes of one line, a window at a time: [p, end) is what is at hand. A line held whole is
+// one window; a line longer than the block comes in several.
+class LineSource {
+ public:
+  LineSource(const char* p, const char* end) : p(p), end(end) {}
+  virtual ~LineSource() = default;
+  LineSource(const LineSource&) = delete;
+  LineSource& operator=(const LineSource&) = delete;
+
+  // Brings the next window of the line into [p, end); false at the end of the line.
+  virtual bool More() { return false; }
+
+  const char* p;
+  const char* end;
+};
+
+// Where a decoded string goes: its first `limit` bytes to `out` (when given), its length always,
+// and, for names, a hash of all of it.
+struct Capture {
+  std::string* out = nullptr;
+  size_t limit = 0;
+  size_t size = 0;
+  uint64_t hash = 1469598103934665603ULL;
+  bool hashed = false;
+
+  void Append(const char* data, size_t n) {
+    if (out != nullptr && out->size() < limit) {
+      out->append(data, std::min(n, limit - out->size()));
     }
-    while (!m_eof) {
-      if (m_fill == m_buffer.size()) {
-        m_buffer.resize(m_buffer.size() * 2);
-        data = m_buffer.data();
+    if (hashed) {
+      hash = Hash(data, n, hash);
+    }
+    size += n;
+  }
+};
+
+// Appends the code point `cp` as UTF-8, as the JSON parser does (surrogates included).
+void AppendCodePoint(Capture& to, unsigned int cp) {
+  char bytes[4];
+  size_t n = 0;
+  if (cp <= 0x7F) {
+    bytes[n++] = static_cast<char>(cp);
+  } else if (cp <= 0x7FF) {
+    bytes[n++] = static_cast<char>(0xC0 | (cp >> 6));
+    bytes[n++] = static_cast<char>(0x80 | (cp & 0x3F));
+  } else if (cp <= 0xFFFF) {
+    bytes[n++] = static_cast<char>(0xE0 | (cp >> 12));
+    bytes[n++] = static_cast<char>(0x80 | ((cp >> 6) & 0x3F));
+    bytes[n++] = static_cast<char>(0x80 | (cp & 0x3F));
+  } else {
+    bytes[n++] = static_cast<char>(0xF0 | (cp >> 18));
+    bytes[n++] = static_cast<char>(0x80 | ((cp >> 12) & 0x3F));
+    bytes[n++] = static_cast<char>(0x80 | ((cp >> 6) & 0x3F));
+    bytes[n++] = static_cast<char>(0x80 | (cp & 0x3F));
+  }
+  to.Append(bytes, n);
+}
+
+// A recursive-descent reading of one line that follows the strict parser exactly over a subset of
+// JSON: objects, arrays, strings with every escape, true, false, null and plain decimals. Where
+// the line leaves that subset it answers kUnsure, never a guess: a wrong answer would hide a
+// malformed line from the log or invent an event. It answers kNoEvent only where the parser
+// surely fails too: the line ends inside a value, a string holds an escape the parser refuses,
+// or the object is complete but lacks the event.
+class LineScanner {
+ public:
+  LineScanner(LineSource& source, size_t limit) : m_src(source), m_limit(limit) {}
+
+  // `pathSize` and `pathOldSize` get the decoded lengths; `out` holds at most `limit` bytes of
+  // each path.
+  LineVerdict Event(QueueEvent& out, size_t& pathSize, size_t& pathOldSize) {
+    out.event = 0;
+    out.path.clear();
+    out.pathOld.clear();
+    m_out = &out;
+    SkipSpace();
+    Step step = Expect('{');
+    if (step == Step::kOk) {
+      step = Members(1, true);
+    }
+    if (step == Step::kOk) {
+      SkipSpace();
+      // The parser ends the text at a NUL byte; anything after the object is for it to judge.
+      step = Avail() ? Step::kUnsure : Step::kOk;
+    }
+    switch (step) {
+      case Step::kOk:
+        pathSize = m_pathSize;
+        pathOldSize = m_pathOldSize;
+        return m_event && m_path ? LineVerdict::kEvent : LineVerdict::kNoEvent;
+      case Step::kMalformed:
+        return LineVerdict::kNoEvent;
+      case Step::kUnsure:
+        break;
+    }
+    return LineVerdict::kUnsure;
+  }
+
+ private:
+  enum class Step { kOk, kMalformed, kUnsure };
+
+  static constexpr int kMaxDepth = 32;
+  static constexpr size_t kMaxKeys = 16;
+  // Plain decimals this short are exact integers or ordinary doubles for the parser.
+  static constexpr size_t kMaxDigits = 15;
+  // The parser cannot hold strings this long.
+  static constexpr size_t kMaxString = size_t{1} << 30;
+
+  struct Key {
+    size_t size;
+    uint64_t hash;
+  };
+
+  enum class TopKey { kOther, kEvent, kPath, kPathOld };
+
+  static TopKey Which(const std::string& name) {
+    switch (name.size()) {
+      case 4:
+        return std::memcmp(name.data(), "path", 4) == 0 ? TopKey::kPath : TopKey::kOther;
+      case 5:
+        return std::memcmp(name.data(), "event", 5) == 0 ? TopKey::kEvent : TopKey::kOther;
+      case 8:
+        return std::memcmp(name.data(), "path_old", 8) == 0 ? TopKey::kPathOld : TopKey::kOther;
+      default:
+        return TopKey::kOther;
+    }
+  }
+
+  bool Avail() { return m_src.p != m_src.end || m_src.More(); }
+
+  // The next byte, taken; false at the end of the line.
+  bool Next(char& c) {
+    if (!Avail()) {
+      return false;
+    }
+    c = *m_src.p++;
+    return true;
+  }
+
+  void SkipSpace() {
+    while (Avail() && (*m_src.p == ' ' || *m_src.p == '\t' || *m_src.p == '\r')) {
+      ++m_src.p;
+    }
+  }
+
+  // The line ending where a value or a delimiter must follow fails the parser too.
+  Step Expect(char c) {
+    if (!Avail()) {
+      return Step::kMalformed;
+    }
+    if (*m_src.p != c) {
+      return Step::kUnsure;
+    }
+    ++m_src.p;
+    return Step::kOk;
+  }
+
+  static int Hex(char c) {
+    if (c >= '0' && c <= '9') return c - '0';
+    if (c >= 'a' && c <= 'f') return c - 'a' + 10;
+    if (c >= 'A' && c <= 'F') return c - 'A' + 10;
+    return -1;
+  }
+
+  // Four hex digits after "\u". Whatever else comes there (the closing quote or a backslash
+  // included) makes the parser refuse the string.
+  Step Hex4(unsigned int& cp) {
+    cp = 0;
+    for (int i = 0; i < 4; ++i) {
+      char c = 0;
+      if (!Next(c)) {
+        return Step::kMalformed;
       }
-      const ssize_t got = read(m_fd, data + m_fill, m_buffer.size() - m_fill);
+      const int digit = Hex(c);
+      if (digit < 0) {
+        return Step::kMalformed;
+      }
+      cp = cp * 16 + static_cast<unsigned int>(digit);
+    }
+    return Step::kOk;
+  }
+
+  // After the backslash.
+  Step Escape(Capture& to) {
+    char c = 0;
+    if (!Next(c)) {
+      return Step::kMalformed;
+    }
+    char plain = 0;
+    switch (c) {
+      case '"':
+      case '\\':
+      case '/':
+        plain = c;
+        break;
+      case 'b':
+        plain = '\b';
+        break;
+      case 'f':
+        plain = '\f';
+        break;
+      case 'n':
+        plain = '\n';
+        break;
+      case 'r':
+        plain = '\r';
+        break;
+      case 't':
+        plain = '\t';
+        break;
+      case 'u': {
+        unsigned int cp = 0;
+        Step step = Hex4(cp);
+        if (step != Step::kOk) {
+          return step;
+        }
+        if (cp >= 0xD800 && cp <= 0xDBFF) {
+          // A high surrogate takes the next "\u" escape as its second half, whatever its value,
+          // as the parser does.
+          char backslash = 0;
+          char u = 0;
+          if (!Next(backslash) || backslash != '\\' || !Next(u) || u != 'u') {
+            return Step::kMalformed;
+          }
+          unsigned int low = 0;
+          step = Hex4(low);
+          if (step != Step::kOk) {
+            return step;
+          }
+          cp = 0x10000 + ((cp & 0x3FF) << 10) + (low & 0x3FF);
+        }
+        AppendCodePoint(to, cp);
+        return Step::kOk;
+      }
+      default:
+        return Step::kMalformed;
+    }
+    to.Append(&plain, 1);
+    return Step::kOk;
+  }
+
+  // After the opening quote. Raw bytes, control characters included, are the string's own.
+  Step String(Capture& to) {
+    for (;;) {
+      if (!Avail()) {
+        return Step::kMalformed;
+      }
+      const char* p = m_src.p;
+      const auto n = static_cast<size_t>(m_src.end - p);
+      const void* quote = std::memchr(p, '"', n);
+      const char* stop = quote != nullptr ? static_cast<const char*>(quote) : m_src.end;
+      const void* backslash = std::memchr(p, '\\', static_cast<size_t>(stop - p));
+      if (backslash != nullptr) {
+        stop = static_cast<const char*>(backslash);
+      }
+      to.Append(p, static_cast<size_t>(stop - p));
+      m_src.p = stop;
+      if (to.size >= kMaxString) {
+        return Step::kUnsure;
+      }
+      if (stop == m_src.end) {
+        continue;
+      }
+      ++m_src.p;
+      if (*stop == '"') {
+        return Step::kOk;
+      }
+      const Step step = Escape(to);
+      if (step != Step::kOk) {
+        return step;
+      }
+    }
+  }
+
+  Step SkipString() {
+    Capture none;
+    return String(none);
+  }
+
+  size_t Digits() {
+    size_t count = 0;
+    while (Avail() && *m_src.p >= '0' && *m_src.p <= '9') {
+      ++m_src.p;
+      ++count;
+    }
+    return count;
+  }
+
+  Step Number() {
+    if (*m_src.p == '-') {
+      ++m_src.p;
+    }
+    const size_t digits = Digits();
+    if (digits == 0 || digits > kMaxDigits) {
+      return Step::kUnsure;
+    }
+    if (!Avail() || *m_src.p != '.') {
+      return Step::kOk;
+    }
+    ++m_src.p;
+    const size_t fraction = Digits();
+    return fraction > 0 && fraction <= kMaxDigits - digits ? Step::kOk : Step::kUnsure;
+  }
+
+  Step Unsigned(unsigned int& out) {
+    uint64_t value = 0;
+    size_t digits = 0;
+    while (Avail() && *m_src.p >= '0' && *m_src.p <= '9') {
+      if (++digits > 10) {
+        return Step::kUnsure;
+      }
+      value = value * 10 + static_cast<uint64_t>(*m_src.p++ - '0');
+    }
+    if (digits == 0 || value > UINT_MAX) {
+      return Step::kUnsure;
+    }
+    out = static_cast<unsigned int>(value);
+    return Step::kOk;
+  }
+
+  Step Literal(const char* word) {
+    for (const char* w = word; *w != '\0'; ++w) {
+      char c = 0;
+      if (!Next(c)) {
+        return Step::kMalformed;
+      }
+      if (c != *w) {
+        return Step::kUnsure;
+      }
+    }
+    return Step::kOk;
+  }
+
+  Step Value(int depth) {
+    if (!Avail()) {
+      return Step::kMalformed;
+    }
+    switch (*m_src.p) {
+      case '{':
+        ++m_src.p;
+        return depth < kMaxDepth ? Members(depth + 1, false) : Step::kUnsure;
+      case '[':
+        ++m_src.p;
+        return depth < kMaxDepth ? Elements(depth + 1) : Step::kUnsure;
+      case '"':
+        ++m_src.p;
+        return SkipString();
+      case 't':
+        return Literal("true");
+      case 'f':
+        return Literal("false");
+      case 'n':
+        return Literal("null");
+      default:
+        return Number();
+    }
+  }
+
+  // After "[".
+  Step Elements(int depth) {
+    SkipSpace();
+    if (Avail() && *m_src.p == ']') {
+      ++m_src.p;
+      return Step::kOk;
+    }
+    for (;;) {
+      SkipSpace();
+      Step step = Value(depth);
+      if (step != Step::kOk) {
+        return step;
+      }
+      SkipSpace();
+      if (!Avail()) {
+        return Step::kMalformed;
+      }
+      const char c = *m_src.p++;
+      if (c == ']') {
+        return Step::kOk;
+      }
+      if (c != ',') {
+        return Step::kUnsure;
+      }
+    }
+  }
+
+  // The value of a top-level "path" or "path_old": a string goes to `to`, anything else is only
+  // checked and leaves `isString` false.
+  Step PathValue(int depth, Capture& to, bool& isString) {
+    isString = false;
+    if (!Avail()) {
+      return Step::kMalformed;
+    }
+    if (*m_src.p != '"') {
+      return Value(depth);
+    }
+    ++m_src.p;
+    isString = true;
+    return String(to);
+  }
+
+  // After "{". With `top`, the object is the line's own: "event", "path" and "path_old" go to the
+  // event being read.
+  Step Members(int depth, bool top) {
+    Key keys[kMaxKeys];
+    size_t count = 0;
+    SkipSpace();
+    if (Avail() && *m_src.p == '}') {
+      ++m_src.p;
+      return Step::kOk;
+    }
+    for (;;) {
+      SkipSpace();
+      if (count == kMaxKeys) {
+        return Step::kUnsure;
+      }
+      Step step = Expect('"');
+      if (step != Step::kOk) {
+        return step;
+      }
+      std::string name;
+      Capture key;
+      key.out = &name;
+      key.limit = 9;  // the longest name looked for, "path_old", and one more byte
+      key.hashed = true;
+      step = String(key);
+      if (step != Step::kOk) {
+        return step;
+      }
+      for (size_t i = 0; i < count; ++i) {
+        if (keys[i].size == key.size && keys[i].hash == key.hash) {
+          // Most likely the same name twice, which the parser refuses; it alone can be sure.
+          return Step::kUnsure;
+        }
+      }
+      keys[count++] = Key{key.size, key.hash};
+      SkipSpace();
+      step = Expect(':');
+      if (step != Step::kOk) {
+        return step;
+      }
+      SkipSpace();
+      const TopKey which = top ? Which(name) : TopKey::kOther;
+      if (which == TopKey::kEvent) {
+        if (!Avail()) {
+          return Step::kMalformed;
+        }
+        step = Unsigned(m_out->event);
+        m_event = step == Step::kOk;
+      } else if (which == TopKey::kPath) {
+        Capture path;
+        path.out = &m_out->path;
+        path.limit = m_limit;
+        step = PathValue(depth, path, m_path);
+        m_pathSize = path.size;
+      } else if (which == TopKey::kPathOld) {
+        Capture pathOld;
+        pathOld.out = &m_out->pathOld;
+        pathOld.limit = m_limit;
+        bool isString = false;
+        step = PathValue(depth, pathOld, isString);
+        if (!isString) {
+          m_out->pathOld.clear();
+        }
+        m_pathOldSize = isString ? pathOld.size : 0;
+      } else {
+        step = Value(depth);
+      }
+      if (step != Step::kOk) {
+        return step;
+      }
+      SkipSpace();
+      if (!Avail()) {
+        return Step::kMalformed;
+      }
+      const char c = *m_src.p++;
+      if (c == '}') {
+        return Step::kOk;
+      }
+      if (c != ',') {
+        return Step::kUnsure;
+      }
+    }
+  }
+
+  LineSource& m_src;
+  size_t m_limit;
+  QueueEvent* m_out = nullptr;
+  bool m_event = false;
+  bool m_path = false;
+  size_t m_pathSize = 0;
+  size_t m_pathOldSize = 0;
+};
+
+// ---------------------------------------------------------------------------------------------
+// Reading a queue file line by line.
+
+// One line of the file as the readers use it: the event, if any, with at most the capture limit
+// of each path, and where the line lies.
+struct ReadLine {
+  bool isEvent = false;
+  QueueEvent event;       // the code; the paths when they had to be decoded
+  std::string_view path;  // at most the capture limit of each path
+  std::string_view pathOld;
+  size_t pathSize = 0;  // their whole lengths
+  size_t pathOldSize = 0;
+  off_t start = 0;        // offset of its first byte
+  off_t stop = 0;         // offset after its "\n", or of its end when it has none
+  bool ended = false;     // ended by "\n"
+  std::string_view text;  // for the log: the line, or the start of a line longer than the block
+};
+
+// Reads a file from an offset in blocks and hands out its lines. The buffer holds one block and
+// `kWindow` bytes more, so the bytes just before the point read to are at hand; it never grows.
+class BlockReader {
+ public:
+  // Lines are handed out from `from`; the `kWindow` bytes before it are read too, so that the
+  // window before the point read to is at hand even when little was appended.
+  BlockReader(int fd, off_t from, size_t blockSize)
+      : m_fd(fd),
+        m_size(std::max<size_t>(blockSize, 1) + kWindow),
+        m_buffer(new char[m_size]),
+        m_base(from - std::min<off_t>(from, static_cast<off_t>(kWindow))),
+        m_skip(static_cast<size_t>(from - m_base)) {}
+
+  // Reads the next line into `line`, capturing at most `limit` bytes of each path; false when
+  // the file has nothing left. A read error ends the file where it happened.
+  bool Next(ReadLine& line, size_t limit) {
+    if (m_skip > 0) {
+      while (m_fill < m_skip && !m_eof) {
+        Fill();
+      }
+      m_pos = std::min(m_skip, m_fill);
+      m_skip = 0;
+    }
+    char* data = m_buffer.get();
+    const char* newline = nullptr;
+    size_t searched = m_pos;
+    for (;;) {
+      const void* found = std::memchr(data + searched, '\n', m_fill - searched);
+      if (found != nullptr) {
+        newline = static_cast<const char*>(found);
+        break;
+      }
+      searched = m_fill;
+      if (m_eof || m_fill - m_pos + kWindow >= m_size) {
+        break;  // the whole rest of the file, or a line longer than the block
+      }
+      const size_t kept = Compact(m_pos);
+      searched -= kept;
+      data = m_buffer.get();
+      Fill();
+    }
+    if (newline == nullptr && m_pos == m_fill) {
+      return false;
+    }
+    line.start = Offset(m_pos);
+    if (newline != nullptr || m_eof) {
+      const char* begin = data + m_pos;
+      const char* end = newline != nullptr ? newline : data + m_fill;
+      m_pos = static_cast<size_t>(end - data) + (newline != nullptr ? 1 : 0);
+      line.ended = newline != nullptr;
+      line.stop = Offset(m_pos);
+      line.text = std::string_view(begin, static_cast<size_t>(end - begin));
+      Classify(line, begin, end, limit);
+      return true;
+    }
+    Stream(line, limit);
+    return true;
+  }
+
+  // The offset just after the last complete line handed out, and the hash of the `kWindow` bytes
+  // (or fewer, from the start of the file) before it, when the buffer still holds them.
+  bool TailWindow(off_t end, uint64_t& hash, size_t& size) const {
+    size = static_cast<size_t>(std::min<off_t>(end, static_cast<off_t>(kWindow)));
+    if (end - static_cast<off_t>(size) < m_base || end > Offset(m_fill)) {
+      return false;
+    }
+    const auto at = static_cast<size_t>(end - m_base);
+    hash = Hash(m_buffer.get() + at - size, size);
+    return true;
+  }
+
+  // Lines that cannot be reindex events are then only told apart from them, not read.
+  void OnlyReindexEvents() { m_onlyReindex = true; }
+
+  // The first bytes of the file, up to `kWindow`, when this reader started at the file's start.
+  const std::string& Head() const { return m_head; }
+
+ private:
+  class StreamSource : public LineSource {
+   public:
+    StreamSource(BlockReader& reader, const char* p, const char* end)
+        : LineSource(p, end), m_reader(reader) {}
+    bool More() override { return m_reader.MoreOfLine(*this); }
+
+   private:
+    BlockReader& m_reader;
+  };
+
+  off_t Offset(size_t at) const { return m_base + static_cast<off_t>(at); }
+
+  // Moves the bytes from `kWindow` before `from` to the front; returns how far they moved.
+  size_t Compact(size_t from) {
+    const size_t keep = from > kWindow ? from - kWindow : 0;
+    if (keep > 0) {
+      std::memmove(m_buffer.get(), m_buffer.get() + keep, m_fill - keep);
+      m_fill -= keep;
+      m_pos -= std::min(m_pos, keep);
+      m_base += static_cast<off_t>(keep);
+    }
+    return keep;
+  }
+
+  void Fill() {
+    while (!m_eof && m_fill < m_size) {
+      const ssize_t got = pread(m_fd, m_buffer.get() + m_fill, m_size - m_fill, Offset(m_fill));
       if (got < 0 && errno == EINTR) {
         continue;
       }
@@ -63,385 +686,618 @@ class LineRuns {
         m_eof = true;
         break;
       }
-      const char* fresh = data + m_fill;
-      m_fill += static_cast<size_t>(got);
-      const void* newline = memrchr(fresh, '\n', static_cast<size_t>(got));
-      if (newline != nullptr) {
-        m_start = static_cast<size_t>(static_cast<const char*>(newline) - data) + 1;
-        begin = data;
-        end = data + m_start;
-        return true;
+      if (m_base == 0 && m_head.size() < kWindow) {
+        const size_t from = m_fill;
+        const size_t upto = std::min(m_fill + static_cast<size_t>(got), kWindow);
+        if (from < upto) {
+          m_head.append(m_buffer.get() + from, upto - from);
+        }
       }
+      m_fill += static_cast<size_t>(got);
+      return;
     }
-    if (m_fill == 0) {
+  }
+
+  // Brings more of a streamed line into `source`; false at its end.
+  bool MoreOfLine(StreamSource& source) {
+    if (m_lineEnded) {
       return false;
     }
-    begin = data;
-    end = data + m_fill;
-    m_start = m_fill;
+    m_pos = static_cast<size_t>(source.p - m_buffer.get());
+    for (;;) {
+      const char* data = m_buffer.get();
+      if (m_pos < m_fill) {
+        const void* newline = std::memchr(data + m_pos, '\n', m_fill - m_pos);
+        source.p = data + m_pos;
+        source.end = newline != nullptr ? static_cast<const char*>(newline) : data + m_fill;
+        m_lineEnded = newline != nullptr;
+        if (m_logHead.size() < kLogHead) {
+          m_logHead.append(source.p, std::min(static_cast<size_t>(source.end - source.p),
+                                              kLogHead - m_logHead.size()));
+        }
+        return source.p != source.end;
+      }
+      if (m_eof) {
+        m_lineEnded = true;
+        source.p = source.end = data + m_pos;
+        return false;
+      }
+      Compact(m_pos);
+      Fill();
+    }
+  }
+
+  // The shapes the writers produce most, {"event":N,"path":"P"}, {"event":N,"path":"P",
+  // "path_old":"O"} and {"data":null,"event":N,"path":"P"}, with plain decimals and strings
+  // without a backslash, are taken straight from the buffer; the parser reads them exactly so.
+  static bool Plain(ReadLine& line, const char* p, const char* end) {
+    static constexpr char kEvent[] = R"({"event":)";
+    static constexpr char kPath[] = R"(,"path":")";
+    static constexpr char kPathOld[] = R"(","path_old":")";
+    const auto take = [&p, end](const char* text, size_t size) {
+      if (static_cast<size_t>(end - p) < size || std::memcmp(p, text, size) != 0) {
+        return false;
+      }
+      p += size;
+      return true;
+    };
+    const auto string = [&p, end](std::string_view& out) {
+      const void* quote = std::memchr(p, '"', static_cast<size_t>(end - p));
+      if (quote == nullptr) {
+        return false;
+      }
+      const auto size = static_cast<size_t>(static_cast<const char*>(quote) - p);
+      if (std::memchr(p, '\\', size) != nullptr) {
+        return false;
+      }
+      out = std::string_view(p, size);
+      p += size;
+      return true;
+    };
+    // The library's own reindex events carry a null "data" first.
+    static constexpr char kNullData[] = R"({"data":null,"event":)";
+    if (!take(kEvent, sizeof kEvent - 1) && !take(kNullData, sizeof kNullData - 1)) {
+      return false;
+    }
+    uint64_t code = 0;
+    const char* digits = p;
+    while (p != end && *p >= '0' && *p <= '9' && p - digits < 11) {
+      code = code * 10 + static_cast<uint64_t>(*p++ - '0');
+    }
+    if (p == digits || p - digits > 10 || code > UINT_MAX || !take(kPath, sizeof kPath - 1) ||
+        !string(line.path)) {
+      return false;
+    }
+    line.pathOld = std::string_view();
+    if (end - p == 2 && p[0] == '"' && p[1] == '}') {
+      // done
+    } else if (!take(kPathOld, sizeof kPathOld - 1) || !string(line.pathOld) || end - p != 2 ||
+               p[0] != '"' || p[1] != '}') {
+      return false;
+    }
+    line.isEvent = true;
+    line.event.event = static_cast<unsigned int>(code);
+    line.pathSize = line.path.size();
+    line.pathOldSize = line.pathOld.size();
     return true;
   }
 
- private:
-  int m_fd;
-  std::vector<char> m_buffer;
-  size_t m_start = 0;  // where the part not yet handed out begins
-  size_t m_fill = 0;   // how much of the buffer holds read bytes
-  bool m_eof = false;
-};
-
-// A recursive-descent check of one line that accepts only a subset of what the strict parser
-// accepts. Whatever falls outside that subset, even when the parser would take it, makes the
-// check give up: a wrong "surely" would hide a malformed line from the log or invent an event.
-class LineScanner {
- public:
-  LineScanner(const char* line, size_t size) : m_p(line), m_end(line + size) {}
-
-  bool Event(detail::ScannedEvent& out) {
-    out = detail::ScannedEvent();
-    // Without a backslash every string's bytes are its value and end at the next quote.
-    if (std::memchr(m_p, '\\', static_cast<size_t>(m_end - m_p)) != nullptr) {
-      return false;
-    }
-    SkipSpace();
-    if (!Take('{') || !Members(1, &out)) {
-      return false;
-    }
-    SkipSpace();
-    return m_p == m_end;
+  static void Decoded(ReadLine& line) {
+    line.path = line.event.path;
+    line.pathOld = line.event.pathOld;
   }
 
- private:
-  static constexpr int kMaxDepth = 32;
-  static constexpr size_t kMaxKeys = 16;
-  // Plain decimals this short are exact integers or ordinary doubles for the parser.
-  static constexpr int kMaxDigits = 15;
-  // The parser throws on names this long and cannot hold strings much longer.
-  static constexpr size_t kMaxString = size_t{1} << 30;
-
-  struct Key {
-    const char* text;
-    size_t size;
-  };
-
-  static bool IsKey(const Key& key, const char* name, size_t size) {
-    return key.size == size && std::memcmp(key.text, name, size) == 0;
-  }
-
-  void SkipSpace() {
-    while (m_p != m_end && (*m_p == ' ' || *m_p == '\t' || *m_p == '\r' || *m_p == '\n')) {
-      ++m_p;
+  // Whether a line that is not plain may be a reindex event: its "event" must then be a number
+  // whose text holds "65536", or rounds up from "65535.", or has an exponent.
+  static bool MayBeReindex(const char* begin, const char* end) {
+    const auto at = [end](const char* q, const char* text, size_t size) {
+      return static_cast<size_t>(end - q) >= size && std::memcmp(q, text, size) == 0;
+    };
+    for (const char* q = begin; q < end; ++q) {
+      q = static_cast<const char*>(std::memchr(q, '6', static_cast<size_t>(end - q)));
+      if (q == nullptr) {
+        break;
+      }
+      if (at(q, "65536", 5) || at(q, "65535.", 6)) {
+        return true;
+      }
     }
-  }
-
-  bool Take(char c) {
-    if (m_p != m_end && *m_p == c) {
-      ++m_p;
-      return true;
+    // An exponent follows a digit or a point.
+    for (const char e : {'e', 'E'}) {
+      for (const char* q = begin + 1; q < end; ++q) {
+        q = static_cast<const char*>(std::memchr(q, e, static_cast<size_t>(end - q)));
+        if (q == nullptr) {
+          break;
+        }
+        if (!((q[-1] >= '0' && q[-1] <= '9') || q[-1] == '.')) {
+          continue;
+        }
+        const char* next = q + 1;
+        if (next != end && (*next == '+' || *next == '-')) {
+          ++next;
+        }
+        if (next != end && *next >= '0' && *next <= '9') {
+          return true;
+        }
+      }
     }
     return false;
   }
 
-  bool String(const char*& text, size_t& size) {
-    if (!Take('"')) {
-      return false;
-    }
-    const void* quote = std::memchr(m_p, '"', static_cast<size_t>(m_end - m_p));
-    if (quote == nullptr) {
-      return false;
-    }
-    text = m_p;
-    m_p = static_cast<const char*>(quote);
-    size = static_cast<size_t>(m_p - text);
-    ++m_p;
-    return size < kMaxString;
-  }
-
-  int Digits() {
-    const char* start = m_p;
-    while (m_p != m_end && *m_p >= '0' && *m_p <= '9') {
-      ++m_p;
-    }
-    return static_cast<int>(std::min<ptrdiff_t>(m_p - start, INT_MAX));
-  }
-
-  bool Number() {
-    Take('-');
-    const int digits = Digits();
-    if (digits == 0 || digits > kMaxDigits) {
-      return false;
-    }
-    if (!Take('.')) {
+  // Whether a line surely is no reindex event because it begins as a plain line with another
+  // code: valid or not, it cannot be one.
+  static bool OtherCode(const char* p, const char* end) {
+    static constexpr char kEvent[] = R"({"event":)";
+    static constexpr char kNullData[] = R"({"data":null,"event":)";
+    const auto take = [&p, end](const char* text, size_t size) {
+      if (static_cast<size_t>(end - p) < size || std::memcmp(p, text, size) != 0) {
+        return false;
+      }
+      p += size;
       return true;
-    }
-    const int fraction = Digits();
-    return fraction > 0 && fraction <= kMaxDigits - digits;
-  }
-
-  bool Unsigned(unsigned int& out) {
-    const char* start = m_p;
-    const int digits = Digits();
-    if (digits == 0 || digits > 10) {
+    };
+    if (!take(kEvent, sizeof kEvent - 1) && !take(kNullData, sizeof kNullData - 1)) {
       return false;
     }
-    uint64_t value = 0;
-    for (const char* d = start; d != m_p; ++d) {
-      value = value * 10 + static_cast<uint64_t>(*d - '0');
+    uint64_t code = 0;
+    const char* digits = p;
+    while (p != end && *p >= '0' && *p <= '9' && p - digits < 11) {
+      code = code * 10 + static_cast<uint64_t>(*p++ - '0');
     }
-    if (value > UINT_MAX) {
-      return false;
-    }
-    out = static_cast<unsigned int>(value);
-    return true;
+    return p != digits && p - digits <= 10 && p != end && (*p == ',' || *p == '}') &&
+           code != static_cast<uint64_t>(kEventReindex);
   }
 
-  bool Literal(const char* word, size_t size) {
-    if (static_cast<size_t>(m_end - m_p) < size || std::memcmp(m_p, word, size) != 0) {
-      return false;
+  void Classify(ReadLine& line, const char* begin, const char* end, size_t limit) const {
+    if (m_onlyReindex && OtherCode(begin, end)) {
+      line.isEvent = false;
+      return;
     }
-    m_p += size;
-    return true;
+    if (Plain(line, begin, end)) {
+      return;
+    }
+    if (m_onlyReindex && !MayBeReindex(begin, end)) {
+      line.isEvent = false;
+      return;
+    }
+    LineSource source(begin, end);
+    switch (LineScanner(source, limit).Event(line.event, line.pathSize, line.pathOldSize)) {
+      case LineVerdict::kEvent:
+        line.isEvent = true;
+        Decoded(line);
+        return;
+      case LineVerdict::kNoEvent:
+        line.isEvent = false;
+        return;
+      case LineVerdict::kUnsure:
+        break;
+    }
+    line.isEvent = ParseQueueLine(begin, static_cast<size_t>(end - begin), line.event);
+    line.pathSize = line.event.path.size();
+    line.pathOldSize = line.event.pathOld.size();
+    Decoded(line);
   }
 
-  bool Value(int depth) {
-    if (m_p == m_end) {
-      return false;
+  // A line longer than the block: scanned as it streams past, with its start kept for the log.
+  void Stream(ReadLine& line, size_t limit) {
+    const char* begin = m_buffer.get() + m_pos;
+    const auto held = static_cast<size_t>(m_fill - m_pos);
+    m_logHead.assign(begin, std::min(held, kLogHead));
+    m_lineEnded = false;
+    StreamSource source(*this, begin, m_buffer.get() + m_fill);
+    const LineVerdict verdict =
+        LineScanner(source, limit).Event(line.event, line.pathSize, line.pathOldSize);
+    // Up to the end of the line, whatever the scanner left.
+    source.p = source.end;
+    while (source.More()) {
+      source.p = source.end;
     }
-    switch (*m_p) {
-      case '{':
-        ++m_p;
-        return depth < kMaxDepth && Members(depth + 1, nullptr);
-      case '[':
-        ++m_p;
-        return depth < kMaxDepth && Elements(depth + 1);
-      case '"': {
-        const char* text = nullptr;
-        size_t size = 0;
-        return String(text, size);
-      }
-      case 't':
-        return Literal("true", 4);
-      case 'f':
-        return Literal("false", 5);
-      case 'n':
-        return Literal("null", 4);
-      default:
-        return Number();
+    m_pos = static_cast<size_t>(source.p - m_buffer.get());
+    line.ended = m_pos < m_fill && m_buffer[m_pos] == '\n';
+    if (line.ended) {
+      ++m_pos;
     }
-  }
-
-  // After "[".
-  bool Elements(int depth) {
-    SkipSpace();
-    if (Take(']')) {
-      return true;
-    }
-    for (;;) {
-      SkipSpace();
-      if (!Value(depth)) {
-        return false;
+    line.stop = Offset(m_pos);
+    line.text = m_logHead;
+    line.isEvent = verdict == LineVerdict::kEvent;
+    Decoded(line);
+    if (verdict == LineVerdict::kUnsure) {
+      // The one case that needs the whole line at once: the parser reads it a second time.
+      // A line the process cannot hold counts as no event, as the parser could not hold it.
+      const auto size = static_cast<size_t>(line.stop - line.start - (line.ended ? 1 : 0));
+      std::string whole;
+      try {
+        whole.resize(size);
+      } catch (const std::bad_alloc&) {
+        line.isEvent = false;
+        return;
       }
-      SkipSpace();
-      if (Take(']')) {
-        return true;
-      }
-      if (!Take(',')) {
-        return false;
-      }
-    }
-  }
-
-  // After "{". With `top`, the object is the line's own: it must carry an unsigned "event" and a
-  // string "path", which go to `top` with a string "path_old".
-  bool Members(int depth, detail::ScannedEvent* top) {
-    Key keys[kMaxKeys];
-    size_t count = 0;
-    bool event = false;
-    bool path = false;
-    SkipSpace();
-    if (Take('}')) {
-      return top == nullptr;
-    }
-    for (;;) {
-      SkipSpace();
-      Key key{};
-      if (count == kMaxKeys || !String(key.text, key.size)) {
-        return false;
-      }
-      for (size_t i = 0; i < count; ++i) {
-        if (IsKey(keys[i], key.text, key.size)) {
-          return false;
+      size_t got = 0;
+      while (got < size) {
+        const ssize_t n =
+            pread(m_fd, &whole[got], size - got, line.start + static_cast<off_t>(got));
+        if (n <= 0 && !(n < 0 && errno == EINTR)) {
+          break;
         }
+        got += n > 0 ? static_cast<size_t>(n) : 0;
       }
-      keys[count++] = key;
-      SkipSpace();
-      if (!Take(':')) {
-        return false;
-      }
-      SkipSpace();
-      bool ok = false;
-      if (top != nullptr && IsKey(key, "event", 5)) {
-        event = Unsigned(top->event);
-        ok = event;
-      } else if (top != nullptr && IsKey(key, "path", 4)) {
-        path = String(top->path, top->pathSize);
-        ok = path;
-      } else if (top != nullptr && IsKey(key, "path_old", 8) && m_p != m_end && *m_p == '"') {
-        ok = String(top->pathOld, top->pathOldSize);
-      } else {
-        ok = Value(depth);
-      }
-      if (!ok) {
-        return false;
-      }
-      SkipSpace();
-      if (Take('}')) {
-        return top == nullptr || (event && path);
-      }
-      if (!Take(',')) {
-        return false;
+      line.isEvent = got == size && ParseQueueLine(whole.data(), whole.size(), line.event);
+      if (line.isEvent) {
+        line.pathSize = line.event.path.size();
+        line.pathOldSize = line.event.pathOld.size();
+        Decoded(line);
       }
     }
   }
 
-  const char* m_p;
-  const char* m_end;
+  int m_fd;
+  size_t m_size;
+  std::unique_ptr<char[]> m_buffer;  // left uninitialised: a short file touches little of it
+  off_t m_base;                      // the file offset of the buffer's first byte
+  size_t m_skip;                     // bytes at the start read only for the window
+  size_t m_pos = 0;                  // where the part not yet handed out begins
+  size_t m_fill = 0;                 // how much of the buffer holds read bytes
+  bool m_eof = false;
+  bool m_lineEnded = false;
+  bool m_onlyReindex = false;
+  std::string m_head;
+  std::string m_logHead;
 };
 
-// Whether a line is an event, and which: the quick scan when it is sure, the parser otherwise.
-// The event is in `scanned` or in `parsed`, as the answer says.
-enum class Line { kMalformed, kScanned, kParsed };
+// ---------------------------------------------------------------------------------------------
+// What each process remembers of the queue files it read.
 
-Line ReadLine(const char* line, size_t size, detail::ScannedEvent& scanned, QueueEvent& parsed) {
-  if (detail::ScanQueueLine(line, size, scanned)) {
-    return Line::kScanned;
-  }
-  return ParseQueueLine(line, size, parsed) ? Line::kParsed : Line::kMalformed;
-}
+struct FileState {
+  dev_t dev = 0;
+  ino_t ino = 0;
+  off_t offset = 0;  // the end of the last complete line read
+  size_t headSize = 0;
+  uint64_t headHash = 0;
+  size_t tailSize = 0;
+  uint64_t tailHash = 0;
+};
 
-bool IsReindexOf(const char* line, size_t size, const std::string& path) {
-  detail::ScannedEvent scanned;
-  QueueEvent parsed;
-  switch (ReadLine(line, size, scanned, parsed)) {
-    case Line::kScanned:
-      return scanned.event == static_cast<unsigned int>(kEventReindex) &&
-             scanned.pathSize == path.size() &&
-             std::memcmp(scanned.path, path.data(), path.size()) == 0;
-    case Line::kParsed:
-      return parsed.event == static_cast<unsigned int>(kEventReindex) && parsed.path == path;
-    case Line::kMalformed:
-      break;
-  }
-  return false;
-}
+struct ReindexEntry {
+  FileState file;
+  std::unordered_set<std::string> paths;  // every reindex path before `file.offset`
+};
 
-const char* Find(const char* from, const char* end, const std::string& needle) {
-  const void* at = memmem(from, static_cast<size_t>(end - from), needle.data(), needle.size());
-  return at != nullptr ? static_cast<const char*>(at) : end;
-}
+struct FolderEntry {
+  FileState file;
+  std::map<std::string, bool> folders;  // every folder asked about: found before the offset?
+  off_t logged = 0;                     // malformed lines that end before this were logged
+};
 
-const char* FindByte(const char* from, const char* end, char byte) {
-  const void* at = std::memchr(from, byte, static_cast<size_t>(end - from));
-  return at != nullptr ? static_cast<const char*>(at) : end;
-}
-
-// Whether the lines in [begin, end) hold a reindex of `path`. Only a line that holds `needle`
-// (the path as a JSON string without escapes) or a backslash can, so the search skips from one
-// such line to the next over the whole run.
-bool RunHoldsReindex(const char* begin, const char* end, const std::string& path,
-                     const std::string& needle) {
-  const char* from = begin;
-  const char* needleAt = Find(from, end, needle);
-  const char* backslashAt = FindByte(from, end, '\\');
-  for (;;) {
-    const char* hit = std::min(needleAt, backslashAt);
-    if (hit == end) {
-      return false;
-    }
-    const void* newline = memrchr(from, '\n', static_cast<size_t>(hit - from));
-    const char* lineStart = newline != nullptr ? static_cast<const char*>(newline) + 1 : from;
-    const char* lineEnd = FindByte(hit, end, '\n');
-    if (IsReindexOf(lineStart, static_cast<size_t>(lineEnd - lineStart), path)) {
-      return true;
-    }
-    if (lineEnd == end) {
-      return false;
-    }
-    from = lineEnd + 1;
-    if (needleAt < from) {
-      needleAt = Find(from, end, needle);
-    }
-    if (backslashAt < from) {
-      backslashAt = FindByte(from, end, '\\');
-    }
-  }
-}
-
-// Whether a path lies in a folder as StringStartWith(path + "/", full + "/") says, for a path
-// given as bytes and without building the string.
-class FolderPrefix {
+template <typename Entry>
+class Remembered {
  public:
-  explicit FolderPrefix(const std::string& full)
-      : m_prefix(full + "/"), m_plain(full.find('\0') == std::string::npos) {}
-
-  bool Holds(const char* path, size_t size) const {
-    if (m_prefix.size() > size + 1) {
+  // Takes the entry of `queueFile` out, if there is one.
+  bool Take(const std::string& queueFile, Entry& out) {
+    const std::lock_guard<std::mutex> lock(m_mutex);
+    const auto it = m_entries.find(queueFile);
+    if (it == m_entries.end()) {
       return false;
     }
-    if (m_plain) {
-      // Without a NUL in the prefix, comparing as C strings is comparing bytes; when the path is
-      // one byte shorter than the prefix, the slash after it meets the prefix's last "/".
-      return std::memcmp(path, m_prefix.data(), std::min(m_prefix.size(), size)) == 0;
-    }
-    for (size_t i = 0; i < m_prefix.size(); ++i) {
-      const char c = i < size ? path[i] : '/';
-      if (c != m_prefix[i]) {
-        return false;
-      }
-      if (c == '\0') {
-        return true;
-      }
-    }
+    out = std::move(it->second.second);
+    m_entries.erase(it);
     return true;
   }
 
-  bool HoldsEvent(unsigned int event, const char* path, size_t pathSize, const char* pathOld,
-                  size_t pathOldSize) const {
-    return Holds(path, pathSize) ||
-           (event == static_cast<unsigned int>(kEventMoved) && Holds(pathOld, pathOldSize));
+  void Put(const std::string& queueFile, Entry entry) {
+    const std::lock_guard<std::mutex> lock(m_mutex);
+    if (m_entries.size() >= kMaxFiles && m_entries.find(queueFile) == m_entries.end()) {
+      auto oldest = m_entries.begin();
+      for (auto it = m_entries.begin(); it != m_entries.end(); ++it) {
+        if (it->second.first < oldest->second.first) {
+          oldest = it;
+        }
+      }
+      m_entries.erase(oldest);
+    }
+    m_entries[queueFile] = std::make_pair(++m_clock, std::move(entry));
+  }
+
+  void Clear() {
+    const std::lock_guard<std::mutex> lock(m_mutex);
+    m_entries.clear();
   }
 
  private:
-  std::string m_prefix;
-  bool m_plain;
+  std::mutex m_mutex;
+  uint64_t m_clock = 0;
+  std::unordered_map<std::string, std::pair<uint64_t, Entry>> m_entries;
 };
 
-int LogWidth(size_t size) { return static_cast<int>(std::min<size_t>(size, INT_MAX)); }
+Remembered<ReindexEntry>& ReindexMemory() {
+  static Remembered<ReindexEntry> memory;
+  return memory;
+}
 
-// Handles every line in [begin, end): logs the malformed ones and, until one is found, looks for
-// an event inside `folder`.
-void ScanRunForFolder(const char* begin, const char* end, const FolderPrefix& folder, bool& found) {
-  for (const char* line = begin; line != end;) {
-    const char* lineEnd = FindByte(line, end, '\n');
-    const auto size = static_cast<size_t>(lineEnd - line);
-    detail::ScannedEvent scanned;
-    QueueEvent parsed;
-    switch (ReadLine(line, size, scanned, parsed)) {
-      case Line::kScanned:
-        found = found || folder.HoldsEvent(scanned.event, scanned.path, scanned.pathSize,
-                                           scanned.pathOld, scanned.pathOldSize);
-        break;
-      case Line::kParsed:
-        found = found || folder.HoldsEvent(parsed.event, parsed.path.data(), parsed.path.size(),
-                                           parsed.pathOld.data(), parsed.pathOld.size());
-        break;
-      case Line::kMalformed:
-        detail::WriteLog(false, kFolderUnit, __LINE__, "Malformed command: %.*s", LogWidth(size),
-                         line);
-        break;
+Remembered<FolderEntry>& FolderMemory() {
+  static Remembered<FolderEntry> memory;
+  return memory;
+}
+
+bool ReadExactly(int fd, off_t at, size_t size, std::string& out) {
+  out.resize(size);
+  size_t got = 0;
+  while (got < size) {
+    const ssize_t n = pread(fd, &out[got], size - got, at + static_cast<off_t>(got));
+    if (n < 0 && errno == EINTR) {
+      continue;
     }
-    line = lineEnd == end ? end : lineEnd + 1;
+    if (n <= 0) {
+      return false;
+    }
+    got += static_cast<size_t>(n);
   }
+  return true;
+}
+
+// Whether the file open at `fd` is still the file `state` describes with the same bytes before
+// its offset. The daemon replaces a queue by renaming another file over it (a new inode) or
+// truncates it; a truncated queue is shorter than the offset, or, once written again, holds
+// other events, so other bytes, at its start and just before the offset.
+bool StillTheSame(int fd, const FileState& state) {
+  struct stat st {};
+  if (fstat(fd, &st) != 0 || st.st_dev != state.dev || st.st_ino != state.ino ||
+      st.st_size < state.offset) {
+    return false;
+  }
+  std::string bytes;
+  return ReadExactly(fd, 0, state.headSize, bytes) &&
+         Hash(bytes.data(), bytes.size()) == state.headHash &&
+         ReadExactly(fd, state.offset - static_cast<off_t>(state.tailSize), state.tailSize,
+                     bytes) &&
+         Hash(bytes.data(), bytes.size()) == state.tailHash;
+}
+
+// Describes what `reader` read, up to the end of the last complete line `end`, of the file at
+// `fd`; false when it cannot be described (the bytes before `end` are no longer at hand).
+bool Describe(int fd, const BlockReader& reader, off_t end, const FileState* before,
+              FileState& out) {
+  struct stat st {};
+  if (fstat(fd, &st) != 0) {
+    return false;
+  }
+  out.dev = st.st_dev;
+  out.ino = st.st_ino;
+  out.offset = end;
+  if (before != nullptr && before->offset == end) {
+    out = *before;
+    return true;
+  }
+  if (!reader.TailWindow(end, out.tailHash, out.tailSize)) {
+    return false;
+  }
+  if (before != nullptr &&
+      static_cast<off_t>(before->headSize) == std::min<off_t>(end, static_cast<off_t>(kWindow))) {
+    out.headSize = before->headSize;
+    out.headHash = before->headHash;
+    return true;
+  }
+  out.headSize = static_cast<size_t>(std::min<off_t>(end, static_cast<off_t>(kWindow)));
+  if (reader.Head().size() < out.headSize) {
+    return false;
+  }
+  out.headHash = Hash(reader.Head().data(), out.headSize);
+  return true;
+}
+
+// True when nothing that could be a queue is at `queueFile`: it is missing, or it is not a regular
+// file. Anything else that keeps it from being looked at (a link on the way, no descriptor left)
+// is for the open to report.
+bool NoQueueAt(const std::string& queueFile) {
+  return !LocationFileExists(queueFile) &&
+         (errno == ENOENT || errno == ENOTDIR || errno == EISDIR || errno == ENXIO);
+}
+
+// ---------------------------------------------------------------------------------------------
+// The folder test.
+
+// Folder full paths, looked up by the ancestors of an event's path. A path lies in a folder as
+// StringStartWith(path + "/", full + "/") says: byte for byte, except that the comparison ends
+// at a NUL byte that both hold, so a folder with a NUL in its path is tested on its own.
+class FolderSet {
+ public:
+  explicit FolderSet(const std::vector<std::string>& fullPaths) : m_paths(fullPaths) {
+    for (size_t i = 0; i < m_paths.size(); ++i) {
+      const std::string& path = m_paths[i];
+      if (path.find('\0') != std::string::npos) {
+        m_odd.push_back(i);
+        continue;
+      }
+      m_byPath[path].push_back(i);
+      if (m_byPath.size() == 1) {
+        m_common = path;
+        m_minSize = path.size();
+      }
+      size_t same = 0;
+      while (same < m_common.size() && same < path.size() && m_common[same] == path[same]) {
+        ++same;
+      }
+      m_common.resize(same);
+      m_minSize = std::min(m_minSize, path.size());
+      m_maxSize = std::max(m_maxSize, path.size());
+      if (m_sizes.size() <= path.size()) {
+        m_sizes.resize(path.size() + 1, false);
+      }
+      m_sizes[path.size()] = true;
+    }
+    for (const size_t i : m_odd) {
+      m_maxSize = std::max(m_maxSize, m_paths[i].size());
+    }
+    m_sizes.resize(m_maxSize + 1, false);
+  }
+
+  // Bytes of an event's path that the test needs.
+  size_t Limit() const { return m_maxSize + 1; }
+  size_t Size() const { return m_paths.size(); }
+
+  // Marks in `found` the folders that hold the path (its first `path.size()` bytes of
+  // `fullSize`); returns how many of those marked anew are `asked`.
+  size_t Mark(std::string_view path, size_t fullSize, const std::vector<bool>& asked,
+              std::vector<bool>& found, std::vector<size_t>& marks) const {
+    size_t marked = 0;
+    const size_t upto = std::min(fullSize, m_maxSize);
+    // Every folder begins with the folders' common start; then only the ends of the path's
+    // components can be folders.
+    if (!m_byPath.empty() && fullSize >= m_minSize &&
+        path.compare(0, m_common.size(), m_common) == 0) {
+      for (size_t i = m_minSize; i <= upto;) {
+        const size_t slash = i < path.size() ? path.find('/', i) : std::string_view::npos;
+        const size_t end = slash != std::string_view::npos ? slash : fullSize;
+        if (end > upto) {
+          break;
+        }
+        const auto it = m_sizes[end] ? m_byPath.find(path.substr(0, end)) : m_byPath.end();
+        if (it != m_byPath.end()) {
+          for (const size_t f : it->second) {
+            if (!found[f]) {
+              found[f] = true;
+              marks.push_back(f);
+              marked += asked[f] ? 1 : 0;
+            }
+          }
+        }
+        i = end + 1;
+      }
+    }
+    for (const size_t f : m_odd) {
+      if (!found[f] && HoldsOdd(m_paths[f], path, fullSize)) {
+        found[f] = true;
+        marks.push_back(f);
+        marked += asked[f] ? 1 : 0;
+      }
+    }
+    return marked;
+  }
+
+ private:
+  static bool HoldsOdd(const std::string& folder, std::string_view path, size_t fullSize) {
+    if (folder.size() > fullSize) {
+      return false;
+    }
+    for (size_t i = 0; i <= folder.size(); ++i) {
+      const char want = i < folder.size() ? folder[i] : '/';
+      const char have = i < fullSize ? path[i] : '/';
+      if (have != want) {
+        return false;
+      }
+      if (have == '\0') {
+        return true;
+      }
+    }
+    return true;
+  }
+
+  const std::vector<std::string>& m_paths;
+  std::unordered_map<std::string_view, std::vector<size_t>> m_byPath;
+  std::vector<size_t> m_odd;
+  std::vector<bool> m_sizes;
+  std::string m_common;  // what all folders without a NUL begin with
+  size_t m_minSize = 0;
+  size_t m_maxSize = 0;
+};
+
+// The folder test of one open file, with what the process remembers of it.
+void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::string>& fullPaths,
+                   std::vector<bool>& found, const ReadOptions& options) {
+  FolderEntry entry;
+  const bool have =
+      options.remember && FolderMemory().Take(queueFile, entry) && StillTheSame(fd, entry.file);
+  // The folders looked for: those asked about now and, while the file stays the same, those asked
+  // about before, so that a listing's pages and single folders share one read.
+  std::vector<std::string> wanted;
+  std::vector<bool> wantedFound;
+  std::unordered_map<std::string_view, size_t> index;
+  bool subset = have;
+  if (have) {
+    for (const auto& folder : entry.folders) {
+      wanted.push_back(folder.first);
+      wantedFound.push_back(folder.second);
+    }
+  }
+  for (const std::string& path : fullPaths) {
+    if (!have || entry.folders.count(path) == 0) {
+      subset = false;
+      wanted.push_back(path);
+    }
+  }
+  if (!subset) {
+    // Read again from the start; the lines already read were logged already.
+    if (wanted.size() > kMaxRemembered) {
+      wanted = fullPaths;
+    }
+    std::sort(wanted.begin(), wanted.end());
+    wanted.erase(std::unique(wanted.begin(), wanted.end()), wanted.end());
+    wantedFound.assign(wanted.size(), false);
+  }
+  for (size_t i = 0; i < wanted.size(); ++i) {
+    index.emplace(wanted[i], i);
+  }
+  std::vector<bool> asked(wanted.size(), false);
+  for (const std::string& path : fullPaths) {
+    asked[index[path]] = true;
+  }
+  size_t left = 0;
+  for (size_t i = 0; i < wanted.size(); ++i) {
+    left += asked[i] && !wantedFound[i] ? 1 : 0;
+  }
+
+  const off_t from = subset ? entry.file.offset : 0;
+  const off_t quietUpTo = have ? entry.logged : 0;
+  std::vector<size_t> marks;  // folders found in the line read last
+  bool lastEnded = true;
+  off_t end = from;
+  std::unique_ptr<BlockReader> reader;
+  if (left > 0) {
+    const FolderSet set(wanted);
+    reader = std::make_unique<BlockReader>(fd, from, options.blockSize);
+    ReadLine line;
+    while (left > 0 && reader->Next(line, set.Limit())) {
+      marks.clear();
+      if (!line.isEvent) {
+        if (line.stop > quietUpTo) {
+          detail::WriteLog(false, kFolderUnit, __LINE__, "Malformed command: %.*s",
+                           LogWidth(line.text.size()), line.text.data());
+        }
+      } else {
+        left -= set.Mark(line.path, line.pathSize, asked, wantedFound, marks);
+        if (line.event.event == static_cast<unsigned int>(kEventMoved)) {
+          left -= set.Mark(line.pathOld, line.pathOldSize, asked, wantedFound, marks);
+        }
+      }
+      lastEnded = line.ended;
+      if (line.ended) {
+        end = line.stop;
+      }
+    }
+  }
+  // What a last line without "\n" found counts now, but is not remembered.
+  std::vector<bool> complete = wantedFound;
+  if (!lastEnded) {
+    for (const size_t f : marks) {
+      complete[f] = false;
+    }
+  }
+  for (size_t i = 0; i < fullPaths.size(); ++i) {
+    found[i] = wantedFound[index[fullPaths[i]]];
+  }
+  if (!options.remember) {
+    return;
+  }
+  FolderEntry next;
+  if (reader == nullptr) {
+    next.file = entry.file;
+  } else if (!Describe(fd, *reader, end, subset ? &entry.file : nullptr, next.file)) {
+    return;
+  }
+  for (size_t i = 0; i < wanted.size(); ++i) {
+    next.folders.emplace(wanted[i], complete[i]);
+  }
+  next.logged = std::max(quietUpTo, end);
+  FolderMemory().Put(queueFile, std::move(next));
 }
 
 }  // namespace
@@ -454,46 +1310,54 @@ bool ParseQueueLine(const char* line, size_t size, QueueEvent& out) {
   if (!root.isObject()) {
     return false;
   }
-  const Json::Value* event = Member(root, "event");
-  const Json::Value* path = Member(root, "path");
+  const auto member = [&root](const char* key) { return root.find(key, key + std::strlen(key)); };
+  const Json::Value* event = member("event");
+  const Json::Value* path = member("path");
   if (event == nullptr || path == nullptr || !event->isConvertibleTo(Json::uintValue) ||
       !path->isString()) {
     return false;
   }
   out.event = event->asUInt();
   out.path = path->asString();
-  const Json::Value* pathOld = Member(root, "path_old");
+  const Json::Value* pathOld = member("path_old");
   out.pathOld = pathOld != nullptr && pathOld->isString() ? pathOld->asString() : std::string();
   return true;
 }
 
 bool IsReindexQueued(const std::string& path, const std::string& queueFile) {
-  return detail::IsReindexQueued(path, queueFile, kBlockSize);
+  return detail::IsReindexQueued(path, queueFile, ReadOptions());
 }
 
 bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile) {
-  return detail::QueueHasFolderEvent(folder, queueFile, kBlockSize);
+  if (NoQueueAt(queueFile)) {
+    return false;
+  }
+  std::string full;
+  if (!GetFullPath(full, folder)) {
+    detail::WriteLog(false, kFolderUnit, __LINE__, "Cannot get full path: %s", folder.c_str());
+    return false;
+  }
+  std::vector<bool> found;
+  return detail::QueueFoldersWithEvents({full}, queueFile, found, ReadOptions{kBlockSize, false}) &&
+         found[0];
 }
 
-namespace {
-
-// True when nothing that could be a queue is at `queueFile`: it is missing, or it is not a regular
-// file. Anything else that keeps it from being looked at (a link on the way, no descriptor left)
-// is for the open to report.
-bool NoQueueAt(const std::string& queueFile) {
-  return !LocationFileExists(queueFile) &&
-         (errno == ENOENT || errno == ENOTDIR || errno == EISDIR || errno == ENXIO);
+bool QueueFoldersWithEvents(const std::vector<std::string>& fullPaths, const std::string& queueFile,
+                            std::vector<bool>& found) {
+  return detail::QueueFoldersWithEvents(fullPaths, queueFile, found, ReadOptions());
 }
-
-}  // namespace
 
 namespace detail {
 
-bool ScanQueueLine(const char* line, size_t size, ScannedEvent& out) {
-  return LineScanner(line, size).Event(out);
+LineVerdict ScanQueueLine(const char* line, size_t size, QueueEvent& out) {
+  LineSource source(line, line + size);
+  size_t pathSize = 0;
+  size_t pathOldSize = 0;
+  return LineScanner(source, SIZE_MAX).Event(out, pathSize, pathOldSize);
 }
 
-bool IsReindexQueued(const std::string& path, const std::string& queueFile, size_t blockSize) {
+bool IsReindexQueued(const std::string& path, const std::string& queueFile,
+                     const ReadOptions& options) {
   if (NoQueueAt(queueFile)) {
     return false;
   }
@@ -502,26 +1366,56 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile, size
     FILEINDEX_LOG("Failed to open queue=%s, reason=%s", queueFile.c_str(), ErrnoText().c_str());
     return false;
   }
-  const std::string needle = '"' + path + '"';
-  LineRuns runs(fd.get(), blockSize);
-  const char* begin = nullptr;
-  const char* end = nullptr;
-  while (runs.Next(begin, end)) {
-    if (RunHoldsReindex(begin, end, path, needle)) {
-      return true;
+  ReindexEntry entry;
+  bool have = options.remember && ReindexMemory().Take(queueFile, entry);
+  if (have && !StillTheSame(fd.get(), entry.file)) {
+    have = false;
+    entry = ReindexEntry();
+  }
+  if (have && entry.paths.count(path) != 0) {
+    ReindexMemory().Put(queueFile, std::move(entry));
+    return true;
+  }
+  // Every reindex path is collected for later questions; one too long to keep, or too many,
+  // and the file is not remembered.
+  bool keep = options.remember;
+  const size_t limit = std::max(path.size() + 1, kRememberedPath);
+  BlockReader reader(fd.get(), have ? entry.file.offset : 0, options.blockSize);
+  reader.OnlyReindexEvents();
+  ReadLine line;
+  bool queued = false;
+  off_t end = have ? entry.file.offset : 0;
+  while (!queued && reader.Next(line, limit)) {
+    if (!line.isEvent || line.event.event != static_cast<unsigned int>(kEventReindex)) {
+      if (line.ended) {
+        end = line.stop;
+      }
+      continue;
+    }
+    queued = line.pathSize == path.size() && line.path == path;
+    if (!line.ended) {
+      continue;
+    }
+    end = line.stop;
+    if (keep) {
+      keep = line.pathSize <= kRememberedPath && entry.paths.size() < kMaxRemembered;
+      if (keep) {
+        entry.paths.emplace(line.path);
+      }
     }
   }
-  return false;
+  FileState state;
+  if (keep && Describe(fd.get(), reader, end, have ? &entry.file : nullptr, state)) {
+    entry.file = state;
+    ReindexMemory().Put(queueFile, std::move(entry));
+  }
+  return queued;
 }
 
-bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile,
-                         size_t blockSize) {
+bool QueueFoldersWithEvents(const std::vector<std::string>& fullPaths, const std::string& queueFile,
+                            std::vector<bool>& found, const ReadOptions& options) {
+  found.assign(fullPaths.size(), false);
   if (NoQueueAt(queueFile)) {
-    return false;
-  }
-  std::string full;
-  if (!GetFullPath(full, folder)) {
-    WriteLog(false, kFolderUnit, __LINE__, "Cannot get full path: %s", folder.c_str());
     return false;
   }
   const UniqueFd fd = OpenLocationFile(queueFile, O_RDONLY);
@@ -530,16 +1424,16 @@ bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile
              ErrnoText().c_str());
     return false;
   }
-  // Every malformed line is logged, so the whole file is read even after a match.
-  const FolderPrefix prefix(full);
-  bool found = false;
-  LineRuns runs(fd.get(), blockSize);
-  const char* begin = nullptr;
-  const char* end = nullptr;
-  while (runs.Next(begin, end)) {
-    ScanRunForFolder(begin, end, prefix, found);
+  if (fullPaths.empty()) {
+    return true;
   }
-  return found;
+  FoldersInFile(fd.get(), queueFile, fullPaths, found, options);
+  return true;
+}
+
+void ForgetQueueScans() {
+  ReindexMemory().Clear();
+  FolderMemory().Clear();
 }
 
 }  // namespace detail

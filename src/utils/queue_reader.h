@@ -1,19 +1,31 @@
-// The two readers of a share's event queue (fileindex/queue.h): whether a reindex of a path is
-// queued, and whether any event falls inside a folder.
+// The readers of a share's event queue (fileindex/queue.h): whether a reindex of a path is
+// queued, and which of a set of folders hold an event.
 //
-// Queue files grow to millions of lines and are read on every progress report, so the readers
-// read in large blocks and leave to the JSON parser only the lines that a quick look at their
-// text cannot settle. Their answers are exactly those of parsing every line: a line that does not
-// parse, is not an object, lacks "event" or "path", has an "event" that is not convertible to an
-// unsigned integer or a "path" that is not a string counts as no event. A last line without "\n"
-// (a writer still busy) is read like any other line. Neither reader locks the file. The file is
-// opened as OpenLocationFile (storage.h) opens it: a link below the share, or anything but a
-// regular file, counts as a file that cannot be opened. Reentrant.
+// Queue files grow to millions of lines and are read on every progress report and every queued
+// event, so the readers read in blocks of 1 MiB, settle almost every line with a scanner of
+// their own (JSON string escapes included) and leave to the JSON parser only the rare lines the
+// scanner cannot settle. Their answers are exactly those of parsing every line: a line that does
+// not parse, is not an object, lacks "event" or "path", has an "event" that is not convertible to
+// an unsigned integer or a "path" that is not a string counts as no event. A last line without
+// "\n" (a writer still busy) is read like any other line.
+//
+// Memory stays within the block for any line length: a line longer than the block is scanned as
+// it streams past. Only such a line that the scanner cannot settle (a number or a nesting the
+// scanner leaves to the parser) is read a second time, whole, for the parser.
+//
+// The queue is append-only until the daemon replaces it (rename) or truncates it, so each process
+// remembers per queue file how far it has read (the end of the last complete line), a check of
+// the bytes before that point and what it found there, and next time reads only what was
+// appended; a file that is not the same file with the same bytes is read again from its start.
+// Neither reader locks the file. The file is opened as OpenLocationFile (storage.h) opens it: a
+// link below the share, or anything but a regular file, counts as a file that cannot be opened.
+// Safe for several threads.
 #ifndef FILEINDEX_SRC_UTILS_QUEUE_READER_H_
 #define FILEINDEX_SRC_UTILS_QUEUE_READER_H_
 
 #include <cstddef>
 #include <string>
+#include <vector>
 
 namespace WEZO {
 namespace FILEINDEX {
@@ -25,8 +37,8 @@ struct QueueEvent {
   std::string pathOld;  // empty unless the line carries a string "path_old"
 };
 
-// Parses the `size` bytes at `line` (without the "\n") into `out`. Returns false, with `out`
-// unspecified, for a line that counts as no event (see above).
+// Parses the `size` bytes at `line` (without the "\n") with the JSON parser into `out`. Returns
+// false, with `out` unspecified, for a line that counts as no event (see above).
 bool ParseQueueLine(const char* line, size_t size, QueueEvent& out);
 
 // True when the queue file `queueFile` holds a reindex event whose "path" equals `path` byte for
@@ -36,33 +48,51 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile);
 
 // True when the queue file `queueFile` holds an event inside the folder `folder` (a share path,
 // resolved with GetFullPath): its "path", or on a moved event its "path_old", is the folder's
-// full path or lies below it at a "/" boundary. Reads the whole file and logs each malformed line
-// ("status_mgr: Malformed command: <line>"). False, logged, when the folder cannot be resolved
-// or the file cannot be opened; false without a line when the file is missing.
+// full path or lies below it at a "/" boundary. False, logged, when the folder cannot be resolved
+// or the file cannot be opened; false without a line when the file is missing. Reads the file
+// plainly, without what the process remembers, up to the first such event, and logs each
+// malformed line on the way ("status_mgr: Malformed command: <line>"): the folder-by-folder
+// reading that QueueFoldersWithEvents answers as.
 bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile);
+
+// For each full path in `fullPaths`, whether the queue file `queueFile` holds an event inside
+// it (as QueueHasFolderEvent), in one read of the file that stops once every folder has one.
+// `found` gets one entry per path. False, logged, when the file exists but cannot be opened;
+// false without a line when it is missing; `found` is then all false. A malformed line is
+// logged the first time this process reads it while the file stays the same file.
+bool QueueFoldersWithEvents(const std::vector<std::string>& fullPaths, const std::string& queueFile,
+                            std::vector<bool>& found);
 
 namespace detail {
 
-// What a quick scan found in an event line: the spans point into the scanned line.
-struct ScannedEvent {
-  unsigned int event = 0;
-  const char* path = nullptr;
-  size_t pathSize = 0;
-  const char* pathOld = nullptr;  // nullptr unless "path_old" is a string
-  size_t pathOldSize = 0;
+// What the scanner makes of a line.
+enum class LineVerdict {
+  kEvent,    // an event, in `out`
+  kNoEvent,  // surely no event
+  kUnsure,   // only the parser can tell
 };
 
-// Looks at the `size` bytes at `line` without a JSON parse. True only for a line that
-// ParseQueueLine surely takes as an event, with `out` holding what it would give. False means
-// "unsure" and says nothing: only ParseQueueLine can tell. The scan gives up on every line with a
-// backslash, on numbers other than plain decimals, on comments, on deep nesting and on objects
-// of many members.
-bool ScanQueueLine(const char* line, size_t size, ScannedEvent& out);
+// Scans the `size` bytes at `line` without the JSON parser. kEvent and kNoEvent are what
+// ParseQueueLine says of the line; kUnsure is answered for numbers other than plain decimals,
+// comments, deep nesting and objects of many members, among others.
+LineVerdict ScanQueueLine(const char* line, size_t size, QueueEvent& out);
 
-// The readers with the size of their read blocks chosen by the caller (the public ones read
-// 1 MiB at a time), so that tests can put block boundaries inside lines.
-bool IsReindexQueued(const std::string& path, const std::string& queueFile, size_t blockSize);
-bool QueueHasFolderEvent(const std::string& folder, const std::string& queueFile, size_t blockSize);
+// How a reader reads: the size of its blocks (1 MiB for the public readers; tests put block
+// boundaries inside lines and escapes) and whether it uses and updates what the process
+// remembers of the file.
+struct ReadOptions {
+  size_t blockSize = size_t{1} << 20;
+  bool remember = true;
+};
+
+bool IsReindexQueued(const std::string& path, const std::string& queueFile,
+                     const ReadOptions& options);
+bool QueueFoldersWithEvents(const std::vector<std::string>& fullPaths, const std::string& queueFile,
+                            std::vector<bool>& found, const ReadOptions& options);
+
+// Forgets what this process remembers of every queue file, so that the next read of each starts
+// from its beginning.
+void ForgetQueueScans();
 
 }  // namespace detail
 }  // namespace FILEINDEX
