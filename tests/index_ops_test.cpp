@@ -167,6 +167,35 @@ TEST_F(IndexOpsTest, UpsertSavesThenRegistersStartsTellsTheDaemonAndQueuesUpdate
       << "the report of the second element, which switched photo off";
 }
 
+// The registration lists a share's folders, nothing of their settings; the service runs once a
+// folder is listed, unless the daemon stopped answering.
+TEST_F(IndexOpsTest, AnUpsertRegistersAndStartsOnlyWhatItsChangeNeeds) {
+  const struct {
+    const char* stored;
+    bool daemonListens;
+    const char* request;
+    std::string effects;
+  } cases[] = {
+      {"{}", true, R"([{"path":"/photo/a"}])", "watch photo: /photo/a; Start fileindexd"},
+      {R"({"/photo/a":{}})", true, R"([{"path":"/photo/a","photo":true}])", ""},
+      {R"({"/photo/a":{}})", false, R"([{"path":"/photo/a","photo":true}])", "Start fileindexd"},
+      {R"({"/photo/a":{}})", true, R"([{"path":"/photo/a"},{"path":"/video/v"}])",
+       "watch video: /video/v"},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.request);
+    Reset();
+    fake::Get().spotlight = 1;
+    WriteFile(FolderConfPath(), c.stored);
+    std::optional<FakeDaemon> daemon;
+    if (c.daemonListens) {
+      daemon.emplace();
+    }
+    EXPECT_EQ(IndexMgr::Upsert(ParseJson(c.request)), c.daemonListens) << "told the daemon";
+    EXPECT_EQ(Effects(), c.effects);
+  }
+}
+
 TEST_F(IndexOpsTest, UpsertFailuresAfterTheSaveKeepTheListAndSkipTheRest) {
   const std::string watch = "watch photo: /photo/a", start = "; Start fileindexd";
   const struct {

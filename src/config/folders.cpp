@@ -14,6 +14,7 @@
 #include "json_io.h"
 #include "paths.h"
 #include "utils/log.h"
+#include "utils/share_memo.h"
 
 namespace WEZO {
 namespace FILEINDEX {
@@ -99,6 +100,8 @@ std::string Folders::GetLockPath() const { return FolderLockPath(); }
 std::string Folders::GetPath() const { return FolderConfPath(); }
 
 bool Folders::Load() {
+  // Every folder of a share lies on the same volume: the share is looked up once per load.
+  const ShareLookupMemo memo;
   if (!LoadJson()) {
     return false;
   }
