@@ -48,21 +48,12 @@
 #include "fileindex/queue.h"
 #include "fileindex/root.h"
 #include "fileindex/status_mgr.h"
+#include "config/snapshot.h"
 #include "json_io.h"
 #include "layout.h"
 #include "paths.h"
 #include "utils/log.h"
-
-namespace WEZO {
-namespace FILEINDEX {
-namespace detail {
-// Drop the library's per-process caches of queue scans and of folder.conf / status.conf, so that
-// the next call costs what a process's first call costs.
-void ForgetQueueScans();
-void ForgetConfigSnapshots();
-}  // namespace detail
-}  // namespace FILEINDEX
-}  // namespace WEZO
+#include "utils/queue_reader.h"
 
 namespace {
 

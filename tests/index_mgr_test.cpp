@@ -2,13 +2,21 @@
 #include <gtest/gtest.h>
 #include <json/value.h>
 
+#include <atomic>
+#include <chrono>
 #include <filesystem>
+#include <functional>
 #include <string>
+#include <thread>
 
+#include "config/snapshot.h"
 #include "fake_platform.h"
 #include "fileindex/error.h"
 #include "fileindex/fileindex_c.h"
+#include "fileindex/folders.h"
 #include "fileindex/index_mgr.h"
+#include "fileindex/status.h"
+#include "fileindex/status_mgr.h"
 #include "paths.h"
 #include "test_support.h"
 
@@ -84,6 +92,132 @@ TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
                  IndexMgr::IsShareIndexed("photo"))
         << text;
   }
+}
+
+// Answers from what the process read before match a fresh load after each way the files change.
+// Some cases keep every read (no settling time), so that a change the kept snapshot misses shows.
+TEST_F(QueryTest, KeptSnapshotsAnswerAsAFreshLoadAfterEveryChange) {
+  const auto saveAs = [](const char* add, const char* remove, bool noSpace) {
+    Folders list;
+    Json::Value report;
+    ASSERT_TRUE(list.Lock(true) && list.Load() && list.Upsert(report, ParseJson(add)) &&
+                list.Delete(report, remove) && list.Save());
+    list.Unlock();
+    Status status;
+    ASSERT_TRUE(status.Lock(true) && status.Load() && status.ShareSetNoSpace("photo", noSpace) &&
+                status.Save());
+    status.Unlock();
+  };
+  const struct {
+    const char* change;
+    bool keepEveryRead;
+    std::function<void()> act;
+    std::vector<std::string> log;
+  } cases[] = {
+      {"saved by another writer",
+       true,
+       [&] { saveAs(R"({"path":"/photo/b"})", "/photo/a", false); },
+       {}},
+      {"rewritten in place, same size, at once",
+       false,
+       [] {
+         WriteFile(FolderConfPath(), R"({"/photo/b":{}})");
+         WriteFile(StatusConfPath(), R"({"no_space":{"photx":true}})");
+       },
+       {}},
+      {"removed",
+       true,
+       [] {
+         std::filesystem::remove(FolderConfPath());
+         std::filesystem::remove(StatusConfPath());
+       },
+       {}},
+      {"malformed",
+       true,
+       [] {
+         WriteFile(FolderConfPath(), "[1]");
+         WriteFile(StatusConfPath(), "{");
+       },
+       {"folders:N Malformed folders: [1]",
+        "config:N Failed to load json from " + StatusConfPath()}},
+  };
+  for (const auto& c : cases) {
+    SCOPED_TRACE(c.change);
+    detail::ForgetConfigSnapshots();
+    detail::SetSnapshotSettleTime(c.keepEveryRead ? std::chrono::seconds(0)
+                                                  : std::chrono::seconds(2));
+    WriteFile(FolderConfPath(), R"({"/photo/a":{}})");
+    WriteFile(StatusConfPath(), R"({"no_space":{"photo":true}})");
+    ASSERT_TRUE(IndexMgr::IsPathIndexed("/photo/a") && StatusMgr::ShareIsNoSpace("photo"));
+    c.act();
+    for (int ask = 0; ask < 2; ++ask) {  // a failed read fails again, with its line again
+      log.Clear();
+      ErrorHandler::SetError(FILEINDEX_ERR_NONE);
+      Folders fresh;
+      std::vector<Folder> folders;
+      const bool listed = fresh.Load() && fresh.List(folders);
+      Status freshStatus;
+      const bool noSpace = freshStatus.Load() && freshStatus.ShareIsNoSpace("photo");
+      const _tag_fileindex_err_ code = ErrorHandler::GetError();
+      EXPECT_EQ(log.Lines(), c.log);
+      log.Clear();
+      ErrorHandler::SetError(FILEINDEX_ERR_NONE);
+      for (const char* path : {"/photo/a", "/photo/b/x", "/photo"}) {
+        EXPECT_EQ(IndexMgr::IsPathIndexed(path), listed && IndexMgr::IsPathIndexed(path, folders))
+            << path;
+      }
+      EXPECT_EQ(IndexMgr::IsPathContainIndexed("/photo"),
+                listed && IndexMgr::IsPathContainIndexed("/photo", folders));
+      EXPECT_EQ(IndexMgr::IsFullPathIndexed(volume + "/photo/b"),
+                listed && IndexMgr::IsFullPathIndexed(volume + "/photo/b", folders));
+      EXPECT_EQ(StatusMgr::ShareIsNoSpace("photo"), noSpace);
+      EXPECT_EQ(ErrorHandler::GetError(), code);
+      std::vector<std::string> expected;
+      if (!c.log.empty()) {
+        expected.assign(5, c.log[0]);  // one read of the list per folder question
+        expected.push_back(c.log[1]);
+      }
+      EXPECT_EQ(log.Lines(), expected);
+    }
+  }
+  detail::SetSnapshotSettleTime(std::chrono::seconds(2));
+}
+
+// Two threads ask while a third saves the list again and again: every answer is one that either
+// list gives, and no read ever fails.
+TEST_F(QueryTest, ThreadsAskingWhileAnotherSavesSeeOneListOrTheOther) {
+  detail::SetSnapshotSettleTime(std::chrono::seconds(0));
+  WriteFile(FolderConfPath(), R"({"/photo/a":{}})");
+  std::atomic<bool> saving{true};
+  std::atomic<int> wrong{0};
+  const auto ask = [&] {
+    while (saving) {
+      // Both lists hold a folder in photo and none in video; each holds /photo/a or /photo/b.
+      if (!IndexMgr::IsPathContainIndexed("/photo") || IndexMgr::IsShareIndexed("video") ||
+          FILEIDXIsPathIndexed("/photo/c/x") == 1 || !IndexMgr::IsShareIndexed("photo")) {
+        ++wrong;
+      }
+    }
+  };
+  std::thread first(ask);
+  std::thread second(ask);
+  for (int i = 0; i < 60; ++i) {
+    Folders list;
+    Json::Value report;
+    const bool odd = i % 2 != 0;
+    EXPECT_TRUE(
+        list.Lock(true) && list.Load() &&
+        list.Upsert(report, ParseJson(odd ? R"({"path":"/photo/a"})" : R"({"path":"/photo/b"})")) &&
+        list.Delete(report, odd ? "/photo/b" : "/photo/a") && list.Save());
+    list.Unlock();
+  }
+  saving = false;
+  first.join();
+  second.join();
+  detail::SetSnapshotSettleTime(std::chrono::seconds(2));
+  EXPECT_EQ(wrong, 0);
+  EXPECT_THAT(log.Lines(), ::testing::IsEmpty());
+  EXPECT_TRUE(IndexMgr::IsPathIndexed("/photo/a/x")) << "the last save";
 }
 
 class MonitorRegistrationTest : public testsupport::LibraryTest {

@@ -167,14 +167,19 @@ TEST_F(IndexOpsTest, UpsertSavesThenRegistersStartsTellsTheDaemonAndQueuesUpdate
       << "the report of the second element, which switched photo off";
 }
 
-TEST_F(IndexOpsTest, UpsertFailuresAfterTheSaveKeepTheListAndSkipTheRest) {
-  const std::string watch = "watch photo: /photo/a", start = "; Start fileindexd";
+// Each case starts from the list `stored` (none: no file). The registration lists a share's
+// folders, nothing of their settings; the service runs once a folder is listed, unless the daemon
+// stopped answering.
+TEST_F(IndexOpsTest, UpsertsRegisterAndStartWhatTheyNeedAndFailuresAfterTheSaveSkipTheRest) {
+  const std::string watch = "watch photo: /photo/a", start = "; Start fileindexd",
+                    spotlight = "; Spotlight 1; Restart samba", kept = R"({"/photo/a":{}})";
   const struct {
     bool fake::Platform::*fails;  // null: none
     bool daemonListens, result;
     std::string effects;
     size_t queued;  // frames and events
     std::string log;
+    std::string stored{}, request = R"([{"path":"/photo/a"}])";
   } cases[] = {
       {&fake::Platform::monitor_upsert_fails, true, false, watch, 0,
        "index_mgr:N MonitorQueue::Add failed; index_mgr:N UpsertWEZtifydCfg failed, share=photo"},
@@ -182,18 +187,26 @@ TEST_F(IndexOpsTest, UpsertFailuresAfterTheSaveKeepTheListAndSkipTheRest) {
        "index_mgr:N WLIBServiceStart failed: err=[0x0E01 fake_platform:N]"},
       {&fake::Platform::spotlight_set_fails, true, true, watch + start + "; Spotlight 1", 1,
        "index_mgr:N WEZOSMBSetSpotlight failed: err=[0x0E01 fake_platform:N]"},
-      {&fake::Platform::service_restart_fails, true, true,
-       watch + start + "; Spotlight 1; Restart samba", 1,
+      {&fake::Platform::service_restart_fails, true, true, watch + start + spotlight, 1,
        "index_mgr:N WLIBServiceRestart failed: err=[0x0E01 fake_platform:N]"},
       {&fake::Platform::spotlight_query_fails, true, true, watch + start, 1, ""},
-      {nullptr, false, false, watch + start + "; Spotlight 1; Restart samba", 0,
+      {nullptr, false, false, watch + start + spotlight, 0,
        "index_mgr:N SendCammandToDaemon failed"},
+      // A change of settings only: registered already, and the daemon answers.
+      {nullptr, true, true, spotlight.substr(2), 1, "", kept},
+      {nullptr, false, false, start.substr(2) + spotlight, 0,
+       "index_mgr:N SendCammandToDaemon failed", kept},
+      {nullptr, true, true, "watch video: /video/v" + spotlight, 2, "", kept,
+       R"([{"path":"/photo/a","photo":true},{"path":"/video/v"}])"},
   };
   for (const auto& c : cases) {
-    SCOPED_TRACE(c.log);
+    SCOPED_TRACE(c.log + " " + c.request);
     Reset();
     std::filesystem::remove_all(volume + "/photo/@eaDir");
     std::filesystem::remove(FolderConfPath());
+    if (!c.stored.empty()) {
+      WriteFile(FolderConfPath(), c.stored);
+    }
     if (c.fails != nullptr) {
       fake::Get().*c.fails = true;
     }
@@ -201,11 +214,11 @@ TEST_F(IndexOpsTest, UpsertFailuresAfterTheSaveKeepTheListAndSkipTheRest) {
     if (c.daemonListens) {
       daemon.emplace();
     }
-    EXPECT_EQ(IndexMgr::Upsert(ParseJson(R"([{"path":"/photo/a"}])")), c.result);
-    EXPECT_EQ(Saved(), "/photo/a");
+    EXPECT_EQ(IndexMgr::Upsert(ParseJson(c.request)), c.result);
+    EXPECT_EQ(Saved().substr(0, 8), "/photo/a");
     EXPECT_EQ(Effects(), c.effects);
     if (daemon) {
-      EXPECT_EQ(daemon->Connections(c.queued, Ms(c.queued * 5000 + 100)).size(), c.queued);
+      EXPECT_EQ(daemon->Commands(c.queued, Ms(c.queued * 5000 + 100)).size(), c.queued);
     }
     EXPECT_EQ(Events("photo").empty(), c.queued == 0);
     EXPECT_EQ(Log(), c.log);

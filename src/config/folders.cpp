@@ -17,6 +17,7 @@
 #include "paths.h"
 #include "status_mgr/progress.h"
 #include "utils/log.h"
+#include "utils/share_memo.h"
 
 namespace WEZO {
 namespace FILEINDEX {
@@ -102,6 +103,8 @@ std::string Folders::GetLockPath() const { return FolderLockPath(); }
 std::string Folders::GetPath() const { return FolderConfPath(); }
 
 bool Folders::Load() {
+  // Every folder of a share lies on the same volume: the share is looked up once per load.
+  const ShareLookupMemo memo;
   if (!LoadJson()) {
     return false;
   }

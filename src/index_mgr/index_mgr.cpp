@@ -14,6 +14,7 @@
 #include <string>
 #include <vector>
 
+#include "config/snapshot.h"
 #include "config/transaction.h"
 #include "fileindex/daemon.h"
 #include "fileindex/error.h"
@@ -24,6 +25,7 @@
 #include "json_io.h"
 #include "layout.h"
 #include "status_mgr/status_change.h"
+#include "utils/daemon_probe.h"
 #include "utils/log.h"
 #include "utils/path_rules.h"
 #include "utils/storage.h"
@@ -198,6 +200,53 @@ bool FollowRemovedFolders(const std::string& share) {
   return true;
 }
 
+bool ShareQueue(const std::string& share, std::string& queue) {
+  if (!ShareQueuePath(share, queue)) {
+    FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", share.c_str());
+    return false;
+  }
+  return true;
+}
+
+// Registers with the monitor, for the queue `queue`, every folder of `list` in the share `share`,
+// or none: one folder that cannot be placed fails the registration before the monitor hears of it.
+bool RegisterShare(const std::string& share, const std::string& queue, const Folders& list) {
+  std::vector<Folder> folders;
+  list.List(folders, share);
+
+  Json::Value ignore(Json::arrayValue);
+  ignore.append(kMetadataDirName);
+  Json::Value config(Json::arrayValue);
+  for (const Folder& folder : folders) {
+    std::string fullPath;
+    // A partial registration would silently stop watching the folders left out.
+    if (!GetFullPath(fullPath, folder.GetPath())) {
+      FILEINDEX_LOG("GetFullPath failed, path=%s", folder.GetPath().c_str());
+      return false;
+    }
+    Json::Value dir(Json::objectValue);
+    dir["path"] = fullPath;
+    dir["mask"] = kMonitorMask;
+    dir["ignore"] = ignore;
+    config.append(dir);
+  }
+  Json::Value entry(Json::objectValue);
+  entry["queue"] = queue;
+  entry["config"] = config;
+
+  std::unique_ptr<WEZOTIFYD::MonitorQueue> monitorQueue;
+  try {
+    monitorQueue = std::make_unique<WEZOTIFYD::MonitorQueue>(entry);
+  } catch (const std::exception&) {
+    return false;
+  }
+  if (!WEZOTIFYD::MonitorQueue::Upsert(*monitorQueue, kMonitorClient, WEZOTIFYD::QUEUE_TYPE_FILE)) {
+    FILEINDEX_LOG("MonitorQueue::Add failed");
+    return false;
+  }
+  return true;
+}
+
 // Adds the share of the share path `path` to `shares`.
 bool AddShareOf(const std::string& path, std::set<std::string>& shares) {
   std::string share;
@@ -209,62 +258,84 @@ bool AddShareOf(const std::string& path, std::set<std::string>& shares) {
   return true;
 }
 
+// Adds or changes the folders of `request`. The folder list's lock is held for what must follow
+// the save in the order of the saves: the monitor's registration (a later writer's must be the one
+// that stays), the service and Spotlight (a writer that removes the last folder stops them), and
+// the daemon's commands. The update events follow after the lock: the daemon takes the queue in
+// its own time and reads the settings from folder.conf when it does.
 bool UpsertFolders(const Json::Value& request) {
   if (!request.isArray()) {
     RefuseRequest(__LINE__, request);
     return false;
   }
-  Folders list;
-  ConfigTransaction transaction(list);
-  if (!transaction.Begin()) {
-    return false;
-  }
-  // An element without a string "path" is left to Folders::Upsert, which refuses it in its own
-  // words.
-  PathCheck check(list);
-  for (const Json::Value& element : request) {
-    std::string path;
-    if (RetrieveStringFromJsonObj(path, "path", element) && !check.Accepts(path)) {
-      RefuseRequest(__LINE__, request);
-      return false;
-    }
-  }
-
-  std::vector<std::string> paths;
   std::map<std::string, Json::Value> changed;  // a later element replaces an earlier report
-  std::set<std::string> shares;
-  for (const Json::Value& element : request) {
-    const std::string path = element.get("path", "").asString();
-    Json::Value report;
-    if (!list.Upsert(report, element)) {
-      FILEINDEX_LOG("Upsert failed, folder=%s", JsonToString(element).c_str());
+  {
+    Folders list;
+    ConfigTransaction transaction(list);
+    if (!transaction.Begin()) {
       return false;
     }
-    changed[path] = report;
-    if (!AddShareOf(path, shares)) {
-      return false;
+    // An element without a string "path" is left to Folders::Upsert, which refuses it in its own
+    // words.
+    PathCheck check(list);
+    for (const Json::Value& element : request) {
+      std::string path;
+      if (RetrieveStringFromJsonObj(path, "path", element) && !check.Accepts(path)) {
+        RefuseRequest(__LINE__, request);
+        return false;
+      }
     }
-    paths.push_back(path);
-  }
-  if (!transaction.Commit()) {
-    return false;
-  }
 
-  for (const std::string& share : shares) {
-    if (!IndexMgr::UpsertWEZotifydCfg(share)) {
-      FILEINDEX_LOG("UpsertWEZtifydCfg failed, share=%s", share.c_str());
+    std::vector<Folder> before;
+    list.List(before);
+    std::set<std::string> stored;
+    for (const Folder& folder : before) {
+      stored.insert(folder.GetPath());
+    }
+    std::vector<std::string> paths;
+    std::set<std::string> shares;
+    std::set<std::string> grown;  // the shares that gained a folder
+    for (const Json::Value& element : request) {
+      const std::string path = element.get("path", "").asString();
+      Json::Value report;
+      if (!list.Upsert(report, element)) {
+        FILEINDEX_LOG("Upsert failed, folder=%s", JsonToString(element).c_str());
+        return false;
+      }
+      changed[path] = report;
+      if (!AddShareOf(path, shares)) {
+        return false;
+      }
+      if (stored.insert(path).second) {
+        AddShareOf(path, grown);
+      }
+      paths.push_back(path);
+    }
+    if (!transaction.Commit()) {
       return false;
     }
-  }
-  // Started on every call: starting a running service is harmless, and it may have stopped.
-  if (WLIBServiceStart(kIndexService, kServiceFlags) < 0) {
-    FILEINDEX_LOG_PLATFORM_FAILURE("WLIBServiceStart");
-    return false;
-  }
-  EnableSpotlight();
-  for (const std::string& path : paths) {
-    if (!TellDaemonOfFolder("upsert_folder_setting", path)) {
+
+    // The registration lists the share's folders and nothing of their settings: a share whose
+    // folders stay the same keeps the one it has.
+    for (const std::string& share : grown) {
+      std::string queue;
+      if (!ShareQueue(share, queue) || !RegisterShare(share, queue, list)) {
+        FILEINDEX_LOG("UpsertWEZtifydCfg failed, share=%s", share.c_str());
+        return false;
+      }
+    }
+    // The daemon runs once a folder was listed, unless it stopped: then it is started, as it is
+    // for the first folder.
+    if ((before.empty() || !DaemonAcceptsConnection()) &&
+        WLIBServiceStart(kIndexService, kServiceFlags) < 0) {
+      FILEINDEX_LOG_PLATFORM_FAILURE("WLIBServiceStart");
       return false;
+    }
+    EnableSpotlight();
+    for (const std::string& path : paths) {
+      if (!TellDaemonOfFolder("upsert_folder_setting", path)) {
+        return false;
+      }
     }
   }
   return std::all_of(changed.begin(), changed.end(), [](const auto& pathAndReport) {
@@ -425,36 +496,31 @@ bool IndexMgr::IsPathContainIndexed(const std::string& path, const std::vector<F
 }
 
 bool IndexMgr::IsPathIndexed(const std::string& path) {
-  std::vector<Folder> folders;
-  return List(folders) && IsPathIndexed(path, folders);
+  const std::shared_ptr<const FolderSnapshot> list = FolderListSnapshot();
+  return list != nullptr && list->IsPathIndexed(path);
 }
 
 bool IndexMgr::IsFullPathIndexed(const std::string& fullPath) {
-  std::vector<Folder> folders;
-  return List(folders) && IsFullPathIndexed(fullPath, folders);
+  const std::shared_ptr<const FolderSnapshot> list = FolderListSnapshot();
+  return list != nullptr && list->IsFullPathIndexed(fullPath);
 }
 
 bool IndexMgr::IsPathContainIndexed(const std::string& path) {
-  std::vector<Folder> folders;
-  return List(folders) && IsPathContainIndexed(path, folders);
+  const std::shared_ptr<const FolderSnapshot> list = FolderListSnapshot();
+  return list != nullptr && list->IsPathContainIndexed(path);
 }
 
 bool IndexMgr::IsShareIndexed(const std::string& share) {
-  std::vector<Folder> folders;
-  if (!List(folders)) {
+  const std::shared_ptr<const FolderSnapshot> list = FolderListSnapshot();
+  if (list == nullptr) {
     return false;
   }
-  for (const Folder& folder : folders) {
-    std::string name;
-    if (!GetShareNameByPath(name, folder.GetPath())) {
-      FILEINDEX_LOG("Failed to get share name from path: %s", folder.GetPath().c_str());
-      continue;
-    }
-    if (name == share) {
-      return true;
-    }
+  // Only the empty path names no share, and it comes first in the list's order: it is met, and
+  // logged, before any folder could answer.
+  if (list->HoldsUnnamedFolder()) {
+    FILEINDEX_LOG("Failed to get share name from path: %s", "");
   }
-  return false;
+  return list->HoldsShare(share);
 }
 
 bool IndexMgr::Upsert(const Json::Value& folders) {
@@ -586,54 +652,13 @@ bool IndexMgr::CleanShareIndexData(const std::string& share) {
 
 bool IndexMgr::UpsertWEZotifydCfg(const std::string& share) {
   std::string queue;
-  if (!ShareQueuePath(share, queue)) {
-    FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", share.c_str());
-    return false;
-  }
   Folders list;
-  std::vector<Folder> folders;
-  if (!list.Load() || !list.List(folders, share)) {
-    return false;
-  }
-
-  Json::Value ignore(Json::arrayValue);
-  ignore.append(kMetadataDirName);
-  Json::Value config(Json::arrayValue);
-  for (const Folder& folder : folders) {
-    std::string fullPath;
-    // One folder that cannot be placed blocks the whole registration: a partial one would
-    // silently stop watching the folders left out.
-    if (!GetFullPath(fullPath, folder.GetPath())) {
-      FILEINDEX_LOG("GetFullPath failed, path=%s", folder.GetPath().c_str());
-      return false;
-    }
-    Json::Value dir(Json::objectValue);
-    dir["path"] = fullPath;
-    dir["mask"] = kMonitorMask;
-    dir["ignore"] = ignore;
-    config.append(dir);
-  }
-  Json::Value entry(Json::objectValue);
-  entry["queue"] = queue;
-  entry["config"] = config;
-
-  std::unique_ptr<WEZOTIFYD::MonitorQueue> monitorQueue;
-  try {
-    monitorQueue = std::make_unique<WEZOTIFYD::MonitorQueue>(entry);
-  } catch (const std::exception&) {
-    return false;
-  }
-  if (!WEZOTIFYD::MonitorQueue::Upsert(*monitorQueue, kMonitorClient, WEZOTIFYD::QUEUE_TYPE_FILE)) {
-    FILEINDEX_LOG("MonitorQueue::Add failed");
-    return false;
-  }
-  return true;
+  return ShareQueue(share, queue) && list.Load() && RegisterShare(share, queue, list);
 }
 
 bool IndexMgr::DeleteWEZotifydCfg(const std::string& share) {
   std::string queue;
-  if (!ShareQueuePath(share, queue)) {
-    FILEINDEX_LOG("FILEIDXQueuePathGet failed, share=%s", share.c_str());
+  if (!ShareQueue(share, queue)) {
     return false;
   }
   if (!WEZOTIFYD::MonitorQueue::Delete(queue, kMonitorClient, WEZOTIFYD::QUEUE_TYPE_FILE)) {

@@ -2,6 +2,7 @@
 
 #include "status_mgr/status_change.h"
 
+#include "config/snapshot.h"
 #include "config/transaction.h"
 #include "fileindex/daemon.h"
 #include "utils/log.h"
@@ -23,8 +24,8 @@ bool ChangeStatus(const std::function<bool(Status&)>& change, const DaemonComman
 }
 
 bool QueryStatus(const std::function<bool(const Status&)>& query) {
-  Status status;
-  return status.Load() && query(status);
+  const std::shared_ptr<const Status> status = StatusSnapshot();
+  return status != nullptr && query(*status);
 }
 
 bool ReviveShare(const std::string& share) {

@@ -26,7 +26,8 @@ struct DaemonCommand {
 // a change that was not saved.
 bool ChangeStatus(const std::function<bool(Status&)>& change, const DaemonCommand& command = {});
 
-// Loads the status file without the lock and answers `query` on it; false when the file cannot
+// Answers `query` on the status file as it is now, read without the lock (config/snapshot.h: a
+// file unchanged since this process last read it is not read again); false when the file cannot
 // be loaded.
 bool QueryStatus(const std::function<bool(const Status&)>& query);
 

@@ -1,5 +1,7 @@
 #include "fileindex/daemon.h"
 
+#include "utils/daemon_probe.h"
+
 #include <sys/socket.h>
 #include <sys/time.h>
 #include <sys/un.h>
@@ -56,14 +58,11 @@ bool WriteAll(int fd, size_t count, const char* buffer, int& interruptionsLeft) 
   return true;
 }
 
-}  // namespace
-
-bool SendCammandToDaemon(const std::string& type, const Json::Value& data) {
-  UniqueFd sock(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+// Connects `sock` to the daemon's socket. False when the path does not fit or nobody accepts.
+bool ConnectToDaemon(const UniqueFd& sock) {
   if (!sock) {
     return false;
   }
-
   const std::string path = DaemonSocketPath();
   sockaddr_un address{};
   // A truncated path would name another socket; better not to reach the daemon at all.
@@ -75,8 +74,21 @@ bool SendCammandToDaemon(const std::string& type, const Json::Value& data) {
   // Set before connecting: a local stream connect waits for room in the daemon's backlog for as
   // long as the send timeout allows (then EAGAIN), and without one it waits for good, with the
   // caller's configuration lock held.
-  if (setsockopt(sock.get(), SOL_SOCKET, SO_SNDTIMEO, &kSendTimeout, sizeof(kSendTimeout)) != 0 ||
-      connect(sock.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0) {
+  return setsockopt(sock.get(), SOL_SOCKET, SO_SNDTIMEO, &kSendTimeout, sizeof(kSendTimeout)) ==
+             0 &&
+         connect(sock.get(), reinterpret_cast<const sockaddr*>(&address), sizeof(address)) == 0;
+}
+
+}  // namespace
+
+bool DaemonAcceptsConnection() {
+  const UniqueFd sock(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  return ConnectToDaemon(sock);
+}
+
+bool SendCammandToDaemon(const std::string& type, const Json::Value& data) {
+  const UniqueFd sock(socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+  if (!ConnectToDaemon(sock)) {
     return false;
   }
 

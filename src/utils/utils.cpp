@@ -5,23 +5,54 @@
 #include <sys/stat.h>
 #include <wezo/platform.h>
 
+#include <algorithm>
 #include <cstring>
+#include <optional>
+#include <utility>
 
 #include "fileindex/error.h"
-#include "utils/log.h"
 #include "paths.h"
+#include "utils/log.h"
+#include "utils/share_memo.h"
 #include "utils/share_record.h"
 
 namespace WEZO {
 namespace FILEINDEX {
 namespace {
 
+thread_local ShareLookupMemo::Volumes* t_memo = nullptr;
+
 bool LstatTypeIs(const std::string& path, mode_t type) {
   struct stat st {};
   return lstat(path.c_str(), &st) == 0 && (st.st_mode & S_IFMT) == type;
 }
 
+bool FullPathOn(const std::optional<std::string>& volume, const std::string& path,
+                std::string& fullPath) {
+  if (!volume) {
+    ErrorHandler::SetError(FILEINDEX_ERR_PATH);
+    return false;
+  }
+  fullPath = *volume + path;
+  return true;
+}
+
 }  // namespace
+
+ShareLookupMemo::ShareLookupMemo() {
+  if (t_memo == nullptr) {
+    t_memo = &m_volumes;
+    m_installed = true;
+  }
+}
+
+ShareLookupMemo::~ShareLookupMemo() {
+  if (m_installed) {
+    t_memo = nullptr;
+  }
+}
+
+ShareLookupMemo::Volumes* ShareLookupMemo::Current() { return t_memo; }
 
 bool IsDirExist(const std::string& path) { return LstatTypeIs(path, S_IFDIR); }
 
@@ -89,16 +120,23 @@ bool GetFullPath(std::string& fullPath, const std::string& path) {
     FILEINDEX_LOG("GetShareNameByPath failed, path=%s", path.c_str());
     return false;
   }
-  ShareRecord share;
-  if (LookUpShare(shareName, share) < 0 || !share) {
-    ErrorHandler::SetError(FILEINDEX_ERR_PATH);
-    return false;
+  ShareLookupMemo::Volumes* const memo = ShareLookupMemo::Current();
+  auto known = memo != nullptr ? memo->find(shareName) : ShareLookupMemo::Volumes::iterator();
+  if (memo == nullptr || known == memo->end()) {
+    ShareRecord share;
+    std::optional<std::string> volume;
+    if (LookUpShare(shareName, share) >= 0 && share) {
+      // The volume comes from where the share really lies: everything before the share's own
+      // name.
+      const std::string sharePath = SharePathOf(*share);
+      volume = sharePath.substr(0, std::min(sharePath.rfind('/'), sharePath.size()));
+    }
+    if (memo == nullptr) {
+      return FullPathOn(volume, path, fullPath);
+    }
+    known = memo->emplace(shareName, std::move(volume)).first;
   }
-  // The volume comes from where the share really lies: everything before the share's own name.
-  const std::string sharePath = SharePathOf(*share);
-  const size_t slash = sharePath.rfind('/');
-  fullPath = (slash == std::string::npos ? sharePath : sharePath.substr(0, slash)) + path;
-  return true;
+  return FullPathOn(known->second, path, fullPath);
 }
 
 std::string ReplaceShareName(const std::string& path, const std::string& newShareName) {

@@ -244,8 +244,22 @@ std::vector<std::string> FakeDaemon::Connections(size_t count, std::chrono::mill
 }
 
 std::vector<Json::Value> FakeDaemon::Commands(size_t count, std::chrono::milliseconds timeout) {
+  std::vector<std::string> frames;
+  {
+    // A connection closed without a byte asked whether the daemon answers; it is no command.
+    const auto commands = [this] {
+      return static_cast<size_t>(std::count_if(m_ended.begin(), m_ended.end(),
+                                               [](const std::string& f) { return !f.empty(); }));
+    };
+    std::unique_lock<std::mutex> lock(m_mutex);
+    m_changed.wait_for(lock, timeout, [&] { return commands() >= count; });
+    frames = m_ended;
+  }
   std::vector<Json::Value> out;
-  for (const std::string& frame : Connections(count, timeout)) {
+  for (const std::string& frame : frames) {
+    if (frame.empty()) {
+      continue;
+    }
     uint32_t length = 0;
     std::memcpy(&length, frame.data(), std::min(frame.size(), sizeof(length)));
     if (frame.size() <= sizeof(length) || length != frame.size() - sizeof(length) ||

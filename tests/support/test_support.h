@@ -82,7 +82,9 @@ class FakeDaemon {
   // ended or `timeout` passed.
   std::vector<std::string> Connections(size_t count,
                                        std::chrono::milliseconds timeout = std::chrono::seconds(5));
-  // The same decoded; a length field that is not the rest's size, or no single final zero, fails.
+  // The commands decoded, once `count` have ended or `timeout` passed; connections closed without
+  // a byte are left out. A length field that is not the rest's size, or no single final zero,
+  // fails.
   std::vector<Json::Value> Commands(size_t count,
                                     std::chrono::milliseconds timeout = std::chrono::seconds(5));
 
