@@ -22,5 +22,6 @@ ctest --test-dir build-sanitize -j"$jobs" --output-on-failure
 
 build/bench/fileindex_bench --benchmark_min_time=0.01 >/dev/null
 build/bench/fileindex_platform_bench --benchmark_min_time=0.01 >/dev/null
+build/bench/read_paths_bench --benchmark_min_time=0.01 >/dev/null
 build/bench/monitor_bench --benchmark_filter=BM_Burst >/dev/null
 ./scripts/fuzz.sh 5
