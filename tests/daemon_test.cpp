@@ -20,8 +20,7 @@
 #include "paths.h"
 #include "test_support.h"
 
-namespace WEZO {
-namespace FILEINDEX {
+namespace WEZO::FILEINDEX {
 namespace {
 
 using Clock = std::chrono::steady_clock;
@@ -39,11 +38,8 @@ using DaemonTest = testsupport::LibraryTest;
 // far over the socket buffer.
 TEST_F(DaemonTest, EachCallIsOneConnectionWithOneExactFrame) {
   FakeDaemon daemon;
-  ASSERT_TRUE(SendCammandToDaemon("resume", Json::Value(Json::objectValue)));
-  std::vector<std::string> expected = {
-      std::string(__BYTE_ORDER__ == __ORDER_LITTLE_ENDIAN__ ? "\x1c\0\0\0" : "\0\0\0\x1c", 4) +
-      std::string("{\"data\":{},\"type\":\"resume\"}\0", 28)};
-  for (const uint32_t size : {1023U, 1024U, 1025U, 5000U, 1U << 20}) {
+  std::vector<std::string> expected;
+  for (const uint32_t size : {23U, 1023U, 1024U, 1025U, 5000U, 1U << 20}) {
     const std::string s(size - 23, 'x');  // {"data":"<s>","type":"t"} is 22 bytes more than s
     ASSERT_TRUE(SendCammandToDaemon("t", s)) << size;
     expected.push_back(std::string(reinterpret_cast<const char*>(&size), 4) + R"({"data":")" + s +
@@ -134,5 +130,4 @@ TEST_F(DaemonTest, ADaemonWhoseBacklogStaysFullCostsTheCallerASecondNotForever) 
 }
 
 }  // namespace
-}  // namespace FILEINDEX
-}  // namespace WEZO
+}  // namespace WEZO::FILEINDEX

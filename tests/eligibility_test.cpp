@@ -102,10 +102,7 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
     const std::string fullPath = volume + (*c.folder != '\0' ? c.folder : "/photo/2019");
     Arrange(c.setup, fake::Get().facts[fullPath]);
     EXPECT_EQ(FullPathIndexRule(fullPath), c.rule);
-    // Calls after the deciding one are bookkeeping (releasing the share record).
-    std::vector<std::string> ops = fake::Get().OpNames();
-    while (ops.size() > 1 && ops.back() == "WLIBCErrGet") ops.pop_back();
-    EXPECT_EQ(ops.back(), c.decidingCall);
+    EXPECT_EQ(fake::Get().calls.back().op, c.decidingCall);
     EXPECT_EQ(fake::Get().openShareRecords, 0);
     EXPECT_EQ(ErrorHandler::GetError(),
               c.rule == R::kNoShare ? FILEINDEX_ERR_PATH : FILEINDEX_ERR_NONE);
@@ -114,14 +111,6 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
     EXPECT_EQ(log.Lines().empty() ? "" : log.Lines().back(), line);
     ErrorHandler::SetError(FILEINDEX_ERR_NONE);
   }
-}
-
-TEST_F(EligibilityTest, SharePathThatCannotBeResolvedSetsThePathCode) {
-  EXPECT_FALSE(CanPathBeIndexed("/nosuch/2019"));
-  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_PATH);
-  EXPECT_THAT(log.Lines(), ElementsAre("utils:N GetFullPath failed, path=/nosuch/2019"));
-  EXPECT_TRUE(CanPathBeIndexed("/photo/2019"));
-  EXPECT_FALSE(CanShareBeIndexed(nullptr));
 }
 
 // Rows: '+' skipped or '-' not, the name in /volume1/photo ("no-slash" as it stands), then the
@@ -138,11 +127,11 @@ TEST_F(EligibilityTest, CrawledItemsAreSkippedByNameLocationAndFileSystem) {
     Arrange(row.substr(space), fake::Get().defaultFacts);
     EXPECT_EQ(IsSkipIndex(name == "no-slash" ? name : "/volume1/photo/" + name), row[0] == '+')
         << row;
-    EXPECT_EQ(fake::Get().OpNames().front(), "WEZOGetFSType") << row;
+    EXPECT_EQ(fake::Get().calls.front().op, "WEZOGetFSType") << row;
   }
 }
 
-TEST_F(EligibilityTest, OnlyADefiniteOutOfSpaceAnswerMeansNoRoom) {
+TEST_F(EligibilityTest, OnlyADefiniteOutOfSpaceAnswerMeansNoRoomAndAnUnknownShareNoPath) {
   const struct {
     bool enough;
     int error;
@@ -163,7 +152,12 @@ TEST_F(EligibilityTest, OnlyADefiniteOutOfSpaceAnswerMeansNoRoom) {
     EXPECT_EQ(fake::Get().openShareRecords, 0);
   }
   EXPECT_FALSE(IsShareSpaceEnough("nosuch"));
-  EXPECT_THAT(log.Lines(), ElementsAre("utils:N WEZOShareGet failed, share=nosuch"));
+  // A share path that cannot be resolved sets the path code.
+  EXPECT_FALSE(CanPathBeIndexed("/nosuch/2019") || CanShareBeIndexed(nullptr));
+  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_PATH);
+  EXPECT_THAT(log.Lines(), ElementsAre("utils:N WEZOShareGet failed, share=nosuch",
+                                       "utils:N GetFullPath failed, path=/nosuch/2019"));
+  EXPECT_TRUE(CanPathBeIndexed("/photo/2019"));
 }
 
 }  // namespace

@@ -1,8 +1,7 @@
-// The admin tool run as a program over the shipped library and its Linux platform, in a sandbox
-// appliance of its own (scripts/sandbox-appliance.sh) with the stand-in daemon on the socket. The
-// walk through every operation is the demo's; these tests hold what it does not show: each exit
-// status with its message, the JSON output equal to what the library answers in this process for
-// the same root, the report of a change whose later step failed, and check/repair.
+// The admin tool as a program over the shipped library and its Linux platform, in a sandbox
+// appliance (scripts/sandbox-appliance.sh) with the stand-in daemon: what the demo's walk through
+// every operation does not show (exit statuses and messages, JSON equal to the library's answer,
+// a change whose later step failed, check/repair).
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <json/reader.h>
@@ -11,13 +10,11 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <csignal>
 #include <filesystem>
 #include <functional>
 #include <memory>
 #include <string>
-#include <thread>
 #include <vector>
 
 #include "fileindex/fileindex.h"
@@ -62,17 +59,13 @@ class FileindexctlTest : public SandboxTest {
   // -1; with `pid`, leaves it running and answers 0.
   int Spawn(Args args, pid_t* pid) const {
     std::vector<char*> argv;
-    for (std::string& arg : args) {
-      argv.push_back(arg.data());
-    }
+    for (std::string& arg : args) argv.push_back(arg.data());
     argv.push_back(nullptr);
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
-    for (const int fd : {1, 2}) {
-      const std::string name = At(fd == 1 ? "tool.out" : "tool.err");
-      posix_spawn_file_actions_addopen(&actions, fd, name.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
-                                       0644);
-    }
+    const std::string out = At("tool.out"), err = At("tool.err");
+    posix_spawn_file_actions_addopen(&actions, 1, out.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+    posix_spawn_file_actions_addopen(&actions, 2, err.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
     pid_t child = -1;
     const int spawned = posix_spawn(&child, argv[0], pid != nullptr ? nullptr : &actions, nullptr,
                                     argv.data(), environ);
@@ -94,9 +87,7 @@ class FileindexctlTest : public SandboxTest {
                     &m_daemon),
               0);
     const auto listening = [&] { return Read("records/daemon.log").find("listening on", seen); };
-    for (int i = 0; i < 500 && listening() == std::string::npos; ++i) {
-      std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
+    for (int i = 0; i < 500 && listening() == std::string::npos; ++i) usleep(10000);
     ASSERT_NE(listening(), std::string::npos);
   }
   void StopDaemon() {

@@ -86,14 +86,6 @@ std::vector<Call> Platform::CallsTo(const std::string& op) const {
   return out;
 }
 
-std::vector<std::string> Platform::OpNames() const {
-  std::vector<std::string> out;
-  for (const Call& c : calls) {
-    out.push_back(c.op);
-  }
-  return out;
-}
-
 }  // namespace fake
 
 using fake::Get;
@@ -180,12 +172,12 @@ int WEZOGetFSType(const char* szPath, int flags) {
 
 int WEZOFSIsRemoteFS(int fsType) {
   Record("WEZOFSIsRemoteFS", {std::to_string(fsType)});
-  return Get().remoteTypes.count(fsType) != 0 ? 1 : 0;
+  return fsType == fake::kRemoteFs ? 1 : 0;
 }
 
 int WEZOFSIsImageFS(int fsType) {
   Record("WEZOFSIsImageFS", {std::to_string(fsType)});
-  return Get().imageTypes.count(fsType) != 0 ? 1 : 0;
+  return fsType == fake::kImageFs ? 1 : 0;
 }
 
 int WEZOFSDirIsMntPoint(const char* szPath) {
@@ -204,7 +196,7 @@ int WLIBFhsPathInSnapshot(const char* szPath, int* pfInSnapshot) {
 
 int WEZOEAIsHiddenDir(const char* szName) {
   Record("WEZOEAIsHiddenDir", {Str(szName)});
-  return szName != nullptr && Get().hiddenDirNames.count(szName) != 0 ? 1 : 0;
+  return szName != nullptr && std::strcmp(szName, "@eaDir") == 0 ? 1 : 0;
 }
 
 int WEZOEAMKDir(int flags, const char* szPath) {

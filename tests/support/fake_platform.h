@@ -11,13 +11,12 @@
 #include <json/value.h>
 
 #include <map>
-#include <set>
 #include <string>
 #include <vector>
 
 namespace fake {
 
-// File-system type codes that the fake answers with (any code works; these name the classes).
+// File-system type codes that the fake answers with; only these two are remote or image ones.
 constexpr int kLocalFs = 1;
 constexpr int kRemoteFs = 20;
 constexpr int kImageFs = 30;
@@ -51,9 +50,6 @@ struct Platform {
   std::map<std::string, Share> shares;     // by name
   std::map<std::string, PathFacts> facts;  // by exact full path
   PathFacts defaultFacts;                  // for every other path
-  std::set<int> remoteTypes{kRemoteFs};
-  std::set<int> imageTypes{kImageFs};
-  std::set<std::string> hiddenDirNames{"@eaDir"};
   bool quotaEnough = true;
   int quotaError = 0;                   // last error left by a "not enough" answer
   std::map<std::string, bool> running;  // services by name
@@ -91,7 +87,6 @@ struct Platform {
 
   void AddShare(const std::string& name, const std::string& path);
   std::vector<Call> CallsTo(const std::string& op) const;
-  std::vector<std::string> OpNames() const;  // the ops of `calls`, in order
 };
 
 // The process's fake platform.

@@ -3,7 +3,6 @@
 #include <wezo/platform.h>
 
 #include <chrono>
-#include <cstdio>
 #include <filesystem>
 #include <string>
 #include <tuple>
@@ -107,26 +106,23 @@ TEST_F(ShareTest, FailuresAndUnencryptedFoldersAreTold) {
 // A configuration that has settled is parsed once and kept; a new file in its place, or one of
 // another size, is read again even when it carries the same modification time.
 TEST_F(ShareTest, AKeptConfigurationFollowsEveryChangeOfTheFile) {
-  const std::string conf = At("etc/samba/smb.conf");
   const auto settled = std::filesystem::file_time_type::clock::now() - std::chrono::hours(1);
-  const auto writeSettled = [&](const std::string& relative, const std::string& text) {
-    Write(relative, text);
-    std::filesystem::last_write_time(At(relative), settled);
-  };
-  const auto has = [](const char* name) {
-    PWEZOSHARE share = nullptr;
-    const bool found = WEZOShareGet(name, &share) == 0;
-    WEZOShareFree(share);
-    return found;
-  };
-  writeSettled("etc/samba/smb.conf", "[aaaa]\npath = /v/a\n");
-  ASSERT_TRUE(has("aaaa"));
-  writeSettled("etc/samba/next", "[bbbb]\npath = /v/b\n");  // same size, same time, new file
-  ASSERT_EQ(rename(At("etc/samba/next").c_str(), conf.c_str()), 0);
-  EXPECT_TRUE(has("bbbb"));
-  EXPECT_FALSE(has("aaaa"));
-  writeSettled("etc/samba/smb.conf", "[cc]\npath = /v/c\n");  // same file, rewritten in place
-  EXPECT_TRUE(has("cc"));
+  // Each share's file, written with the same time and moved over smb.conf: the second is a new
+  // file of the same size, the third the same file rewritten in place.
+  const char* before = "none";
+  for (const auto& [file, name] : {std::pair{"etc/samba/smb.conf", "aaaa"},
+                                   {"etc/samba/next", "bbbb"},
+                                   {"etc/samba/smb.conf", "cc"}}) {
+    Write(file, std::string("[") + name + "]\npath = /v/x\n");
+    std::filesystem::last_write_time(At(file), settled);
+    std::filesystem::rename(At(file), At("etc/samba/smb.conf"));
+    for (const auto& [asked, found] : {std::pair{name, true}, {before, false}}) {
+      PWEZOSHARE share = nullptr;
+      EXPECT_EQ(WEZOShareGet(asked, &share) == 0, found) << asked;
+      WEZOShareFree(share);
+    }
+    before = name;
+  }
 }
 
 using SpotlightTest = SandboxTest;

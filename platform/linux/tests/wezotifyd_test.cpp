@@ -59,13 +59,11 @@ class WezotifydTest : public SandboxTest {
   void Start(
       int shares, const std::function<void()>& plant = [] {}) {
     for (int n = 1; n <= shares; ++n) {
-      fs::create_directories(Folder(n));
-      fs::create_directories(Folder(n) + "/../@eaDir");
+      fs::create_directories(Folder(n)), fs::create_directories(Folder(n) + "/../@eaDir");
       Json::Value entry;
-      entry["queue"] = Queue(n);
-      entry["config"][0]["path"] = Folder(n);
-      entry["config"][0]["mask"] = 0xFFCE;
-      entry["config"][0]["ignore"].append("@eaDir");
+      ASSERT_TRUE(WEZO::FILEINDEX::JsonFromString(
+          entry, R"({"queue":")" + Queue(n) + R"(","config":[{"path":")" + Folder(n) +
+                     R"(","mask":65486,"ignore":["@eaDir"]}]})"));
       ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(entry), "fileindex", QUEUE_TYPE_FILE));
     }
     plant();
