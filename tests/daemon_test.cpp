@@ -56,11 +56,9 @@ TEST_F(DaemonTest, NobodyListeningFailsAtOnceWithoutLeakingADescriptor) {
   const int bound = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);  // bound, never listening
   for (const std::string place : {"no file", "a socket nobody listens on", "a regular file"}) {
     unlink(path.c_str());
-    if (place == "a socket nobody listens on") {
-      ASSERT_EQ(bind(bound, reinterpret_cast<sockaddr*>(&address), sizeof(address)), 0);
-    } else if (place == "a regular file") {
-      testsupport::WriteFile(path, "not a socket");
-    }
+    if (place == "a regular file") testsupport::WriteFile(path, "not a socket");
+    ASSERT_TRUE(place != "a socket nobody listens on" ||
+                bind(bound, reinterpret_cast<sockaddr*>(&address), sizeof(address)) == 0);
     const int descriptors = testsupport::OpenDescriptorCount();
     const Clock::time_point start = Clock::now();
     EXPECT_FALSE(SendCammandToDaemon("resume", Json::Value())) << place;

@@ -183,9 +183,9 @@ TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
 }
 
 TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResultAndNamesEachChange) {
-  const Json::Value additional = Parse(R"(["status", "is_valid"])");
   Json::Value expected;
-  ASSERT_TRUE(fi::IndexMgr::List(expected, 1, 1, "name", "DESC", additional));
+  ASSERT_TRUE(
+      fi::IndexMgr::List(expected, 1, 1, "name", "DESC", Parse(R"(["status", "is_valid"])")));
   EXPECT_EQ(RunJson({"list", "--offset", "1", "--limit", "1", "--sort-by", "name", "--desc",
                      "--additional", "status,is_valid"}),
             ReadBack(expected));
@@ -207,15 +207,14 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResultAndNamesEachChange) {
     Args args;
     const char* rule;
     const char* holder;
-  } explained[] = {{{"/photo/2019/trip"}, "unknown_file_system", "/photo/2019"},
-                   {{At("volume1/video/movies"), "--full-path"}, "indexable", "/video/movies"},
-                   {{"/photo/2019/"}, "resolves_elsewhere", "/photo/2019"},
-                   {{"/tv/x"}, "unknown_file_system", ""}};
+  } explained[] = {
+      {{"explain", "/photo/2019/trip"}, "unknown_file_system", "/photo/2019"},
+      {{"explain", At("volume1/video/movies"), "--full-path"}, "indexable", "/video/movies"},
+      {{"explain", "/photo/2019/"}, "resolves_elsewhere", "/photo/2019"},
+      {{"explain", "/tv/x"}, "unknown_file_system", ""}};
   for (const auto& c : explained) {
-    SCOPED_TRACE(c.args[0]);
-    Args args = c.args;
-    args.insert(args.begin(), "explain");
-    const Json::Value said = RunJson(args);
+    SCOPED_TRACE(c.args[1]);
+    const Json::Value said = RunJson(c.args);
     EXPECT_EQ(said["rule"], c.rule);
     EXPECT_EQ(said["folder"], c.holder);
     EXPECT_EQ(said["rule"], fi::IndexRuleKey(fi::FullPathIndexRule(said["full_path"].asString())));

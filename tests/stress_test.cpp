@@ -43,20 +43,25 @@ int CountFromEnv(const char* name, int fallback) {
 // What the two files say, as a reader that takes no lock reads them: {"folders": {path: name},
 // "reindex": {share: true}}; null when one of them does not load.
 Json::Value ReadState() {
-  Json::Value state;
-  state["folders"] = Json::Value(Json::objectValue);
   std::vector<Folder> folders;
   Json::Value status(Json::objectValue);
+  Json::Value state;
   if (!IndexMgr::List(folders) ||
       (std::filesystem::exists(StatusConfPath()) &&
        (!JsonFromFile(status, StatusConfPath()) || !status.isObject()))) {
-    return Json::Value();
+    return state;
   }
-  for (const Folder& folder : folders) {
-    state["folders"][folder.GetPath()] = folder.GetName();
-  }
-  state["reindex"] = status.get("need_reindex", Json::Value(Json::objectValue));
+  state["folders"] = Json::objectValue;
+  for (const Folder& folder : folders) state["folders"][folder.GetPath()] = folder.GetName();
+  state["reindex"] = status.get("need_reindex", Json::objectValue);
   return state;
+}
+
+// The list request that adds `path` named `name`, or removes it when `name` is empty.
+Json::Value Request(const std::string& path, const std::string& name) {
+  return testsupport::ParseJson(name.empty()
+                                    ? "[\"" + path + "\"]"
+                                    : R"([{"path":")" + path + R"(","name":")" + name + "\"}]");
 }
 
 // The crash-test writers' change sequence, from k = 1: three of four changes go to folder.conf
@@ -76,13 +81,12 @@ bool Change(long k, Json::Value* state = nullptr) {
     return true;
   }
   if (k % 4 == 0) return StatusMgr::ShareSetNeedReindex(share, k % 8 == 0);
-  if (k % 4 == 3) return IndexMgr::Delete(testsupport::ParseJson("[\"" + folder + "\"]"));
-  return IndexMgr::Upsert(
-      testsupport::ParseJson(R"([{"path":")" + folder + R"(","name":")" + name + "\"}]"));
+  if (k % 4 == 3) return IndexMgr::Delete(Request(folder, ""));
+  return IndexMgr::Upsert(Request(folder, name));
 }
 
-// How many temporary files of the configuration file `name` ("" for both) lie beside it.
-int Temporaries(const std::string& name = "") {
+// How many temporary files of the configuration file `name` lie beside it.
+int Temporaries(const std::string& name) {
   int count = 0;
   for (const auto& entry :
        std::filesystem::directory_iterator(std::filesystem::path(FolderConfPath()).parent_path())) {
@@ -95,8 +99,8 @@ int Temporaries(const std::string& name = "") {
 class StressTest : public testsupport::LibraryTest {
  protected:
   StressTest() {
-    std::filesystem::create_directories(volume + "/photo");
-    std::filesystem::create_directories(volume + "/video");
+    for (const char* share : {"/photo", "/video"})
+      std::filesystem::create_directories(volume + share);
   }
 
   testsupport::FakeDaemon daemon;
@@ -195,20 +199,12 @@ int Writer(int w, int rounds) {
   const std::string path = (w % 2 == 0 ? "/photo/w" : "/video/w") + std::to_string(w);
   std::string mine;  // the folder's name, "" while it is not in the list
   for (int r = 0; r < rounds; ++r) {
-    Json::Value request(Json::arrayValue);
-    const bool add = r % 3 != 2;
-    if (add) {
-      request[0]["path"] = path;
-      request[0]["name"] = "r" + std::to_string(r);
-    } else {
-      request.append(path);
-    }
+    const std::string name = r % 3 != 2 ? "r" + std::to_string(r) : "";
     ErrorHandler::SetError(FILEINDEX_ERR_NONE);
-    const bool done = add ? IndexMgr::Upsert(request) : IndexMgr::Delete(request);
-    mine = done ? (add ? "r" + std::to_string(r) : "") : mine;
-    if (Unexpected(done) != 0) {
-      return 1;
-    }
+    const bool done = name.empty() ? IndexMgr::Delete(Request(path, name))
+                                   : IndexMgr::Upsert(Request(path, name));
+    mine = done ? name : mine;
+    if (Unexpected(done) != 0) return 1;
   }
   return ReadState()["folders"].get(path, "").asString() == mine ? 0 : 2;
 }

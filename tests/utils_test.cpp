@@ -111,8 +111,7 @@ TEST_F(UtilsTest, FullPathsComeFromTheShareDatabaseAndErrorsOutliveSuccesses) {
     EXPECT_EQ(fake::Get().CallsTo("WEZOShareGet").empty(), *c.path == '\0');
   }
   log.Clear();
-  std::string name = "n";
-  std::string path = "p";
+  std::string name = "n", path = "p";
   EXPECT_FALSE(GetShareNamePathByFullPath(name, path, volume + "/videos/a.mp4"));
   EXPECT_EQ(name + path, "np");
   EXPECT_EQ(log.Lines(),
