@@ -74,9 +74,7 @@ TEST_F(DaemonTest, RefusesASocketPathThatLeavesNoRoomForTheTerminatingZero) {
   for (const size_t length : {room - 1, room}) {
     // A root of the chosen length inside the sandbox, with a daemon listening in it.
     const size_t padding = length - root_.size() - 1 - std::strlen(kDaemonSocketPath);
-    if (padding > length) {
-      GTEST_SKIP() << "the sandbox root is too long for this test";
-    }
+    if (padding > length) GTEST_SKIP() << "the sandbox root is too long for this test";
     const std::string root = At(std::string(padding, 'r'));
     std::filesystem::create_directories(root + "/var/run");
     ASSERT_TRUE(SetRootPrefix(root));

@@ -101,9 +101,7 @@ class FileindexctlTest : public SandboxTest {
   // Runs the tool on `args`, with `--root <sandbox>` first unless `args` gives its own root.
   Result Run(const Args& args) const {
     Args all = {FILEINDEXCTL};
-    if (args.empty() || args[0] != "--root") {
-      all.insert(all.end(), {"--root", root_});
-    }
+    if (args.empty() || args[0] != "--root") all.insert(all.end(), {"--root", root_});
     all.insert(all.end(), args.begin(), args.end());
     const int status = Spawn(all, nullptr);
     return {status, Read("tool.out"), Read("tool.err")};
@@ -358,9 +356,7 @@ TEST_F(FileindexctlTest, CheckFindsEachDisagreementAndRepairBringsItBackInLine) 
     const Result repair = Run({"check", "--repair"});
     EXPECT_EQ(repair.status, c.repaired ? 0 : 1) << repair.out << repair.err;
     EXPECT_EQ(repair.out.find("left: ") != std::string::npos, !c.repaired) << repair.out;
-    if (c.after) {
-      c.after();
-    }
+    if (c.after) c.after();
     EXPECT_EQ(Run({"check"}).status, 0);
   }
 }

@@ -130,9 +130,7 @@ TEST_F(CrashTest, AKilledWriterLeavesEachFileBeforeOrAfterItsChange) {
     const pid_t writer = fork();
     ASSERT_GE(writer, 0);
     if (writer == 0) {
-      for (long k = counted->load() + 1; Change(k); ++k) {
-        counted->store(k);
-      }
+      for (long k = counted->load() + 1; Change(k); ++k) counted->store(k);
       _exit(1);
     }
     pollfd created{watch, POLLIN, 0};
@@ -167,9 +165,7 @@ TEST_F(CrashTest, AKilledWriterLeavesEachFileBeforeOrAfterItsChange) {
   }
   // A save under the lock removes the temporaries of killed saves: four changes in a row save
   // each file at least once.
-  for (int i = 0; i < 4; ++i) {
-    ASSERT_TRUE(Change(++modelAt));
-  }
+  for (int i = 0; i < 4; ++i) ASSERT_TRUE(Change(++modelAt));
   EXPECT_LE(Temporaries("folder.conf"), 1);
   EXPECT_LE(Temporaries("status.conf"), 1);
   munmap(shared, sizeof(std::atomic<long>));
@@ -221,9 +217,7 @@ int Reader(int rounds) {
         (got && folder["name"] != "keep")) {
       return 3;
     }
-    if (Unexpected(got) != 0) {
-      return 1;
-    }
+    if (Unexpected(got) != 0) return 1;
   }
   return 0;
 }
@@ -247,9 +241,7 @@ TEST_F(StressTest, ConcurrentWritersKeepEveryDoneChangeAndReadersSeeUntouchedFol
   }
   close(go[1]);
   close(go[0]);
-  for (const auto& wait : children) {
-    EXPECT_EQ(wait(), 0);
-  }
+  for (const auto& wait : children) EXPECT_EQ(wait(), 0);
   EXPECT_TRUE(IndexMgr::IsPathIndexed("/photo/seed") && IndexMgr::IsPathIndexed("/video/seed"));
 }
 

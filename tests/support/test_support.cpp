@@ -154,9 +154,8 @@ FakeDaemon::~FakeDaemon() {
   m_changed.notify_all();
   const int wake = ConnectTo(m_path, SOCK_NONBLOCK);  // ends an accept(); a full backlog does too
   if (m_thread.joinable()) m_thread.join();
-  for (int fd : {m_listen, m_dummy, wake}) {
+  for (int fd : {m_listen, m_dummy, wake})
     if (fd >= 0) close(fd);
-  }
   unlink(m_path.c_str());
 }
 

@@ -144,9 +144,7 @@ TEST_F(WezotifydTest, FlagsTheShareForAReindexWhenTheKernelDropsEvents) {
   std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> queued;
   std::ofstream files[] = {std::ofstream(Folder(1) + "/a"), std::ofstream(Folder(1) + "/b")};
   kill(pid_, SIGSTOP);
-  for (int i = 0; i <= queued; ++i) {
-    files[i % 2] << 'x' << std::flush;
-  }
+  for (int i = 0; i <= queued; ++i) files[i % 2] << 'x' << std::flush;
   kill(pid_, SIGCONT);
   Json::Value status;
   EXPECT_TRUE(WaitFor([&] {
