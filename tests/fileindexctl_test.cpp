@@ -15,6 +15,7 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <tuple>
 #include <vector>
 
 #include "fileindex/fileindex.h"
@@ -119,13 +120,9 @@ class FileindexctlTest : public SandboxTest {
 
 TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
   const std::string deep = std::string(2000, '[') + std::string(2000, ']');
-  struct Case {
-    Args args;
-    int status;
-    std::string err;  // expected in stderr; a case expecting "" wants stderr empty
-    std::string out;  // expected in stdout, which is empty on a failure
-  };
-  const Case cases[] = {
+  // The arguments, the exit status, and what stderr holds ("": nothing) and stdout (nothing when
+  // the status is not 0).
+  const std::tuple<Args, int, std::string, std::string> cases[] = {
       // Columns count characters, not bytes.
       {{"list", "--additional", "status", "-a", "is_valid"},
        0,
@@ -167,14 +164,14 @@ TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
       {{"--root", "relative/dir", "list"}, 2, "--root must be an absolute path", ""},
       {{"--root", At("etc/samba/smb.conf"), "list"}, 2, "must name an existing directory", ""},
   };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(testing::PrintToString(c.args));
-    const Result result = Run(c.args);
-    EXPECT_EQ(result.status, c.status) << result.err;
-    EXPECT_NE(result.err.find(c.err), std::string::npos) << result.err;
-    EXPECT_NE(result.out.find(c.out), std::string::npos) << result.out;
-    EXPECT_TRUE(!c.err.empty() || result.err.empty()) << result.err;
-    EXPECT_TRUE(c.status == 0 || result.out.empty()) << result.out;
+  for (const auto& [args, status, err, out] : cases) {
+    SCOPED_TRACE(testing::PrintToString(args));
+    const Result result = Run(args);
+    EXPECT_EQ(result.status, status) << result.err;
+    EXPECT_NE(result.err.find(err), std::string::npos) << result.err;
+    EXPECT_NE(result.out.find(out), std::string::npos) << result.out;
+    EXPECT_TRUE(!err.empty() || result.err.empty()) << result.err;
+    EXPECT_TRUE(status == 0 || result.out.empty()) << result.out;
   }
   // Only the add that warned without --strict changed the list.
   EXPECT_EQ(RunJson({"list"})["total"], 3);
@@ -201,20 +198,16 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResultAndNamesEachChange) {
   EXPECT_EQ(shown["folders"]["/photo/2019"], fi::StatusMgr::GetFolderStatus("/photo/2019"));
 
   // explain: the deciding rule is the library's, and the folder holding the path.
-  const struct {
-    Args args;
-    const char* rule;
-    const char* holder;
-  } explained[] = {
+  const std::tuple<Args, const char*, const char*> explained[] = {
       {{"explain", "/photo/2019/trip"}, "unknown_file_system", "/photo/2019"},
       {{"explain", At("volume1/video/movies"), "--full-path"}, "indexable", "/video/movies"},
       {{"explain", "/photo/2019/"}, "resolves_elsewhere", "/photo/2019"},
       {{"explain", "/tv/x"}, "unknown_file_system", ""}};
-  for (const auto& c : explained) {
-    SCOPED_TRACE(c.args[1]);
-    const Json::Value said = RunJson(c.args);
-    EXPECT_EQ(said["rule"], c.rule);
-    EXPECT_EQ(said["folder"], c.holder);
+  for (const auto& [args, rule, holder] : explained) {
+    SCOPED_TRACE(args[1]);
+    const Json::Value said = RunJson(args);
+    EXPECT_EQ(said["rule"], rule);
+    EXPECT_EQ(said["folder"], holder);
     EXPECT_EQ(said["rule"], fi::IndexRuleKey(fi::FullPathIndexRule(said["full_path"].asString())));
   }
   EXPECT_EQ(Run({"explain", "/photo/latest"}).out,

@@ -45,25 +45,20 @@ TEST_F(StorageTest, RefusesBadArgumentsAndWritesTheLocations) {
   EXPECT_EQ(std::string(buffer), volume.substr(0, 9));
   ASSERT_EQ(FILEIDXQueuePathGet("photo", buffer, 1), 0);
   EXPECT_EQ(fake::Get().openShareRecords, 0);
-  const struct {
-    Getter getter;
-    const char* name;
-    char* out;
-    int size;
-    std::string line;
-    int code;  // the platform's last error afterwards
-  } cases[] = {{FILEIDXQueuePathGet, nullptr, nullptr, 0, bad + "__null != szName)=[0]\n", 0xD00},
-               {FILEIDXDBPathGet, "photo", nullptr, 0, bad + "__null != szOutDBPath)=[0]\n", 0xD00},
-               {FILEIDXQueuePathGet, "photo", buffer, 0, bad + "cbOutLen > 0)=[0]\n", 0xD00},
-               {FILEIDXDBPathGet, "nosuch", buffer, 64,
-                "utils:N WEZOShareGet failed, name=nosuch, code=3585", fake::kInjectedError}};
-  for (const auto& c : cases) {
+  // The getter, its arguments, the line it logs and the platform's last error afterwards.
+  const std::tuple<Getter, const char*, char*, int, std::string, int> cases[] = {
+      {FILEIDXQueuePathGet, nullptr, nullptr, 0, bad + "__null != szName)=[0]\n", 0xD00},
+      {FILEIDXDBPathGet, "photo", nullptr, 0, bad + "__null != szOutDBPath)=[0]\n", 0xD00},
+      {FILEIDXQueuePathGet, "photo", buffer, 0, bad + "cbOutLen > 0)=[0]\n", 0xD00},
+      {FILEIDXDBPathGet, "nosuch", buffer, 64,
+       "utils:N WEZOShareGet failed, name=nosuch, code=3585", fake::kInjectedError}};
+  for (const auto& [getter, name, out, size, line, code] : cases) {
     fake::Reset();
     log.Clear();
-    EXPECT_EQ(c.getter(c.name, c.out, c.size), -1) << c.line;
-    EXPECT_THAT(log.Lines(), ElementsAre(c.line));
-    EXPECT_EQ(fake::Get().errCode, c.code);
-    EXPECT_EQ(fake::Get().calls.empty(), c.code == 0xD00) << "nothing is looked up";
+    EXPECT_EQ(getter(name, out, size), -1) << line;
+    EXPECT_THAT(log.Lines(), ElementsAre(line));
+    EXPECT_EQ(fake::Get().errCode, code);
+    EXPECT_EQ(fake::Get().calls.empty(), code == 0xD00) << "nothing is looked up";
   }
 }
 
@@ -106,20 +101,17 @@ std::map<std::string, std::string> Tree(const std::string& dir) {
 
 TEST_F(StorageTest, NothingBelowTheShareIsReachedThroughALinkInTheMetadataDirectory) {
   const std::string linked = ", reason=Too many levels of symbolic links";
-  const struct {
-    std::function<bool()> run;
-    bool result;
-    std::string lastLine;
-  } cases[] = {{[&] { return FILEIDXDBPathGet("photo", buffer, sizeof buffer) > 0; }, true,
-                "utils:N mkdir failed, path=" + db + linked},
-               {[&] { return IsReindexQueued(volume + "/photo/a", queue); }, false,
-                "utils:N Failed to open queue=" + queue + linked},
-               {[&] { return QueueHasFolderEvent("/photo/a", queue); }, false,
-                "status_mgr:N Failed to open queue=" + queue + linked},
-               {[&] { return IndexMgr::CleanShareIndexData("photo"); }, false,
-                "index_mgr:N Failed to remove " + db + linked}};
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.lastLine);
+  const std::tuple<std::function<bool()>, bool, std::string> cases[] = {
+      {[&] { return FILEIDXDBPathGet("photo", buffer, sizeof buffer) > 0; }, true,
+       "utils:N mkdir failed, path=" + db + linked},
+      {[&] { return IsReindexQueued(volume + "/photo/a", queue); }, false,
+       "utils:N Failed to open queue=" + queue + linked},
+      {[&] { return QueueHasFolderEvent("/photo/a", queue); }, false,
+       "status_mgr:N Failed to open queue=" + queue + linked},
+      {[&] { return IndexMgr::CleanShareIndexData("photo"); }, false,
+       "index_mgr:N Failed to remove " + db + linked}};
+  for (const auto& [run, result, lastLine] : cases) {
+    SCOPED_TRACE(lastLine);
     std::filesystem::remove_all(metadata);
     std::filesystem::remove_all(out);
     Write("out/WEZO@file_index_queue", R"({"event":65536,"path":")" + volume + "/photo/a\"}\n");
@@ -127,9 +119,9 @@ TEST_F(StorageTest, NothingBelowTheShareIsReachedThroughALinkInTheMetadataDirect
     std::filesystem::create_symlink(out, metadata);
     const auto before = Tree(out);
     log.Clear();
-    EXPECT_EQ(c.run(), c.result);
+    EXPECT_EQ(run(), result);
     EXPECT_EQ(Tree(out), before);
-    EXPECT_EQ(log.Lines().empty() ? "" : log.Lines().back(), c.lastLine);
+    EXPECT_EQ(log.Lines().empty() ? "" : log.Lines().back(), lastLine);
   }
 }
 

@@ -5,6 +5,7 @@
 #include <set>
 #include <string>
 #include <thread>
+#include <tuple>
 
 #include "internal.h"
 #include "sandbox.h"
@@ -72,11 +73,7 @@ int Cmp(const std::string& a, const std::string& b) {
 }
 
 TEST(TextTest, ComparesUtf8WithUnicodeCaseFoldingInAStrictWeakOrderOfAnyBytes) {
-  const struct Case {
-    const char* a;
-    const char* b;
-    int sign;
-  } kCases[] = {
+  const std::tuple<const char*, const char*, int> kCases[] = {
       {"\xC3\x89t\xC3\xA9", "\xC3\xA9T\xC3\x89", 0},  // Été, éTÉ
       {"Stra\xC3\x9F\x65", "STRASSE", 0},             // Straße: full folding
       {"\xCE\xA3\xCE\xA3", "\xCF\x83\xCF\x82", 0},    // ΣΣ, σς
@@ -87,9 +84,9 @@ TEST(TextTest, ComparesUtf8WithUnicodeCaseFoldingInAStrictWeakOrderOfAnyBytes) {
   };
   // Hex escapes end where a letter follows: "\x62" is 'b'.
   std::set<std::string> texts = {"", "ab", "\x80", "a\x80\x62", "A\x80\x42", "\xE2\x82\xAC\xFF"};
-  for (const Case& c : kCases) {
-    EXPECT_EQ(Cmp(c.a, c.b), c.sign) << c.a << " vs " << c.b;
-    texts.insert({c.a, c.b});
+  for (const auto& [a, b, sign] : kCases) {
+    EXPECT_EQ(Cmp(a, b), sign) << a << " vs " << b;
+    texts.insert({a, b});
   }
   for (const std::string& a : texts) {  // antisymmetric and transitive over any bytes
     for (const std::string& b : texts) {

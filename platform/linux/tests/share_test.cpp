@@ -45,31 +45,28 @@ TEST_F(ShareTest, ReadsSharesAndFindsTheDeepestHoldingAPath) {
     EXPECT_EQ(flag, readOnly) << name;
     WEZOShareFree(share);
   }
-  // The deepest share holding a path, and its recycle bin and snapshot folders.
-  const struct Where {
-    const char* full;
-    const char* share;  // "": no share holds it
-    int recycle, snapshot;
-  } kWhere[] = {{"/volume1/photo/2019/x", "photo2019", 0, 0},
-                {"/volume1/photo/20190", "photo", 0, 0},
-                {"/volume1/pho", "", 0, 0},
-                {"/volume1/photo/#recycle", "photo", 1, 0},
-                {"/volume1/photo/#recycle/a", "photo", 1, 0},
-                {"/volume1/photo/#snapshot/x", "photo", 0, 1},
-                {"/volume1/photo/#recycle-x", "photo", 0, 0},
-                {"/volume1/photo/a/#recycle", "photo", 0, 0},
-                {"/elsewhere/#snapshot", "", 0, 0}};
-  for (const Where& c : kWhere) {
-    SCOPED_TRACE(c.full);
+  // The deepest share holding a path ("": none), and its recycle bin and snapshot folders.
+  const std::tuple<const char*, const char*, int, int> kWhere[] = {
+      {"/volume1/photo/2019/x", "photo2019", 0, 0},
+      {"/volume1/photo/20190", "photo", 0, 0},
+      {"/volume1/pho", "", 0, 0},
+      {"/volume1/photo/#recycle", "photo", 1, 0},
+      {"/volume1/photo/#recycle/a", "photo", 1, 0},
+      {"/volume1/photo/#snapshot/x", "photo", 0, 1},
+      {"/volume1/photo/#recycle-x", "photo", 0, 0},
+      {"/volume1/photo/a/#recycle", "photo", 0, 0},
+      {"/elsewhere/#snapshot", "", 0, 0}};
+  for (const auto& [full, share, recycle, inSnapshot] : kWhere) {
+    SCOPED_TRACE(full);
     char name[WEZO_SHARE_NAME_MAX] = "";
     char path[WEZO_SHARE_PATH_MAX] = "";
-    EXPECT_EQ(WEZOShareNamePathGet(c.full, name, sizeof name, path, sizeof path) == 0,
-              *c.share != '\0');
-    EXPECT_STREQ(name, c.share);
-    EXPECT_EQ(WEZOShareIsShareRecycle(c.full), c.recycle);
+    EXPECT_EQ(WEZOShareNamePathGet(full, name, sizeof name, path, sizeof path) == 0,
+              *share != '\0');
+    EXPECT_STREQ(name, share);
+    EXPECT_EQ(WEZOShareIsShareRecycle(full), recycle);
     int snapshot = -1;
-    EXPECT_EQ(WLIBFhsPathInSnapshot(c.full, &snapshot), 0);
-    EXPECT_EQ(snapshot, c.snapshot);
+    EXPECT_EQ(WLIBFhsPathInSnapshot(full, &snapshot), 0);
+    EXPECT_EQ(snapshot, inSnapshot);
   }
   char name[4];
   char path[9];
@@ -128,27 +125,24 @@ TEST_F(ShareTest, AKeptConfigurationFollowsEveryChangeOfTheFile) {
 using SpotlightTest = SandboxTest;
 
 TEST_F(SpotlightTest, RewritesOnlyTheGlobalSpotlightValue) {
-  const struct Case {
-    const char* before;
-    int enable;
-    const char* after;
-  } kCases[] = {{"# keep ; me\r\n[ Global ]\r\n  Spot Light=off  \r\n\tworkgroup = W\r\n", 1,
-                 "# keep ; me\r\n[ Global ]\r\n  Spot Light= yes\r\n\tworkgroup = W\r\n"},
-                {"[global]\nspotlight = \\\n  yes\n# tail", 0, "[global]\nspotlight = no\n# tail"},
-                {"[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = no\n", 1,
-                 "[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = yes\n"},
-                {"# c\n[global]\n\tworkgroup = W\n[s]\n\tspotlight = yes\n", 1,
-                 "# c\n[global]\n\tspotlight = yes\n\tworkgroup = W\n[s]\n\tspotlight = yes\n"},
-                {"[global]", 1, "[global]\n\tspotlight = yes\n"},
-                {"[s]\n\tpath = /x", 0, "[s]\n\tpath = /x\n[global]\n\tspotlight = no\n"}};
+  const std::tuple<const char*, int, const char*> kCases[] = {
+      {"# keep ; me\r\n[ Global ]\r\n  Spot Light=off  \r\n\tworkgroup = W\r\n", 1,
+       "# keep ; me\r\n[ Global ]\r\n  Spot Light= yes\r\n\tworkgroup = W\r\n"},
+      {"[global]\nspotlight = \\\n  yes\n# tail", 0, "[global]\nspotlight = no\n# tail"},
+      {"[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = no\n", 1,
+       "[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = yes\n"},
+      {"# c\n[global]\n\tworkgroup = W\n[s]\n\tspotlight = yes\n", 1,
+       "# c\n[global]\n\tspotlight = yes\n\tworkgroup = W\n[s]\n\tspotlight = yes\n"},
+      {"[global]", 1, "[global]\n\tspotlight = yes\n"},
+      {"[s]\n\tpath = /x", 0, "[s]\n\tpath = /x\n[global]\n\tspotlight = no\n"}};
   const std::string conf = At("etc/samba/smb.conf");
   const bool haveTestparm = access("/usr/bin/testparm", X_OK) == 0;
-  for (const Case& c : kCases) {
-    SCOPED_TRACE(c.before);
-    Write("etc/samba/smb.conf", c.before, 0640);
-    EXPECT_EQ(WEZOSMBSetSpotlight(c.enable), 0);
-    EXPECT_EQ(Read("etc/samba/smb.conf"), c.after);
-    EXPECT_EQ(WEZOSMBIsEnableSpotlight(), c.enable);
+  for (const auto& [before, enable, after] : kCases) {
+    SCOPED_TRACE(before);
+    Write("etc/samba/smb.conf", before, 0640);
+    EXPECT_EQ(WEZOSMBSetSpotlight(enable), 0);
+    EXPECT_EQ(Read("etc/samba/smb.conf"), after);
+    EXPECT_EQ(WEZOSMBIsEnableSpotlight(), enable);
     struct stat st {};
     EXPECT_EQ(stat(conf.c_str(), &st) == 0 ? st.st_mode & 07777 : 0, 0640U);
     EXPECT_EQ(std::distance(std::filesystem::directory_iterator(At("etc/samba")), {}), 1)

@@ -14,6 +14,7 @@
 #include <functional>
 #include <string>
 #include <thread>
+#include <tuple>
 #include <vector>
 
 #include "json_io.h"
@@ -92,11 +93,7 @@ TEST_F(WezotifydTest, WritesOneLinePerChangeAndNoneForARemovedRegistration) {
     const std::string head = R"({"event":)" + std::to_string(event) + R"(,"path":")" + f + path;
     return head + (old.empty() ? "\"}\n" : R"(","path_old":")" + f + old + "\"}\n");
   };
-  const struct {
-    const char* what;
-    std::function<void()> change;
-    std::string lines;
-  } cases[] = {
+  const std::tuple<const char*, std::function<void()>, std::string> cases[] = {
       {"create and write", [&] { Create(f + "/a"); },
        line(256, "/a") + line(2, "/a") + line(8, "/a")},
       {"rename within", [&] { fs::rename(f + "/a", f + "/b"); }, line(256, "/b", "/a")},
@@ -118,15 +115,15 @@ TEST_F(WezotifydTest, WritesOneLinePerChangeAndNoneForARemovedRegistration) {
   };
   size_t seen = 0;
   int mark = 0;
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.what);
-    c.change();
+  for (const auto& [what, change, lines] : cases) {
+    SCOPED_TRACE(what);
+    change();
     // A folder made after the change closes its lines: everything before it belongs to the case.
     const std::string marker = line(256, "/mark" + std::to_string(++mark));
     mkdir((f + "/mark" + std::to_string(mark)).c_str(), 0755);
     ASSERT_TRUE(WaitFor([&] { return QueueText(1).find(marker) != std::string::npos; }));
     const size_t end = QueueText(1).find(marker);
-    EXPECT_EQ(QueueText(1).substr(seen, end - seen), c.lines);
+    EXPECT_EQ(QueueText(1).substr(seen, end - seen), lines);
     seen = end + marker.size();
   }
   EXPECT_FALSE(fs::exists(Queue(2)));
