@@ -88,20 +88,16 @@ TEST_F(DaemonTest, GivesUpWithinSecondsOnADaemonThatStopsTakingTheFrame) {
   const std::string big(1U << 20, 'x');  // more than the socket's buffers hold
   // SIGPIPE as a host process may have it: a closed connection must not kill the process, and
   // the call must not change the disposition either.
-  struct sigaction asFound {};
-  ASSERT_EQ(sigaction(SIGPIPE, nullptr, &asFound), 0);
-  (void)signal(SIGPIPE, SIG_DFL);
+  const auto asFound = signal(SIGPIPE, SIG_DFL);
   for (const auto behaviour :
        {FakeDaemon::Behaviour::kAcceptAndClose, FakeDaemon::Behaviour::kStopReading}) {
     FakeDaemon daemon(behaviour);
     const Clock::time_point start = Clock::now();
     EXPECT_FALSE(SendCammandToDaemon("t", big)) << static_cast<int>(behaviour);
     EXPECT_LT(SecondsSince(start), 10.0) << static_cast<int>(behaviour);  // a bound
-    struct sigaction now {};
-    ASSERT_EQ(sigaction(SIGPIPE, nullptr, &now), 0);
-    EXPECT_EQ(now.sa_handler, SIG_DFL) << static_cast<int>(behaviour);
+    EXPECT_EQ(signal(SIGPIPE, SIG_DFL), SIG_DFL) << static_cast<int>(behaviour);
   }
-  ASSERT_EQ(sigaction(SIGPIPE, &asFound, nullptr), 0);
+  (void)signal(SIGPIPE, asFound);
   EXPECT_TRUE(log.Lines().empty());
 }
 

@@ -76,10 +76,9 @@ using MonitorTest = SandboxTest;
 
 MonitorQueue Entry(const std::string& queue, const std::string& dir) {
   Json::Value value;
-  value["queue"] = queue;
-  value["config"][0]["path"] = dir;
-  value["config"][0]["mask"] = 65486;
-  value["config"][0]["ignore"].append("@eaDir");
+  EXPECT_TRUE(
+      WEZO::FILEINDEX::JsonFromString(value, R"({"queue":")" + queue + R"(","config":[{"path":")" +
+                                                 dir + R"(","mask":65486,"ignore":["@eaDir"]}]})"));
   return MonitorQueue(value);
 }
 
