@@ -92,8 +92,7 @@ TEST_F(ShareTest, FailuresAndUnencryptedFoldersAreTold) {
   Write("etc/samba/smb.conf", "[data]\npath = " + At("data") + "\n[gone]\npath = " + At("x"));
   for (const auto& [name, expected] : {std::pair{"data", 0}, {"gone", -1}}) {
     ASSERT_EQ(WEZOShareGet(name, &share), 0);
-    int encrypted = -1;
-    int encryption = -1;
+    int encrypted = -1, encryption = -1;
     EXPECT_EQ(WLIBShareIsEncryptedGet(share, &encrypted) < 0 ? -1 : encrypted, expected);
     EXPECT_EQ(WLIBShareIsEncryptionGet(share, &encryption) < 0 ? -1 : encryption, expected);
     WEZOShareFree(share);
