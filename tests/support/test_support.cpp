@@ -171,12 +171,12 @@ void FakeDaemon::Serve() {
   std::vector<int> held;  // m_dummy's connection and kStopReading's
   std::unique_lock<std::mutex> lock(m_mutex);
   m_changed.wait(lock, [&] { return m_stopping || m_behaviour != Behaviour::kHoldConnect; });
-  for (bool dummy = m_dummy >= 0; !m_stopping; dummy = false) {
+  for (bool dummy = m_dummy >= 0; !m_stopping;) {
     lock.unlock();
     const int fd = accept4(m_listen, nullptr, nullptr, SOCK_CLOEXEC);
     lock.lock();
     if (fd < 0) continue;
-    if (dummy || m_stopping || m_behaviour == Behaviour::kStopReading) {
+    if (std::exchange(dummy, false) || m_stopping || m_behaviour == Behaviour::kStopReading) {
       held.push_back(fd);
       continue;
     }
