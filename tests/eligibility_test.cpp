@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <filesystem>
 #include <sstream>
+#include <tuple>
 
 #include "fake_platform.h"
 #include "fileindex/eligibility.h"
@@ -58,13 +59,9 @@ void Arrange(const std::string& words, fake::PathFacts& facts) {
 TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
   using R = IndexRule;
   const char* realpath = "check realpath failed, path=%s";
-  const struct {
-    const char* folder;  // under the volume; "": /photo/2019
-    const char* setup;   // see Arrange()
-    IndexRule rule;
-    const char* decidingCall;
-    const char* logLine;  // after "utils:N ", with %s for the full path
-  } cases[] = {
+  // folder: under the volume; "": /photo/2019; setup: see Arrange(); logLine: after "utils:N ",
+  // with %s for the full path.
+  const std::tuple<const char*, const char*, IndexRule, const char*, const char*> cases[] = {
       {"", "", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
       {"/photo/#recycle-notes", "recycle", R::kRecycleBin, "WEZOShareIsShareRecycle", ""},
       {"/photo/#snapshot", "snapshot", R::kSnapshot, "WLIBFhsPathInSnapshot", ""},
@@ -92,36 +89,25 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
       {"/photo/2019/", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath},
       {"/photo/link", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath},
       {"/photo/2020", "", R::kResolvesElsewhere, "WEZOFSDirIsMntPoint", realpath}};
-  for (const auto& c : cases) {
-    SCOPED_TRACE(std::string(c.folder) + " " + c.setup);
+  for (const auto& [folder, setup, rule, decidingCall, logLine] : cases) {
+    SCOPED_TRACE(std::string(folder) + " " + setup);
     fake::Reset();
     for (const char* share : {"photo", "surveillance", "Surveillance"}) {
       fake::Get().AddShare(share, volume + "/" + share);
     }
     log.Clear();
-    const std::string fullPath = volume + (*c.folder != '\0' ? c.folder : "/photo/2019");
-    Arrange(c.setup, fake::Get().facts[fullPath]);
-    EXPECT_EQ(FullPathIndexRule(fullPath), c.rule);
-    // Calls after the deciding one are bookkeeping (releasing the share record).
-    std::vector<std::string> ops = fake::Get().OpNames();
-    while (ops.size() > 1 && ops.back() == "WLIBCErrGet") ops.pop_back();
-    EXPECT_EQ(ops.back(), c.decidingCall);
+    const std::string fullPath = volume + (*folder != '\0' ? folder : "/photo/2019");
+    Arrange(setup, fake::Get().facts[fullPath]);
+    EXPECT_EQ(FullPathIndexRule(fullPath), rule);
+    EXPECT_EQ(fake::Get().calls.back().op, decidingCall);
     EXPECT_EQ(fake::Get().openShareRecords, 0);
     EXPECT_EQ(ErrorHandler::GetError(),
-              c.rule == R::kNoShare ? FILEINDEX_ERR_PATH : FILEINDEX_ERR_NONE);
-    std::string line = *c.logLine ? std::string("utils:N ") + c.logLine : "";
+              rule == R::kNoShare ? FILEINDEX_ERR_PATH : FILEINDEX_ERR_NONE);
+    std::string line = *logLine ? std::string("utils:N ") + logLine : "";
     if (line.find("%s") != std::string::npos) line.replace(line.find("%s"), 2, fullPath);
     EXPECT_EQ(log.Lines().empty() ? "" : log.Lines().back(), line);
     ErrorHandler::SetError(FILEINDEX_ERR_NONE);
   }
-}
-
-TEST_F(EligibilityTest, SharePathThatCannotBeResolvedSetsThePathCode) {
-  EXPECT_FALSE(CanPathBeIndexed("/nosuch/2019"));
-  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_PATH);
-  EXPECT_THAT(log.Lines(), ElementsAre("utils:N GetFullPath failed, path=/nosuch/2019"));
-  EXPECT_TRUE(CanPathBeIndexed("/photo/2019"));
-  EXPECT_FALSE(CanShareBeIndexed(nullptr));
 }
 
 // Rows: '+' skipped or '-' not, the name in /volume1/photo ("no-slash" as it stands), then the
@@ -138,32 +124,33 @@ TEST_F(EligibilityTest, CrawledItemsAreSkippedByNameLocationAndFileSystem) {
     Arrange(row.substr(space), fake::Get().defaultFacts);
     EXPECT_EQ(IsSkipIndex(name == "no-slash" ? name : "/volume1/photo/" + name), row[0] == '+')
         << row;
-    EXPECT_EQ(fake::Get().OpNames().front(), "WEZOGetFSType") << row;
+    EXPECT_EQ(fake::Get().calls.front().op, "WEZOGetFSType") << row;
   }
 }
 
-TEST_F(EligibilityTest, OnlyADefiniteOutOfSpaceAnswerMeansNoRoom) {
-  const struct {
-    bool enough;
-    int error;
-    bool expected;
-  } cases[] = {{true, 0, true},
-               {false, WLIBC_ERR_NO_SPACE, false},
-               {false, WLIBC_ERR_OVER_QUOTA, false},
-               {false, WLIBC_ERR_BAD_PARAMETERS, true},
-               {false, 0, true}};
-  for (const auto& c : cases) {
-    fake::Get().quotaEnough = c.enough;
-    fake::Get().quotaError = c.error;
+TEST_F(EligibilityTest, OnlyADefiniteOutOfSpaceAnswerMeansNoRoomAndAnUnknownShareNoPath) {
+  const std::tuple<bool, int, bool> cases[] = {{true, 0, true},
+                                               {false, WLIBC_ERR_NO_SPACE, false},
+                                               {false, WLIBC_ERR_OVER_QUOTA, false},
+                                               {false, WLIBC_ERR_BAD_PARAMETERS, true},
+                                               {false, 0, true}};
+  for (const auto& [enough, error, expected] : cases) {
+    fake::Get().quotaEnough = enough;
+    fake::Get().quotaError = error;
     fake::Get().calls.clear();
-    EXPECT_EQ(IsShareSpaceEnough("photo"), c.expected) << std::hex << c.error;
+    EXPECT_EQ(IsShareSpaceEnough("photo"), expected) << std::hex << error;
     const auto quota = fake::Get().CallsTo("WEZOQuotaIsEnough");
     ASSERT_EQ(quota.size(), 1U);
     EXPECT_THAT(quota[0].args, ElementsAre("0", volume + "/photo", "10485760"));
     EXPECT_EQ(fake::Get().openShareRecords, 0);
   }
   EXPECT_FALSE(IsShareSpaceEnough("nosuch"));
-  EXPECT_THAT(log.Lines(), ElementsAre("utils:N WEZOShareGet failed, share=nosuch"));
+  // A share path that cannot be resolved sets the path code.
+  EXPECT_FALSE(CanPathBeIndexed("/nosuch/2019") || CanShareBeIndexed(nullptr));
+  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_PATH);
+  EXPECT_THAT(log.Lines(), ElementsAre("utils:N WEZOShareGet failed, share=nosuch",
+                                       "utils:N GetFullPath failed, path=/nosuch/2019"));
+  EXPECT_TRUE(CanPathBeIndexed("/photo/2019"));
 }
 
 }  // namespace

@@ -1,8 +1,7 @@
-// The admin tool run as a program over the shipped library and its Linux platform, in a sandbox
-// appliance of its own (scripts/sandbox-appliance.sh) with the stand-in daemon on the socket. The
-// walk through every operation is the demo's; these tests hold what it does not show: each exit
-// status with its message, the JSON output equal to what the library answers in this process for
-// the same root, the report of a change whose later step failed, and check/repair.
+// The admin tool as a program over the shipped library and its Linux platform, in a sandbox
+// appliance (scripts/sandbox-appliance.sh) with the stand-in daemon: what the demo's walk through
+// every operation does not show (exit statuses and messages, JSON equal to the library's answer,
+// a change whose later step failed, check/repair).
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <json/reader.h>
@@ -11,13 +10,12 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <csignal>
 #include <filesystem>
 #include <functional>
 #include <memory>
 #include <string>
-#include <thread>
+#include <tuple>
 #include <vector>
 
 #include "fileindex/fileindex.h"
@@ -62,17 +60,13 @@ class FileindexctlTest : public SandboxTest {
   // -1; with `pid`, leaves it running and answers 0.
   int Spawn(Args args, pid_t* pid) const {
     std::vector<char*> argv;
-    for (std::string& arg : args) {
-      argv.push_back(arg.data());
-    }
+    for (std::string& arg : args) argv.push_back(arg.data());
     argv.push_back(nullptr);
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
-    for (const int fd : {1, 2}) {
-      const std::string name = At(fd == 1 ? "tool.out" : "tool.err");
-      posix_spawn_file_actions_addopen(&actions, fd, name.c_str(), O_WRONLY | O_CREAT | O_TRUNC,
-                                       0644);
-    }
+    const std::string out = At("tool.out"), err = At("tool.err");
+    posix_spawn_file_actions_addopen(&actions, 1, out.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
+    posix_spawn_file_actions_addopen(&actions, 2, err.c_str(), O_WRONLY | O_CREAT | O_TRUNC, 0644);
     pid_t child = -1;
     const int spawned = posix_spawn(&child, argv[0], pid != nullptr ? nullptr : &actions, nullptr,
                                     argv.data(), environ);
@@ -94,9 +88,7 @@ class FileindexctlTest : public SandboxTest {
                     &m_daemon),
               0);
     const auto listening = [&] { return Read("records/daemon.log").find("listening on", seen); };
-    for (int i = 0; i < 500 && listening() == std::string::npos; ++i) {
-      std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
+    for (int i = 0; i < 500 && listening() == std::string::npos; ++i) usleep(10000);
     ASSERT_NE(listening(), std::string::npos);
   }
   void StopDaemon() {
@@ -110,9 +102,7 @@ class FileindexctlTest : public SandboxTest {
   // Runs the tool on `args`, with `--root <sandbox>` first unless `args` gives its own root.
   Result Run(const Args& args) const {
     Args all = {FILEINDEXCTL};
-    if (args.empty() || args[0] != "--root") {
-      all.insert(all.end(), {"--root", root_});
-    }
+    if (args.empty() || args[0] != "--root") all.insert(all.end(), {"--root", root_});
     all.insert(all.end(), args.begin(), args.end());
     const int status = Spawn(all, nullptr);
     return {status, Read("tool.out"), Read("tool.err")};
@@ -130,13 +120,9 @@ class FileindexctlTest : public SandboxTest {
 
 TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
   const std::string deep = std::string(2000, '[') + std::string(2000, ']');
-  struct Case {
-    Args args;
-    int status;
-    std::string err;  // expected in stderr; a case expecting "" wants stderr empty
-    std::string out;  // expected in stdout, which is empty on a failure
-  };
-  const Case cases[] = {
+  // The arguments, the exit status, and what stderr holds ("": nothing) and stdout (nothing when
+  // the status is not 0).
+  const std::tuple<Args, int, std::string, std::string> cases[] = {
       // Columns count characters, not bytes.
       {{"list", "--additional", "status", "-a", "is_valid"},
        0,
@@ -178,23 +164,23 @@ TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
       {{"--root", "relative/dir", "list"}, 2, "--root must be an absolute path", ""},
       {{"--root", At("etc/samba/smb.conf"), "list"}, 2, "must name an existing directory", ""},
   };
-  for (const Case& c : cases) {
-    SCOPED_TRACE(testing::PrintToString(c.args));
-    const Result result = Run(c.args);
-    EXPECT_EQ(result.status, c.status) << result.err;
-    EXPECT_NE(result.err.find(c.err), std::string::npos) << result.err;
-    EXPECT_NE(result.out.find(c.out), std::string::npos) << result.out;
-    EXPECT_TRUE(!c.err.empty() || result.err.empty()) << result.err;
-    EXPECT_TRUE(c.status == 0 || result.out.empty()) << result.out;
+  for (const auto& [args, status, err, out] : cases) {
+    SCOPED_TRACE(testing::PrintToString(args));
+    const Result result = Run(args);
+    EXPECT_EQ(result.status, status) << result.err;
+    EXPECT_NE(result.err.find(err), std::string::npos) << result.err;
+    EXPECT_NE(result.out.find(out), std::string::npos) << result.out;
+    EXPECT_TRUE(!err.empty() || result.err.empty()) << result.err;
+    EXPECT_TRUE(status == 0 || result.out.empty()) << result.out;
   }
   // Only the add that warned without --strict changed the list.
   EXPECT_EQ(RunJson({"list"})["total"], 3);
 }
 
 TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResultAndNamesEachChange) {
-  const Json::Value additional = Parse(R"(["status", "is_valid"])");
   Json::Value expected;
-  ASSERT_TRUE(fi::IndexMgr::List(expected, 1, 1, "name", "DESC", additional));
+  ASSERT_TRUE(
+      fi::IndexMgr::List(expected, 1, 1, "name", "DESC", Parse(R"(["status", "is_valid"])")));
   EXPECT_EQ(RunJson({"list", "--offset", "1", "--limit", "1", "--sort-by", "name", "--desc",
                      "--additional", "status,is_valid"}),
             ReadBack(expected));
@@ -212,21 +198,16 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResultAndNamesEachChange) {
   EXPECT_EQ(shown["folders"]["/photo/2019"], fi::StatusMgr::GetFolderStatus("/photo/2019"));
 
   // explain: the deciding rule is the library's, and the folder holding the path.
-  const struct {
-    Args args;
-    const char* rule;
-    const char* holder;
-  } explained[] = {{{"/photo/2019/trip"}, "unknown_file_system", "/photo/2019"},
-                   {{At("volume1/video/movies"), "--full-path"}, "indexable", "/video/movies"},
-                   {{"/photo/2019/"}, "resolves_elsewhere", "/photo/2019"},
-                   {{"/tv/x"}, "unknown_file_system", ""}};
-  for (const auto& c : explained) {
-    SCOPED_TRACE(c.args[0]);
-    Args args = c.args;
-    args.insert(args.begin(), "explain");
+  const std::tuple<Args, const char*, const char*> explained[] = {
+      {{"explain", "/photo/2019/trip"}, "unknown_file_system", "/photo/2019"},
+      {{"explain", At("volume1/video/movies"), "--full-path"}, "indexable", "/video/movies"},
+      {{"explain", "/photo/2019/"}, "resolves_elsewhere", "/photo/2019"},
+      {{"explain", "/tv/x"}, "unknown_file_system", ""}};
+  for (const auto& [args, rule, holder] : explained) {
+    SCOPED_TRACE(args[1]);
     const Json::Value said = RunJson(args);
-    EXPECT_EQ(said["rule"], c.rule);
-    EXPECT_EQ(said["folder"], c.holder);
+    EXPECT_EQ(said["rule"], rule);
+    EXPECT_EQ(said["folder"], holder);
     EXPECT_EQ(said["rule"], fi::IndexRuleKey(fi::FullPathIndexRule(said["full_path"].asString())));
   }
   EXPECT_EQ(Run({"explain", "/photo/latest"}).out,
@@ -368,9 +349,7 @@ TEST_F(FileindexctlTest, CheckFindsEachDisagreementAndRepairBringsItBackInLine) 
     const Result repair = Run({"check", "--repair"});
     EXPECT_EQ(repair.status, c.repaired ? 0 : 1) << repair.out << repair.err;
     EXPECT_EQ(repair.out.find("left: ") != std::string::npos, !c.repaired) << repair.out;
-    if (c.after) {
-      c.after();
-    }
+    if (c.after) c.after();
     EXPECT_EQ(Run({"check"}).status, 0);
   }
 }

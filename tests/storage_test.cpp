@@ -5,6 +5,7 @@
 #include <filesystem>
 #include <functional>
 #include <map>
+#include <tuple>
 
 #include "fake_platform.h"
 #include "fileindex/fileindex_c.h"
@@ -24,66 +25,59 @@ using Getter = int (*)(const char*, char*, int);
 class StorageTest : public testsupport::LibraryTest {
  protected:
   StorageTest() { std::filesystem::create_directories(volume + "/photo"); }
+
+  const std::string metadata = volume + "/photo/@eaDir";
+  const std::string queue = metadata + "/WEZO@file_index_queue";
+  const std::string db = metadata + "/WEZO@.fileindexdb";
+  const std::string out = At("out");  // where links in the metadata directory point
+  char buffer[4096];
 };
 
 // Arguments are checked in order before anything is looked up; a failed lookup leaves its own
 // error. A result that does not fit is cut as snprintf cuts, and is still a success.
 TEST_F(StorageTest, RefusesBadArgumentsAndWritesTheLocations) {
-  char buffer[4096];
   const std::string bad = "utils:N Invaild Argument (";
-  const std::string queue = volume + "/photo/@eaDir/WEZO@file_index_queue";
   ASSERT_EQ(FILEIDXQueuePathGet("photo", buffer, sizeof buffer), static_cast<int>(queue.size()));
   EXPECT_EQ(buffer, queue);
-  EXPECT_TRUE(std::filesystem::is_directory(volume + "/photo/@eaDir"));
+  EXPECT_TRUE(std::filesystem::is_directory(metadata));
   EXPECT_FALSE(std::filesystem::exists(queue));
   ASSERT_EQ(FILEIDXQueuePathGet("photo", buffer, 10), 9);
   EXPECT_EQ(std::string(buffer), volume.substr(0, 9));
   ASSERT_EQ(FILEIDXQueuePathGet("photo", buffer, 1), 0);
   EXPECT_EQ(fake::Get().openShareRecords, 0);
-  const struct {
-    Getter getter;
-    const char* name;
-    char* out;
-    int size;
-    std::string line;
-    int code;  // the platform's last error afterwards
-  } cases[] = {{FILEIDXQueuePathGet, nullptr, nullptr, 0, bad + "__null != szName)=[0]\n", 0xD00},
-               {FILEIDXDBPathGet, "photo", nullptr, 0, bad + "__null != szOutDBPath)=[0]\n", 0xD00},
-               {FILEIDXQueuePathGet, "photo", buffer, 0, bad + "cbOutLen > 0)=[0]\n", 0xD00},
-               {FILEIDXDBPathGet, "nosuch", buffer, 64,
-                "utils:N WEZOShareGet failed, name=nosuch, code=3585", fake::kInjectedError}};
-  for (const auto& c : cases) {
+  // The getter, its arguments, the line it logs and the platform's last error afterwards.
+  const std::tuple<Getter, const char*, char*, int, std::string, int> cases[] = {
+      {FILEIDXQueuePathGet, nullptr, nullptr, 0, bad + "__null != szName)=[0]\n", 0xD00},
+      {FILEIDXDBPathGet, "photo", nullptr, 0, bad + "__null != szOutDBPath)=[0]\n", 0xD00},
+      {FILEIDXQueuePathGet, "photo", buffer, 0, bad + "cbOutLen > 0)=[0]\n", 0xD00},
+      {FILEIDXDBPathGet, "nosuch", buffer, 64,
+       "utils:N WEZOShareGet failed, name=nosuch, code=3585", fake::kInjectedError}};
+  for (const auto& [getter, name, out, size, line, code] : cases) {
     fake::Reset();
     log.Clear();
-    EXPECT_EQ(c.getter(c.name, c.out, c.size), -1) << c.line;
-    EXPECT_THAT(log.Lines(), ElementsAre(c.line));
-    EXPECT_EQ(fake::Get().errCode, c.code);
-    EXPECT_EQ(fake::Get().calls.empty(), c.code == 0xD00) << "nothing is looked up";
+    EXPECT_EQ(getter(name, out, size), -1) << line;
+    EXPECT_THAT(log.Lines(), ElementsAre(line));
+    EXPECT_EQ(fake::Get().errCode, code);
+    EXPECT_EQ(fake::Get().calls.empty(), code == 0xD00) << "nothing is looked up";
   }
 }
 
 // Made when missing; an existing one is no error and loses only its group and world write bits.
 // Directories that cannot be made are logged, and the path still returned.
 TEST_F(StorageTest, TheDatabaseDirectoryIsWritableByItsOwnerOnlyWhateverTheUmask) {
-  const std::string db = volume + "/photo/@eaDir/WEZO@.fileindexdb";
-  char buffer[4096];
-  const struct {
-    mode_t umask;
-    int existing;  // the mode of a directory already there, or -1
-    int mode;
-  } cases[] = {{077, -1, 0755}, {0, 0777, 0755}, {0, 0700, 0700}};
-  for (const auto& c : cases) {
+  // Umask, then the mode of a directory already there (0: none), then the mode expected.
+  for (const auto& [mask, existing, mode] :
+       {std::tuple{077, 0, 0755}, {0, 0777, 0755}, {0, 0700, 0700}}) {
     std::filesystem::remove_all(db);
-    if (c.existing >= 0) std::filesystem::create_directories(db);
-    if (c.existing >= 0) chmod(db.c_str(), static_cast<mode_t>(c.existing));
-    const mode_t oldMask = umask(c.umask);
+    if (existing != 0) std::filesystem::create_directories(db), chmod(db.c_str(), existing);
+    const mode_t oldMask = umask(mask);
     EXPECT_EQ(FILEIDXDBPathGet("photo", buffer, sizeof buffer), static_cast<int>(db.size()));
     umask(oldMask);
-    EXPECT_EQ(testsupport::ModeOf(db), c.mode) << std::oct << c.umask << " " << c.existing;
+    EXPECT_EQ(testsupport::ModeOf(db), mode) << std::oct << mask << " " << existing;
   }
   EXPECT_THAT(log.Lines(), IsEmpty());
   fake::Get().ea_mkdir_fails = true;
-  std::filesystem::remove_all(volume + "/photo/@eaDir");
+  std::filesystem::remove_all(metadata);
   EXPECT_EQ(FILEIDXDBPathGet("photo", buffer, sizeof buffer), static_cast<int>(db.size()));
   EXPECT_EQ(buffer, db);
   EXPECT_THAT(
@@ -106,50 +100,36 @@ std::map<std::string, std::string> Tree(const std::string& dir) {
 }
 
 TEST_F(StorageTest, NothingBelowTheShareIsReachedThroughALinkInTheMetadataDirectory) {
-  const std::string metadata = volume + "/photo/@eaDir";
-  const std::string queue = metadata + "/WEZO@file_index_queue";
-  const std::string db = metadata + "/WEZO@.fileindexdb";
-  const std::string out = sandbox.Path("/out");
   const std::string linked = ", reason=Too many levels of symbolic links";
-  char buffer[4096];
-  const struct {
-    std::function<bool()> run;
-    bool result;
-    std::string lastLine;
-  } cases[] = {{[&] { return FILEIDXDBPathGet("photo", buffer, sizeof buffer) > 0; }, true,
-                "utils:N mkdir failed, path=" + db + linked},
-               {[&] { return IsReindexQueued(volume + "/photo/a", queue); }, false,
-                "utils:N Failed to open queue=" + queue + linked},
-               {[&] { return QueueHasFolderEvent("/photo/a", queue); }, false,
-                "status_mgr:N Failed to open queue=" + queue + linked},
-               {[&] { return IndexMgr::CleanShareIndexData("photo"); }, false,
-                "index_mgr:N Failed to remove " + db + linked}};
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.lastLine);
+  const std::tuple<std::function<bool()>, bool, std::string> cases[] = {
+      {[&] { return FILEIDXDBPathGet("photo", buffer, sizeof buffer) > 0; }, true,
+       "utils:N mkdir failed, path=" + db + linked},
+      {[&] { return IsReindexQueued(volume + "/photo/a", queue); }, false,
+       "utils:N Failed to open queue=" + queue + linked},
+      {[&] { return QueueHasFolderEvent("/photo/a", queue); }, false,
+       "status_mgr:N Failed to open queue=" + queue + linked},
+      {[&] { return IndexMgr::CleanShareIndexData("photo"); }, false,
+       "index_mgr:N Failed to remove " + db + linked}};
+  for (const auto& [run, result, lastLine] : cases) {
+    SCOPED_TRACE(lastLine);
     std::filesystem::remove_all(metadata);
     std::filesystem::remove_all(out);
-    std::filesystem::create_directories(out);
-    testsupport::WriteFile(out + "/WEZO@file_index_queue",
-                           R"({"event":65536,"path":")" + volume + "/photo/a\"}\n");
-    testsupport::WriteFile(out + "/WEZO@file_index_queue.tmp", "tmp");
+    Write("out/WEZO@file_index_queue", R"({"event":65536,"path":")" + volume + "/photo/a\"}\n");
+    Write("out/WEZO@file_index_queue.tmp", "tmp");
     std::filesystem::create_symlink(out, metadata);
     const auto before = Tree(out);
     log.Clear();
-    EXPECT_EQ(c.run(), c.result);
+    EXPECT_EQ(run(), result);
     EXPECT_EQ(Tree(out), before);
-    EXPECT_EQ(log.Lines().empty() ? "" : log.Lines().back(), c.lastLine);
+    EXPECT_EQ(log.Lines().empty() ? "" : log.Lines().back(), lastLine);
   }
 }
 
 TEST_F(StorageTest, RemovingIndexDataTakesWholeTreesAndLinksButNeverWhatALinkPointsTo) {
-  const std::string metadata = volume + "/photo/@eaDir";
-  const std::string db = metadata + "/WEZO@.fileindexdb";
-  const std::string out = sandbox.Path("/out");
-  std::filesystem::create_directories(out);
   std::filesystem::create_directories(db + "/a");
-  testsupport::WriteFile(out + "/file", "keep");
-  testsupport::WriteFile(metadata + "/WEZO@file_index_queue", "q");
-  std::filesystem::create_symlink(out + "/file", metadata + "/WEZO@file_index_queue.tmp");
+  Write("out/file", "keep");
+  testsupport::WriteFile(queue, "q");
+  std::filesystem::create_symlink(out + "/file", queue + ".tmp");
   std::filesystem::create_directory_symlink(out, db + "/a/out");
   std::string deepest = db;
   for (int depth = 0; depth < kMaxRemovalDepth; ++depth) deepest += "/d";
@@ -159,8 +139,9 @@ TEST_F(StorageTest, RemovingIndexDataTakesWholeTreesAndLinksButNeverWhatALinkPoi
   EXPECT_FALSE(IndexMgr::CleanShareIndexData("photo"));
   EXPECT_THAT(log.Lines(),
               ElementsAre("index_mgr:N Failed to remove " + db + ", reason=File name too long"));
-  EXPECT_EQ(Tree(metadata).count("/WEZO@file_index_queue.tmp"), 0U);
-  EXPECT_EQ(Tree(metadata).count("/WEZO@file_index_queue"), 0U);
+  EXPECT_EQ(Tree(metadata).count("/WEZO@file_index_queue.tmp") +
+                Tree(metadata).count("/WEZO@file_index_queue"),
+            0U);
 
   std::filesystem::remove(deepest);
   log.Clear();

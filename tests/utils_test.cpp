@@ -4,6 +4,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <tuple>
 
 #include "fake_platform.h"
 #include "fileindex/error.h"
@@ -69,50 +70,43 @@ TEST_F(UtilsTest, SmallHelpersAnswerOnTheirBoundaries) {
 }
 
 TEST_F(UtilsTest, SharePathsSplitAtTheFirstComponent) {
-  const struct Case {
-    const char* path;
-    const char* name;      // nullptr: refused
-    const char* replaced;  // ReplaceShareName(path, "b")
-  } kCases[] = {{"/photo", "photo", "/b"},       {"/photo/", "photo", "/b/"}, {"/", "", "/b"},
-                {"photo/2019", "hoto", nullptr}, {"//x", "", nullptr},        {"", nullptr, ""}};
-  for (const Case& c : kCases) {
-    SCOPED_TRACE(c.path);
+  // The path, its share name (nullptr: refused) and ReplaceShareName(path, "b").
+  const std::tuple<const char*, const char*, const char*> kCases[] = {
+      {"/photo", "photo", "/b"},       {"/photo/", "photo", "/b/"}, {"/", "", "/b"},
+      {"photo/2019", "hoto", nullptr}, {"//x", "", nullptr},        {"", nullptr, ""}};
+  for (const auto& [path, expected, replaced] : kCases) {
+    SCOPED_TRACE(path);
     std::string name = "old";
-    EXPECT_EQ(GetShareNameByPath(name, c.path), c.name != nullptr);
-    EXPECT_EQ(name, c.name != nullptr ? c.name : "old");
-    EXPECT_EQ(c.replaced != nullptr ? ReplaceShareName(c.path, "b") : "",
-              c.replaced ? c.replaced : "");
+    EXPECT_EQ(GetShareNameByPath(name, path), expected != nullptr);
+    EXPECT_EQ(name, expected != nullptr ? expected : "old");
+    EXPECT_EQ(replaced != nullptr ? ReplaceShareName(path, "b") : "", replaced ? replaced : "");
   }
   EXPECT_EQ(ReplaceShareName("/photo/2019", "pictures"), "/pictures/2019");
 }
 
 TEST_F(UtilsTest, FullPathsComeFromTheShareDatabaseAndErrorsOutliveSuccesses) {
   fake::Get().AddShare("flat", "flatshare");
-  const struct Case {
-    const char* path;
-    std::string full;  // empty: refused
-    _tag_fileindex_err_ code;
-    Lines lines;
-  } kCases[] = {{"/photo/a//b/../c", volume + "/photo/a//b/../c", FILEINDEX_ERR_NONE, {}},
-                {"/flat/x", "flatshare/flat/x", FILEINDEX_ERR_NONE, {}},
-                {"/music/a", "", FILEINDEX_ERR_PATH, {}},
-                {"", "", FILEINDEX_ERR_NONE, {"utils:N GetShareNameByPath failed, path="}}};
-  for (const Case& c : kCases) {
-    SCOPED_TRACE(c.path);
+  // The path, its full path ("": refused), the error code left and the lines logged.
+  const std::tuple<const char*, std::string, _tag_fileindex_err_, Lines> kCases[] = {
+      {"/photo/a//b/../c", volume + "/photo/a//b/../c", FILEINDEX_ERR_NONE, {}},
+      {"/flat/x", "flatshare/flat/x", FILEINDEX_ERR_NONE, {}},
+      {"/music/a", "", FILEINDEX_ERR_PATH, {}},
+      {"", "", FILEINDEX_ERR_NONE, {"utils:N GetShareNameByPath failed, path="}}};
+  for (const auto& [path, expected, code, lines] : kCases) {
+    SCOPED_TRACE(path);
     fake::Get().calls.clear();
     ErrorHandler::SetError(FILEINDEX_ERR_NONE);
     log.Clear();
     std::string full = "old";
-    EXPECT_EQ(GetFullPath(full, c.path), !c.full.empty());
-    EXPECT_EQ(full, c.full.empty() ? "old" : c.full);
-    EXPECT_EQ(ErrorHandler::GetError(), c.code);
-    EXPECT_EQ(log.Lines(), c.lines);
+    EXPECT_EQ(GetFullPath(full, path), !expected.empty());
+    EXPECT_EQ(full, expected.empty() ? "old" : expected);
+    EXPECT_EQ(ErrorHandler::GetError(), code);
+    EXPECT_EQ(log.Lines(), lines);
     EXPECT_EQ(fake::Get().openShareRecords, 0);
-    EXPECT_EQ(fake::Get().CallsTo("WEZOShareGet").empty(), *c.path == '\0');
+    EXPECT_EQ(fake::Get().CallsTo("WEZOShareGet").empty(), *path == '\0');
   }
   log.Clear();
-  std::string name = "n";
-  std::string path = "p";
+  std::string name = "n", path = "p";
   EXPECT_FALSE(GetShareNamePathByFullPath(name, path, volume + "/videos/a.mp4"));
   EXPECT_EQ(name + path, "np");
   EXPECT_EQ(log.Lines(),

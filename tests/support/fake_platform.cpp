@@ -40,9 +40,7 @@ const PathFacts& FactsOf(const char* path) {
 }
 
 const Share* ShareOf(const WEZOSHARE* record) {
-  if (record == nullptr) {
-    return nullptr;
-  }
+  if (record == nullptr) return nullptr;
   auto it = Get().shares.find(record->szName);
   return it != Get().shares.end() ? &it->second : nullptr;
 }
@@ -50,18 +48,14 @@ const Share* ShareOf(const WEZOSHARE* record) {
 int FlagQuery(const char* op, const WEZOSHARE* record, int* flag, bool fails, bool Share::*field) {
   Record(op, {record != nullptr ? record->szName : "(null)"});
   const Share* share = ShareOf(record);
-  if (fails || share == nullptr || flag == nullptr) {
-    return Fail(__LINE__);
-  }
+  if (fails || share == nullptr || flag == nullptr) return Fail(__LINE__);
   *flag = share->*field ? 1 : 0;
   return 0;
 }
 
 int ServiceCall(const char* op, const char* service, bool fails, bool running, int flags = 0) {
   Record(op, {Str(service), std::to_string(flags)});
-  if (fails || service == nullptr) {
-    return Fail(__LINE__);
-  }
+  if (fails || service == nullptr) return Fail(__LINE__);
   Get().running[service] = running;
   return 0;
 }
@@ -79,17 +73,7 @@ void Platform::AddShare(const std::string& name, const std::string& path) {
 std::vector<Call> Platform::CallsTo(const std::string& op) const {
   std::vector<Call> out;
   for (const Call& c : calls) {
-    if (c.op == op) {
-      out.push_back(c);
-    }
-  }
-  return out;
-}
-
-std::vector<std::string> Platform::OpNames() const {
-  std::vector<std::string> out;
-  for (const Call& c : calls) {
-    out.push_back(c.op);
+    if (c.op == op) out.push_back(c);
   }
   return out;
 }
@@ -104,16 +88,10 @@ extern "C" {
 
 int WEZOShareGet(const char* szName, PWEZOSHARE* ppShare) {
   Record("WEZOShareGet", {Str(szName)});
-  if (Get().share_get_fails || szName == nullptr || ppShare == nullptr) {
-    return fake::Fail(__LINE__);
-  }
+  if (Get().share_get_fails || szName == nullptr || ppShare == nullptr) return fake::Fail(__LINE__);
   auto it = Get().shares.find(szName);
-  if (it == Get().shares.end() || Get().share_get_fails_after == 0) {
-    return fake::Fail(__LINE__);
-  }
-  if (Get().share_get_fails_after > 0) {
-    --Get().share_get_fails_after;
-  }
+  if (it == Get().shares.end() || Get().share_get_fails_after == 0) return fake::Fail(__LINE__);
+  if (Get().share_get_fails_after > 0) --Get().share_get_fails_after;
   auto* record = new WEZOSHARE();
   (void)std::snprintf(record->szName, sizeof record->szName, "%s", it->second.name.c_str());
   (void)std::snprintf(record->szPath, sizeof record->szPath, "%s", it->second.path.c_str());
@@ -141,13 +119,9 @@ int WEZOShareNamePathGet(const char* szFullPath, char* szShareName, int cbShareN
   const std::string full = szFullPath;
   for (const auto& [name, share] : Get().shares) {
     const bool inside = full == share.path || full.rfind(share.path + "/", 0) == 0;
-    if (inside && (best == nullptr || share.path.size() > best->path.size())) {
-      best = &share;
-    }
+    if (inside && (best == nullptr || share.path.size() > best->path.size())) best = &share;
   }
-  if (best == nullptr) {
-    return fake::Fail(__LINE__);
-  }
+  if (best == nullptr) return fake::Fail(__LINE__);
   (void)std::snprintf(szShareName, static_cast<size_t>(cbShareName), "%s", best->name.c_str());
   (void)std::snprintf(szSharePath, static_cast<size_t>(cbSharePath), "%s", best->path.c_str());
   return 0;
@@ -180,12 +154,12 @@ int WEZOGetFSType(const char* szPath, int flags) {
 
 int WEZOFSIsRemoteFS(int fsType) {
   Record("WEZOFSIsRemoteFS", {std::to_string(fsType)});
-  return Get().remoteTypes.count(fsType) != 0 ? 1 : 0;
+  return fsType == fake::kRemoteFs ? 1 : 0;
 }
 
 int WEZOFSIsImageFS(int fsType) {
   Record("WEZOFSIsImageFS", {std::to_string(fsType)});
-  return Get().imageTypes.count(fsType) != 0 ? 1 : 0;
+  return fsType == fake::kImageFs ? 1 : 0;
 }
 
 int WEZOFSDirIsMntPoint(const char* szPath) {
@@ -195,23 +169,19 @@ int WEZOFSDirIsMntPoint(const char* szPath) {
 
 int WLIBFhsPathInSnapshot(const char* szPath, int* pfInSnapshot) {
   Record("WLIBFhsPathInSnapshot", {Str(szPath)});
-  if (Get().snapshot_query_fails || pfInSnapshot == nullptr) {
-    return fake::Fail(__LINE__);
-  }
+  if (Get().snapshot_query_fails || pfInSnapshot == nullptr) return fake::Fail(__LINE__);
   *pfInSnapshot = fake::FactsOf(szPath).snapshot ? 1 : 0;
   return 0;
 }
 
 int WEZOEAIsHiddenDir(const char* szName) {
   Record("WEZOEAIsHiddenDir", {Str(szName)});
-  return szName != nullptr && Get().hiddenDirNames.count(szName) != 0 ? 1 : 0;
+  return szName != nullptr && std::strcmp(szName, "@eaDir") == 0 ? 1 : 0;
 }
 
 int WEZOEAMKDir(int flags, const char* szPath) {
   Record("WEZOEAMKDir", {std::to_string(flags), Str(szPath)});
-  if (Get().ea_mkdir_fails || szPath == nullptr) {
-    return fake::Fail(__LINE__);
-  }
+  if (Get().ea_mkdir_fails || szPath == nullptr) return fake::Fail(__LINE__);
   struct stat st {};
   // As on the appliance, a symbolic link in the directory's place is not the directory.
   if ((mkdir(szPath, 0755) != 0 && errno != EEXIST) || lstat(szPath, &st) != 0 ||
@@ -246,9 +216,7 @@ int WLIBCExec(const char* szPath, const char* szArg1, const char* szArg2, const 
               const char* szArg4) {
   std::vector<std::string> args{Str(szPath)};
   for (const char* arg : {szArg1, szArg2, szArg3, szArg4}) {
-    if (arg == nullptr) {
-      break;
-    }
+    if (arg == nullptr) break;
     args.emplace_back(arg);
   }
   Record("WLIBCExec", std::move(args));
@@ -257,9 +225,7 @@ int WLIBCExec(const char* szPath, const char* szArg1, const char* szArg2, const 
 
 int WLIBCExecv(const char* szPath, const char* const argv[], int flags) {
   std::vector<std::string> args{Str(szPath)};
-  for (size_t i = 0; argv != nullptr && argv[i] != nullptr; ++i) {
-    args.emplace_back(argv[i]);
-  }
+  for (size_t i = 0; argv != nullptr && argv[i] != nullptr; ++i) args.emplace_back(argv[i]);
   args.push_back(std::to_string(flags));
   Record("WLIBCExecv", std::move(args));
   return Get().execResult;
@@ -279,17 +245,13 @@ int WLIBServiceRestart(const char* szService) {
 
 int WEZOSMBIsEnableSpotlight(void) {
   Record("WEZOSMBIsEnableSpotlight", {});
-  if (Get().spotlight_query_fails) {
-    return fake::Fail(__LINE__);
-  }
+  if (Get().spotlight_query_fails) return fake::Fail(__LINE__);
   return Get().spotlight;
 }
 
 int WEZOSMBSetSpotlight(int fEnable) {
   Record("WEZOSMBSetSpotlight", {std::to_string(fEnable)});
-  if (Get().spotlight_set_fails) {
-    return fake::Fail(__LINE__);
-  }
+  if (Get().spotlight_set_fails) return fake::Fail(__LINE__);
   Get().spotlight = fEnable != 0 ? 1 : 0;
   return 0;
 }

@@ -11,13 +11,12 @@
 #include <json/value.h>
 
 #include <map>
-#include <set>
 #include <string>
 #include <vector>
 
 namespace fake {
 
-// File-system type codes that the fake answers with (any code works; these name the classes).
+// File-system type codes that the fake answers with; only these two are remote or image ones.
 constexpr int kLocalFs = 1;
 constexpr int kRemoteFs = 20;
 constexpr int kImageFs = 30;
@@ -28,17 +27,14 @@ constexpr int kInjectedError = 0x0E01;
 struct Share {
   std::string name;
   std::string path;  // the share's own full path
-  bool encrypted = false;
-  bool encryption = false;
-  bool readOnly = false;
+  bool encrypted = false, encryption = false, readOnly = false;
 };
 
 // What the file-system queries answer for one full path.
 struct PathFacts {
   int fsType = kLocalFs;
   int mountPoint = 0;  // WEZOFSDirIsMntPoint's answer
-  bool recycle = false;
-  bool snapshot = false;
+  bool recycle = false, snapshot = false;
 };
 
 struct Call {
@@ -51,9 +47,6 @@ struct Platform {
   std::map<std::string, Share> shares;     // by name
   std::map<std::string, PathFacts> facts;  // by exact full path
   PathFacts defaultFacts;                  // for every other path
-  std::set<int> remoteTypes{kRemoteFs};
-  std::set<int> imageTypes{kImageFs};
-  std::set<std::string> hiddenDirNames{"@eaDir"};
   bool quotaEnough = true;
   int quotaError = 0;                   // last error left by a "not enough" answer
   std::map<std::string, bool> running;  // services by name
@@ -65,22 +58,14 @@ struct Platform {
   // whose comparison is not a consistent order.
   int (*strCaseCmp)(const char*, const char*) = nullptr;
 
-  // ---- failure injection ----
-  bool share_get_fails = false;
+  // ---- failure injection, by area ----
+  bool share_get_fails = false, share_name_path_get_fails = false;
   int share_get_fails_after = -1;  // when >= 0, share lookups after that many successes fail
-  bool share_name_path_get_fails = false;
-  bool encrypted_query_fails = false;
-  bool encryption_query_fails = false;
-  bool read_only_query_fails = false;
-  bool snapshot_query_fails = false;
-  bool ea_mkdir_fails = false;
-  bool service_start_fails = false;
-  bool service_stop_fails = false;
-  bool service_restart_fails = false;
-  bool spotlight_query_fails = false;
-  bool spotlight_set_fails = false;
-  bool monitor_upsert_fails = false;
-  bool monitor_delete_fails = false;
+  bool encrypted_query_fails = false, encryption_query_fails = false;
+  bool read_only_query_fails = false, snapshot_query_fails = false, ea_mkdir_fails = false;
+  bool service_start_fails = false, service_stop_fails = false, service_restart_fails = false;
+  bool spotlight_query_fails = false, spotlight_set_fails = false;
+  bool monitor_upsert_fails = false, monitor_delete_fails = false;
 
   // ---- observation ----
   std::vector<Call> calls;   // every call but the string comparison, in order
@@ -91,7 +76,6 @@ struct Platform {
 
   void AddShare(const std::string& name, const std::string& path);
   std::vector<Call> CallsTo(const std::string& op) const;
-  std::vector<std::string> OpNames() const;  // the ops of `calls`, in order
 };
 
 // The process's fake platform.

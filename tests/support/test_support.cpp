@@ -1,12 +1,10 @@
 #include "test_support.h"
 
 #include <fcntl.h>
-#include <poll.h>
 #include <sys/file.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
-#include <sys/wait.h>
 #include <syslog.h>
 #include <unistd.h>
 
@@ -91,62 +89,57 @@ int OpenDescriptorCount() {
   return static_cast<int>(std::distance(begin(fds), end(fds))) - 1;  // less the iterator's own
 }
 
-LockHolder::LockHolder(const std::string& path, bool exclusive) {
-  int ready[2];
-  int release[2];
-  if (pipe2(ready, O_CLOEXEC) != 0 || pipe2(release, O_CLOEXEC) != 0) {
-    ADD_FAILURE() << "pipe failed";
-    return;
-  }
-  m_pid = fork();
-  if (m_pid == 0) {
-    const int fd = open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644);
-    const char ok = fd >= 0 && flock(fd, exclusive ? LOCK_EX : LOCK_SH) == 0 ? '1' : '0';
-    close(release[1]);
-    (void)!write(ready[1], &ok, 1);
-    char byte;
-    while (read(release[0], &byte, 1) > 0) {
-    }
-    _exit(0);
-  }
-  close(ready[1]);
-  close(release[0]);
-  m_release = release[1];
-  char ok = '0';
-  m_holding = m_pid > 0 && read(ready[0], &ok, 1) == 1 && ok == '1';
-  close(ready[0]);
-  EXPECT_TRUE(m_holding) << "the other process could not lock " << path;
+LockHolder::LockHolder(const std::string& path, bool exclusive)
+    : m_fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644)) {
+  m_holding = m_fd >= 0 && flock(m_fd, exclusive ? LOCK_EX : LOCK_SH) == 0;
+  EXPECT_TRUE(m_holding) << "could not lock " << path;
 }
 
 LockHolder::~LockHolder() {
-  close(m_release);
-  if (m_pid > 0) {
-    waitpid(m_pid, nullptr, 0);
-  }
+  if (m_fd >= 0) close(m_fd);
 }
+
+namespace {
+
+// A path filling sun_path to its last byte is taken: a test puts a daemon where the library must
+// refuse to look.
+sockaddr_un AddressOf(const std::string& path) {
+  sockaddr_un address{};
+  address.sun_family = AF_UNIX;
+  std::memcpy(address.sun_path, path.data(), std::min(path.size(), sizeof(address.sun_path)));
+  return address;
+}
+
+// Connects to the socket at `path` (with SOCK_NONBLOCK, not waiting on a full backlog); -1 on
+// failure.
+int ConnectTo(const std::string& path, int flags = 0) {
+  const sockaddr_un address = AddressOf(path);
+  const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | flags, 0);
+  if (fd >= 0 && connect(fd, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0) {
+    close(fd);
+    return -1;
+  }
+  return fd;
+}
+
+}  // namespace
 
 FakeDaemon::FakeDaemon(Behaviour behaviour)
     : m_path(WEZO::FILEINDEX::DaemonSocketPath()), m_behaviour(behaviour) {
-  // A path filling sun_path to its last byte is taken: a test puts a daemon where the library
-  // must refuse to look.
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
+  const sockaddr_un address = AddressOf(m_path);
   if (m_path.size() > sizeof(address.sun_path)) {
     ADD_FAILURE() << "socket path too long: " << m_path;
     return;
   }
-  std::memcpy(address.sun_path, m_path.data(), m_path.size());
-  const auto* addr = reinterpret_cast<const sockaddr*>(&address);
   const bool hold = behaviour == Behaviour::kHoldConnect;
   unlink(m_path.c_str());
-  m_listen = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
+  m_listen = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
   // A listener with a backlog of 0 queues one connection; kHoldConnect's own takes the place, so
   // the next client waits in connect().
-  if (m_listen < 0 || bind(m_listen, addr, sizeof(address)) != 0 ||
-      listen(m_listen, hold ? 0 : SOMAXCONN) != 0 || pipe2(m_wake, O_CLOEXEC | O_NONBLOCK) != 0 ||
-      (hold && ((m_dummy = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) < 0 ||
-                connect(m_dummy, addr, sizeof(address)) != 0))) {
-    ADD_FAILURE() << "cannot listen on " << m_path << ": " << std::strerror(errno);
+  if (m_listen < 0 ||
+      bind(m_listen, reinterpret_cast<const sockaddr*>(&address), sizeof(address)) != 0 ||
+      listen(m_listen, hold ? 0 : SOMAXCONN) != 0 || (hold && (m_dummy = ConnectTo(m_path)) < 0)) {
+    ADD_FAILURE() << "cannot listen on " << m_path << ": ";
     return;
   }
   m_thread = std::thread(&FakeDaemon::Serve, this);
@@ -156,16 +149,13 @@ FakeDaemon::~FakeDaemon() {
   {
     std::lock_guard<std::mutex> lock(m_mutex);
     m_stopping = true;
+    if (m_serving >= 0) shutdown(m_serving, SHUT_RDWR);
   }
-  if (m_thread.joinable()) {
-    (void)!write(m_wake[1], "x", 1);
-    m_thread.join();
-  }
-  for (int fd : {m_listen, m_wake[0], m_wake[1], m_dummy}) {
-    if (fd >= 0) {
-      close(fd);
-    }
-  }
+  m_changed.notify_all();
+  const int wake = ConnectTo(m_path, SOCK_NONBLOCK);  // ends an accept(); a full backlog does too
+  if (m_thread.joinable()) m_thread.join();
+  for (int fd : {m_listen, m_dummy, wake})
+    if (fd >= 0) close(fd);
   unlink(m_path.c_str());
 }
 
@@ -174,67 +164,38 @@ void FakeDaemon::Release() {
     std::lock_guard<std::mutex> lock(m_mutex);
     m_behaviour = Behaviour::kRead;
   }
-  (void)!write(m_wake[1], "x", 1);
-}
-
-bool FakeDaemon::Wait(int fd) {
-  for (;;) {
-    pollfd fds[2] = {{m_wake[0], POLLIN, 0}, {fd, POLLIN, 0}};
-    // The timeout only guards against a lost wake-up.
-    if (poll(fds, 2, 1000) < 0 && errno != EINTR) {
-      return false;
-    }
-    char drain[64];
-    while (read(m_wake[0], drain, sizeof(drain)) > 0) {
-    }
-    std::lock_guard<std::mutex> lock(m_mutex);
-    if (m_stopping) {
-      return false;
-    }
-    if (fds[1].revents != 0 || (fd < 0 && fds[0].revents != 0)) {
-      return true;
-    }
-  }
+  m_changed.notify_all();
 }
 
 void FakeDaemon::Serve() {
-  std::vector<int> held;                                  // kStopReading's connections
-  bool discard = m_behaviour == Behaviour::kHoldConnect;  // the first accepted is m_dummy's
-  for (;;) {
-    Behaviour behaviour;
-    {
-      std::lock_guard<std::mutex> lock(m_mutex);
-      behaviour = m_behaviour;
-    }
-    if (!Wait(behaviour == Behaviour::kHoldConnect ? -1 : m_listen)) {
-      break;
-    }
-    const int fd = behaviour == Behaviour::kHoldConnect
-                       ? -1
-                       : accept4(m_listen, nullptr, nullptr, SOCK_CLOEXEC);
-    if (fd < 0 || std::exchange(discard, false) || behaviour == Behaviour::kStopReading) {
-      if (fd >= 0) {
-        held.push_back(fd);
-      }
+  std::vector<int> held;  // m_dummy's connection and kStopReading's
+  std::unique_lock<std::mutex> lock(m_mutex);
+  m_changed.wait(lock, [&] { return m_stopping || m_behaviour != Behaviour::kHoldConnect; });
+  for (bool dummy = m_dummy >= 0; !m_stopping;) {
+    lock.unlock();
+    const int fd = accept4(m_listen, nullptr, nullptr, SOCK_CLOEXEC);
+    lock.lock();
+    if (fd < 0) continue;
+    if (std::exchange(dummy, false) || m_stopping || m_behaviour == Behaviour::kStopReading) {
+      held.push_back(fd);
       continue;
     }
+    const Behaviour behaviour = m_behaviour;
+    m_serving = fd;
+    lock.unlock();
     std::string bytes;
     char buffer[65536];
     ssize_t got = 0;
-    while (behaviour == Behaviour::kRead && Wait(fd) &&
-           (got = read(fd, buffer, sizeof(buffer))) > 0) {
+    while (behaviour == Behaviour::kRead && (got = read(fd, buffer, sizeof(buffer))) > 0) {
       bytes.append(buffer, static_cast<size_t>(got));
     }
+    lock.lock();
+    m_serving = -1;
     close(fd);
-    {
-      std::lock_guard<std::mutex> lock(m_mutex);
-      m_ended.push_back(std::move(bytes));
-    }
+    m_ended.push_back(std::move(bytes));
     m_changed.notify_all();
   }
-  for (int fd : held) {
-    close(fd);
-  }
+  for (int fd : held) close(fd);
 }
 
 std::vector<std::string> FakeDaemon::Connections(size_t count, std::chrono::milliseconds timeout) {

@@ -9,7 +9,6 @@
 
 #include <chrono>
 #include <condition_variable>
-#include <cstddef>
 #include <mutex>
 #include <ostream>
 #include <string>
@@ -45,7 +44,8 @@ std::string ReadFile(const std::string& path);  // "<missing>" when it cannot be
 int ModeOf(const std::string& path);            // the permission bits, or -1
 int OpenDescriptorCount();
 
-// Another process that holds a flock on `path` (opened, created if need be) until destroyed.
+// A flock on `path` (opened, created if need be) held until destroyed through a descriptor of its
+// own: flock locks belong to the open file, so the library meets it as another process's lock.
 class LockHolder {
  public:
   LockHolder(const std::string& path, bool exclusive);
@@ -56,8 +56,7 @@ class LockHolder {
   bool Holding() const { return m_holding; }
 
  private:
-  pid_t m_pid = -1;
-  int m_release = -1;
+  int m_fd = -1;
   bool m_holding = false;
 };
 
@@ -78,8 +77,8 @@ class FakeDaemon {
   FakeDaemon& operator=(const FakeDaemon&) = delete;
 
   void Release();  // kHoldConnect: from now on behave as kRead
-  // The bytes of each ended connection in order (empty when closed unread), once `count` have
-  // ended or `timeout` passed.
+  // The bytes of each ended connection in order ("" when closed unread), once `count` have ended
+  // or `timeout` passed.
   std::vector<std::string> Connections(size_t count,
                                        std::chrono::milliseconds timeout = std::chrono::seconds(5));
   // The commands decoded, once `count` have ended or `timeout` passed; connections closed without
@@ -90,12 +89,11 @@ class FakeDaemon {
 
  private:
   void Serve();
-  bool Wait(int fd);  // until `fd` is readable (true) or the daemon stops (false)
 
   std::string m_path;
   int m_listen = -1;
-  int m_wake[2] = {-1, -1};
-  int m_dummy = -1;  // kHoldConnect's own connection that fills the backlog
+  int m_dummy = -1;    // kHoldConnect's own connection that fills the backlog
+  int m_serving = -1;  // the connection being read, shut down to stop the thread
   std::thread m_thread;
   std::mutex m_mutex;
   std::condition_variable m_changed;

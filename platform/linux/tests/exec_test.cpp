@@ -5,6 +5,7 @@
 #include <set>
 #include <string>
 #include <thread>
+#include <tuple>
 
 #include "internal.h"
 #include "sandbox.h"
@@ -36,7 +37,7 @@ TEST_F(ExecTest, OnlyAProgramThatExitsWithZeroSucceedsAndArgumentsPassVerbatim) 
   EXPECT_EQ(Read("args"), "`id`\n");  // the first null argument ends the list
 }
 
-TEST_F(ExecTest, ControlsServicesThroughSystemctl) {
+TEST_F(ExecTest, ControlsServicesThroughSystemctlAndKeepsTheLastErrorPerThread) {
   // Stands in for systemctl: records its arguments, exits with the status in "status".
   Write("usr/bin/systemctl",
         "#!/bin/sh\nd=$(dirname \"$0\")\necho \"$@\" >> \"$d/calls\"\n"
@@ -53,8 +54,15 @@ TEST_F(ExecTest, ControlsServicesThroughSystemctl) {
             "restart fileindexd.service\n");
   Write("usr/bin/status", "1\n");
   EXPECT_LT(WLIBServiceStart("fileindexd", 1), 0);
+  std::thread([] {  // each thread has its own last error
+    EXPECT_EQ(WLIBCErrGet(), 0);
+    WLIBCErrSetEx(1, nullptr, 1);
+    EXPECT_STREQ(WLIBCErrorGetFile(), "");
+  })
+      .join();
   EXPECT_EQ(WLIBCErrGet(), WEZO::PLATFORM::kErrProgram);
   EXPECT_STREQ(WLIBCErrorGetFile(), "exec.cpp");
+  EXPECT_GT(WLIBCErrorGetLine(), 0);
   ASSERT_EQ(unlink(At("usr/bin/systemctl").c_str()), 0);
   EXPECT_LT(WLIBServiceStop("samba", 1), 0);
 }
@@ -65,11 +73,7 @@ int Cmp(const std::string& a, const std::string& b) {
 }
 
 TEST(TextTest, ComparesUtf8WithUnicodeCaseFoldingInAStrictWeakOrderOfAnyBytes) {
-  const struct Case {
-    const char* a;
-    const char* b;
-    int sign;
-  } kCases[] = {
+  const std::tuple<const char*, const char*, int> kCases[] = {
       {"\xC3\x89t\xC3\xA9", "\xC3\xA9T\xC3\x89", 0},  // Été, éTÉ
       {"Stra\xC3\x9F\x65", "STRASSE", 0},             // Straße: full folding
       {"\xCE\xA3\xCE\xA3", "\xCF\x83\xCF\x82", 0},    // ΣΣ, σς
@@ -80,9 +84,9 @@ TEST(TextTest, ComparesUtf8WithUnicodeCaseFoldingInAStrictWeakOrderOfAnyBytes) {
   };
   // Hex escapes end where a letter follows: "\x62" is 'b'.
   std::set<std::string> texts = {"", "ab", "\x80", "a\x80\x62", "A\x80\x42", "\xE2\x82\xAC\xFF"};
-  for (const Case& c : kCases) {
-    EXPECT_EQ(Cmp(c.a, c.b), c.sign) << c.a << " vs " << c.b;
-    texts.insert({c.a, c.b});
+  for (const auto& [a, b, sign] : kCases) {
+    EXPECT_EQ(Cmp(a, b), sign) << a << " vs " << b;
+    texts.insert({a, b});
   }
   for (const std::string& a : texts) {  // antisymmetric and transitive over any bytes
     for (const std::string& b : texts) {
@@ -94,18 +98,6 @@ TEST(TextTest, ComparesUtf8WithUnicodeCaseFoldingInAStrictWeakOrderOfAnyBytes) {
       }
     }
   }
-}
-
-TEST(LastErrorTest, EachThreadHasItsOwn) {
-  WLIBCErrSetEx(0x2900, "here", 7);
-  std::thread([] {
-    EXPECT_EQ(WLIBCErrGet(), 0);
-    WLIBCErrSetEx(1, nullptr, 1);
-    EXPECT_STREQ(WLIBCErrorGetFile(), "");
-  }).join();
-  EXPECT_EQ(WLIBCErrGet(), 0x2900);
-  EXPECT_STREQ(WLIBCErrorGetFile(), "here");
-  EXPECT_EQ(WLIBCErrorGetLine(), 7);
 }
 
 }  // namespace

@@ -3,7 +3,6 @@
 #include <wezo/platform.h>
 
 #include <chrono>
-#include <cstdio>
 #include <filesystem>
 #include <string>
 #include <tuple>
@@ -46,31 +45,28 @@ TEST_F(ShareTest, ReadsSharesAndFindsTheDeepestHoldingAPath) {
     EXPECT_EQ(flag, readOnly) << name;
     WEZOShareFree(share);
   }
-  // The deepest share holding a path, and its recycle bin and snapshot folders.
-  const struct Where {
-    const char* full;
-    const char* share;  // "": no share holds it
-    int recycle, snapshot;
-  } kWhere[] = {{"/volume1/photo/2019/x", "photo2019", 0, 0},
-                {"/volume1/photo/20190", "photo", 0, 0},
-                {"/volume1/pho", "", 0, 0},
-                {"/volume1/photo/#recycle", "photo", 1, 0},
-                {"/volume1/photo/#recycle/a", "photo", 1, 0},
-                {"/volume1/photo/#snapshot/x", "photo", 0, 1},
-                {"/volume1/photo/#recycle-x", "photo", 0, 0},
-                {"/volume1/photo/a/#recycle", "photo", 0, 0},
-                {"/elsewhere/#snapshot", "", 0, 0}};
-  for (const Where& c : kWhere) {
-    SCOPED_TRACE(c.full);
+  // The deepest share holding a path ("": none), and its recycle bin and snapshot folders.
+  const std::tuple<const char*, const char*, int, int> kWhere[] = {
+      {"/volume1/photo/2019/x", "photo2019", 0, 0},
+      {"/volume1/photo/20190", "photo", 0, 0},
+      {"/volume1/pho", "", 0, 0},
+      {"/volume1/photo/#recycle", "photo", 1, 0},
+      {"/volume1/photo/#recycle/a", "photo", 1, 0},
+      {"/volume1/photo/#snapshot/x", "photo", 0, 1},
+      {"/volume1/photo/#recycle-x", "photo", 0, 0},
+      {"/volume1/photo/a/#recycle", "photo", 0, 0},
+      {"/elsewhere/#snapshot", "", 0, 0}};
+  for (const auto& [full, share, recycle, inSnapshot] : kWhere) {
+    SCOPED_TRACE(full);
     char name[WEZO_SHARE_NAME_MAX] = "";
     char path[WEZO_SHARE_PATH_MAX] = "";
-    EXPECT_EQ(WEZOShareNamePathGet(c.full, name, sizeof name, path, sizeof path) == 0,
-              *c.share != '\0');
-    EXPECT_STREQ(name, c.share);
-    EXPECT_EQ(WEZOShareIsShareRecycle(c.full), c.recycle);
+    EXPECT_EQ(WEZOShareNamePathGet(full, name, sizeof name, path, sizeof path) == 0,
+              *share != '\0');
+    EXPECT_STREQ(name, share);
+    EXPECT_EQ(WEZOShareIsShareRecycle(full), recycle);
     int snapshot = -1;
-    EXPECT_EQ(WLIBFhsPathInSnapshot(c.full, &snapshot), 0);
-    EXPECT_EQ(snapshot, c.snapshot);
+    EXPECT_EQ(WLIBFhsPathInSnapshot(full, &snapshot), 0);
+    EXPECT_EQ(snapshot, inSnapshot);
   }
   char name[4];
   char path[9];
@@ -96,8 +92,7 @@ TEST_F(ShareTest, FailuresAndUnencryptedFoldersAreTold) {
   Write("etc/samba/smb.conf", "[data]\npath = " + At("data") + "\n[gone]\npath = " + At("x"));
   for (const auto& [name, expected] : {std::pair{"data", 0}, {"gone", -1}}) {
     ASSERT_EQ(WEZOShareGet(name, &share), 0);
-    int encrypted = -1;
-    int encryption = -1;
+    int encrypted = -1, encryption = -1;
     EXPECT_EQ(WLIBShareIsEncryptedGet(share, &encrypted) < 0 ? -1 : encrypted, expected);
     EXPECT_EQ(WLIBShareIsEncryptionGet(share, &encryption) < 0 ? -1 : encryption, expected);
     WEZOShareFree(share);
@@ -107,52 +102,46 @@ TEST_F(ShareTest, FailuresAndUnencryptedFoldersAreTold) {
 // A configuration that has settled is parsed once and kept; a new file in its place, or one of
 // another size, is read again even when it carries the same modification time.
 TEST_F(ShareTest, AKeptConfigurationFollowsEveryChangeOfTheFile) {
-  const std::string conf = At("etc/samba/smb.conf");
   const auto settled = std::filesystem::file_time_type::clock::now() - std::chrono::hours(1);
-  const auto writeSettled = [&](const std::string& relative, const std::string& text) {
-    Write(relative, text);
-    std::filesystem::last_write_time(At(relative), settled);
-  };
-  const auto has = [](const char* name) {
-    PWEZOSHARE share = nullptr;
-    const bool found = WEZOShareGet(name, &share) == 0;
-    WEZOShareFree(share);
-    return found;
-  };
-  writeSettled("etc/samba/smb.conf", "[aaaa]\npath = /v/a\n");
-  ASSERT_TRUE(has("aaaa"));
-  writeSettled("etc/samba/next", "[bbbb]\npath = /v/b\n");  // same size, same time, new file
-  ASSERT_EQ(rename(At("etc/samba/next").c_str(), conf.c_str()), 0);
-  EXPECT_TRUE(has("bbbb"));
-  EXPECT_FALSE(has("aaaa"));
-  writeSettled("etc/samba/smb.conf", "[cc]\npath = /v/c\n");  // same file, rewritten in place
-  EXPECT_TRUE(has("cc"));
+  // Each share's file, written with the same time and moved over smb.conf: the second is a new
+  // file of the same size, the third the same file rewritten in place.
+  const char* before = "none";
+  for (const auto& [file, name] : {std::pair{"etc/samba/smb.conf", "aaaa"},
+                                   {"etc/samba/next", "bbbb"},
+                                   {"etc/samba/smb.conf", "cc"}}) {
+    Write(file, std::string("[") + name + "]\npath = /v/x\n");
+    std::filesystem::last_write_time(At(file), settled);
+    std::filesystem::rename(At(file), At("etc/samba/smb.conf"));
+    for (const auto& [asked, found] : {std::pair{name, true}, {before, false}}) {
+      PWEZOSHARE share = nullptr;
+      EXPECT_EQ(WEZOShareGet(asked, &share) == 0, found) << asked;
+      WEZOShareFree(share);
+    }
+    before = name;
+  }
 }
 
 using SpotlightTest = SandboxTest;
 
 TEST_F(SpotlightTest, RewritesOnlyTheGlobalSpotlightValue) {
-  const struct Case {
-    const char* before;
-    int enable;
-    const char* after;
-  } kCases[] = {{"# keep ; me\r\n[ Global ]\r\n  Spot Light=off  \r\n\tworkgroup = W\r\n", 1,
-                 "# keep ; me\r\n[ Global ]\r\n  Spot Light= yes\r\n\tworkgroup = W\r\n"},
-                {"[global]\nspotlight = \\\n  yes\n# tail", 0, "[global]\nspotlight = no\n# tail"},
-                {"[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = no\n", 1,
-                 "[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = yes\n"},
-                {"# c\n[global]\n\tworkgroup = W\n[s]\n\tspotlight = yes\n", 1,
-                 "# c\n[global]\n\tspotlight = yes\n\tworkgroup = W\n[s]\n\tspotlight = yes\n"},
-                {"[global]", 1, "[global]\n\tspotlight = yes\n"},
-                {"[s]\n\tpath = /x", 0, "[s]\n\tpath = /x\n[global]\n\tspotlight = no\n"}};
+  const std::tuple<const char*, int, const char*> kCases[] = {
+      {"# keep ; me\r\n[ Global ]\r\n  Spot Light=off  \r\n\tworkgroup = W\r\n", 1,
+       "# keep ; me\r\n[ Global ]\r\n  Spot Light= yes\r\n\tworkgroup = W\r\n"},
+      {"[global]\nspotlight = \\\n  yes\n# tail", 0, "[global]\nspotlight = no\n# tail"},
+      {"[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = no\n", 1,
+       "[global]\nspotlight = no\n[s]\npath = /x\n[global]\nspotlight = yes\n"},
+      {"# c\n[global]\n\tworkgroup = W\n[s]\n\tspotlight = yes\n", 1,
+       "# c\n[global]\n\tspotlight = yes\n\tworkgroup = W\n[s]\n\tspotlight = yes\n"},
+      {"[global]", 1, "[global]\n\tspotlight = yes\n"},
+      {"[s]\n\tpath = /x", 0, "[s]\n\tpath = /x\n[global]\n\tspotlight = no\n"}};
   const std::string conf = At("etc/samba/smb.conf");
   const bool haveTestparm = access("/usr/bin/testparm", X_OK) == 0;
-  for (const Case& c : kCases) {
-    SCOPED_TRACE(c.before);
-    Write("etc/samba/smb.conf", c.before, 0640);
-    EXPECT_EQ(WEZOSMBSetSpotlight(c.enable), 0);
-    EXPECT_EQ(Read("etc/samba/smb.conf"), c.after);
-    EXPECT_EQ(WEZOSMBIsEnableSpotlight(), c.enable);
+  for (const auto& [before, enable, after] : kCases) {
+    SCOPED_TRACE(before);
+    Write("etc/samba/smb.conf", before, 0640);
+    EXPECT_EQ(WEZOSMBSetSpotlight(enable), 0);
+    EXPECT_EQ(Read("etc/samba/smb.conf"), after);
+    EXPECT_EQ(WEZOSMBIsEnableSpotlight(), enable);
     struct stat st {};
     EXPECT_EQ(stat(conf.c_str(), &st) == 0 ? st.st_mode & 07777 : 0, 0640U);
     EXPECT_EQ(std::distance(std::filesystem::directory_iterator(At("etc/samba")), {}), 1)

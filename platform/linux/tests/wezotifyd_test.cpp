@@ -14,6 +14,7 @@
 #include <functional>
 #include <string>
 #include <thread>
+#include <tuple>
 #include <vector>
 
 #include "json_io.h"
@@ -59,13 +60,11 @@ class WezotifydTest : public SandboxTest {
   void Start(
       int shares, const std::function<void()>& plant = [] {}) {
     for (int n = 1; n <= shares; ++n) {
-      fs::create_directories(Folder(n));
-      fs::create_directories(Folder(n) + "/../@eaDir");
+      fs::create_directories(Folder(n)), fs::create_directories(Folder(n) + "/../@eaDir");
       Json::Value entry;
-      entry["queue"] = Queue(n);
-      entry["config"][0]["path"] = Folder(n);
-      entry["config"][0]["mask"] = 0xFFCE;
-      entry["config"][0]["ignore"].append("@eaDir");
+      ASSERT_TRUE(WEZO::FILEINDEX::JsonFromString(
+          entry, R"({"queue":")" + Queue(n) + R"(","config":[{"path":")" + Folder(n) +
+                     R"(","mask":65486,"ignore":["@eaDir"]}]})"));
       ASSERT_TRUE(MonitorQueue::Upsert(MonitorQueue(entry), "fileindex", QUEUE_TYPE_FILE));
     }
     plant();
@@ -94,11 +93,7 @@ TEST_F(WezotifydTest, WritesOneLinePerChangeAndNoneForARemovedRegistration) {
     const std::string head = R"({"event":)" + std::to_string(event) + R"(,"path":")" + f + path;
     return head + (old.empty() ? "\"}\n" : R"(","path_old":")" + f + old + "\"}\n");
   };
-  const struct {
-    const char* what;
-    std::function<void()> change;
-    std::string lines;
-  } cases[] = {
+  const std::tuple<const char*, std::function<void()>, std::string> cases[] = {
       {"create and write", [&] { Create(f + "/a"); },
        line(256, "/a") + line(2, "/a") + line(8, "/a")},
       {"rename within", [&] { fs::rename(f + "/a", f + "/b"); }, line(256, "/b", "/a")},
@@ -120,15 +115,15 @@ TEST_F(WezotifydTest, WritesOneLinePerChangeAndNoneForARemovedRegistration) {
   };
   size_t seen = 0;
   int mark = 0;
-  for (const auto& c : cases) {
-    SCOPED_TRACE(c.what);
-    c.change();
+  for (const auto& [what, change, lines] : cases) {
+    SCOPED_TRACE(what);
+    change();
     // A folder made after the change closes its lines: everything before it belongs to the case.
     const std::string marker = line(256, "/mark" + std::to_string(++mark));
     mkdir((f + "/mark" + std::to_string(mark)).c_str(), 0755);
     ASSERT_TRUE(WaitFor([&] { return QueueText(1).find(marker) != std::string::npos; }));
     const size_t end = QueueText(1).find(marker);
-    EXPECT_EQ(QueueText(1).substr(seen, end - seen), c.lines);
+    EXPECT_EQ(QueueText(1).substr(seen, end - seen), lines);
     seen = end + marker.size();
   }
   EXPECT_FALSE(fs::exists(Queue(2)));
@@ -146,9 +141,7 @@ TEST_F(WezotifydTest, FlagsTheShareForAReindexWhenTheKernelDropsEvents) {
   std::ifstream("/proc/sys/fs/inotify/max_queued_events") >> queued;
   std::ofstream files[] = {std::ofstream(Folder(1) + "/a"), std::ofstream(Folder(1) + "/b")};
   kill(pid_, SIGSTOP);
-  for (int i = 0; i <= queued; ++i) {
-    files[i % 2] << 'x' << std::flush;
-  }
+  for (int i = 0; i <= queued; ++i) files[i % 2] << 'x' << std::flush;
   kill(pid_, SIGCONT);
   Json::Value status;
   EXPECT_TRUE(WaitFor([&] {
