@@ -1286,6 +1286,21 @@ class FolderSet {
       m_maxSize = std::max(m_maxSize, m_paths[i].size());
     }
     m_sizes.resize(m_maxSize + 1, 0);
+    size_t slots = 8;
+    m_shift = 61;
+    while (slots < 2 * m_byPath.size()) {
+      slots *= 2;
+      --m_shift;
+    }
+    m_table.resize(slots);
+    for (const auto& entry : m_byPath) {
+      const uint64_t key = Key(entry.first.data(), entry.first.size());
+      size_t h = key >> m_shift;
+      while (m_table[h].folders != nullptr) {
+        h = (h + 1) & (slots - 1);
+      }
+      m_table[h] = Slot{key, &entry.first, &entry.second};
+    }
   }
 
   // Bytes of an event's path that the test needs.
@@ -1309,9 +1324,21 @@ class FolderSet {
         if (m_sizes[end] == 0 || (end != fullSize && path[end] != '/')) {
           continue;
         }
-        const auto it = m_byPath.find(path.substr(0, end));
-        if (it != m_byPath.end()) {
-          for (const size_t f : it->second) {
+        const uint64_t key = Key(path.data(), end);
+        for (size_t h = key >> m_shift; m_table[h].folders != nullptr;
+             h = (h + 1) & (m_table.size() - 1)) {
+          const Slot& slot = m_table[h];
+          if (slot.key != key) {
+            continue;
+          }
+          // A path already found needs no comparing.
+          const std::vector<size_t>& folders = *slot.folders;
+          if (std::all_of(folders.begin(), folders.end(),
+                          [&found](size_t f) { return found[f]; }) ||
+              slot.path->size() != end || std::memcmp(slot.path->data(), path.data(), end) != 0) {
+            continue;
+          }
+          for (const size_t f : folders) {
             if (!found[f]) {
               found[f] = true;
               marks.push_back(f);
@@ -1332,6 +1359,21 @@ class FolderSet {
   }
 
  private:
+  // A folder path in the table: its key, the path, the folders with that path.
+  struct Slot {
+    uint64_t key = 0;
+    const std::string_view* path = nullptr;
+    const std::vector<size_t>* folders = nullptr;
+  };
+
+  // The key of the first `size` bytes at `path`: their length and last eight bytes, mixed.
+  static uint64_t Key(const char* path, size_t size) {
+    uint64_t last = 0;
+    const size_t n = std::min<size_t>(size, sizeof last);
+    std::memcpy(&last, path + size - n, n);
+    return (last ^ (size * 0x9E3779B97F4A7C15ULL)) * 0xBF58476D1CE4E5B9ULL;
+  }
+
   static bool HoldsOdd(const std::string& folder, std::string_view path, size_t fullSize) {
     if (folder.size() > fullSize) {
       return false;
@@ -1353,6 +1395,8 @@ class FolderSet {
   std::unordered_map<std::string_view, std::vector<size_t>> m_byPath;
   std::vector<size_t> m_odd;
   std::vector<char> m_sizes;  // whether some folder's path is this long
+  std::vector<Slot> m_table;  // open addressing on Key; at most half full
+  unsigned int m_shift = 61;  // a key's top bits choose its slot
   std::string m_common;       // what all folders without a NUL begin with
   size_t m_minSize = 0;
   size_t m_maxSize = 0;
