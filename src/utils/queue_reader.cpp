@@ -93,7 +93,7 @@ inline const char* FindAny(const char* p, const char* end, char a, char b, char 
 }
 
 // The plain readers tell these codes by their digits.
-static_assert(kEventMoved == 256 && kEventReindex == 65536, "codes read as \"256\", \"65536\"");
+static_assert(kEventMoved == 256 && kEventReindex == 65536, "codes told by their digits");
 
 // How many decimal digits [p, end) begins with, up to 11: more make no code.
 inline size_t LeadingDigits(const char* p, const char* end) {
