@@ -139,7 +139,8 @@ std::string MixedQueue(const std::string& volume, std::mt19937& rng, int count) 
   // Mostly what the writers use, then what the parser accepts or refuses in odd ways.
   const std::vector<std::string> codes = Split(
       "2 2 8 8 256 256 131072 65536 2 8 256 1 4 65536.0 01 +1 -1 null true 1e2 -0 4294967296 "
-      "4294967295 \"65536\" [256] 256.9 2.5 6.5536e4 65535.99999999999999999 655.36E+2 6553.6e1",
+      "4294967295 \"65536\" [256] 256.9 2.5 6.5536e4 65535.99999999999999999 655.36E+2 6553.6e1 "
+      "0256 065536 00000065536 4294967295 9999999999",
       ' ');
   const std::vector<std::string> loose = Split(
       "not json||{}|[]|null|{\"\":1,}|\t|\xEF\xBB\xBF{}|{|\"x\"|\x01\x02|"
@@ -299,6 +300,28 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
   // Both answers come up often, or the comparison would prove little.
   EXPECT_GT(answers[0], 200);
   EXPECT_GT(answers[1], 200);
+}
+
+// Codes with leading zeros or at the limit of an unsigned int, in lines of the writers' shape.
+TEST_F(QueueReaderTest, PlainLinesWithOddCodesAnswerAsTheParser) {
+  const std::string f = volume + "/photo/a";
+  for (const std::string& line :
+       {Ev("0256", volume + "/x", R"(,"path_old":")" + f + "/y\""),
+        Ev("00256", f + "x", R"(,"path_old":")" + f + '"'),
+        Ev("0257", f + "x", R"(,"path_old":")" + f + '"'), Ev("065536", f), Ev("0065537", f),
+        Ev("00000065536", f), Ev("4294967295", f), Ev("4294967296", f), Ev("1065536", f),
+        R"({"data":null,"event":065536,"path":")" + f + "\"}"}) {
+    QueueEvent e;
+    const bool isEvent = ParseQueueLine(line.data(), line.size(), e);
+    Queue(Ev("2", volume + "/z") + "\n" + line + "\n");
+    std::vector<bool> found;
+    detail::QueueFoldersWithEvents({f}, queue, found, kPlain);
+    EXPECT_EQ(found[0], isEvent && (StringStartWith(e.path + "/", f + "/") ||
+                                    (e.event == 256 && StringStartWith(e.pathOld + "/", f + "/"))))
+        << line;
+    EXPECT_EQ(detail::IsReindexQueued(f, queue, kPlain), isEvent && e.event == 65536 && e.path == f)
+        << line;
+  }
 }
 
 // The process reads only what was appended to the same file; a queue that the daemon replaced or

@@ -7,6 +7,10 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#if defined(__SSE2__)
+#include <emmintrin.h>
+#endif
+
 #include <algorithm>
 #include <cerrno>
 #include <climits>
@@ -52,6 +56,87 @@ constexpr size_t kMaxRemembered = 4096;
 constexpr size_t kMaxFiles = 64;
 
 int LogWidth(size_t size) { return static_cast<int>(std::min<size_t>(size, INT_MAX)); }
+
+// The first of the bytes `a`, `b` and `c` in [p, end), or `end`. Lines are short: a library
+// search would spend more on setting up than on searching.
+inline const char* FindAny(const char* p, const char* end, char a, char b, char c) {
+#if defined(__SSE2__)
+  const __m128i va = _mm_set1_epi8(a);
+  const __m128i vb = _mm_set1_epi8(b);
+  const __m128i vc = _mm_set1_epi8(c);
+  const auto hits = [&va, &vb, &vc](const char* at) {
+    const __m128i v = _mm_loadu_si128(reinterpret_cast<const __m128i*>(at));
+    const __m128i hit = _mm_or_si128(_mm_or_si128(_mm_cmpeq_epi8(v, va), _mm_cmpeq_epi8(v, vb)),
+                                     _mm_cmpeq_epi8(v, vc));
+    return static_cast<unsigned int>(_mm_movemask_epi8(hit));
+  };
+  // 32 bytes a step: most lines end within a step or two.
+  while (end - p >= 32) {
+    const unsigned int mask = hits(p) | (hits(p + 16) << 16);
+    if (mask != 0) {
+      return p + __builtin_ctz(mask);
+    }
+    p += 32;
+  }
+  if (end - p >= 16) {
+    const unsigned int mask = hits(p);
+    if (mask != 0) {
+      return p + __builtin_ctz(mask);
+    }
+    p += 16;
+  }
+#endif
+  while (p != end && *p != a && *p != b && *p != c) {
+    ++p;
+  }
+  return p;
+}
+
+// The plain readers tell these codes by their digits.
+static_assert(kEventMoved == 256 && kEventReindex == 65536, "codes told by their digits");
+
+// How many decimal digits [p, end) begins with, up to 11: more make no code.
+inline size_t LeadingDigits(const char* p, const char* end) {
+#if defined(__SSE2__)
+  if (end - p >= 16) {
+    const __m128i v = _mm_loadu_si128(reinterpret_cast<const __m128i*>(p));
+    const __m128i digit = _mm_and_si128(_mm_cmpgt_epi8(v, _mm_set1_epi8('0' - 1)),
+                                        _mm_cmplt_epi8(v, _mm_set1_epi8('9' + 1)));
+    const auto other = ~static_cast<unsigned int>(_mm_movemask_epi8(digit)) | 0x800U;
+    return static_cast<size_t>(__builtin_ctz(other));
+  }
+#endif
+  size_t n = 0;
+  while (n < 11 && p + n != end && p[n] >= '0' && p[n] <= '9') {
+    ++n;
+  }
+  return n;
+}
+
+// Whether the `n` decimal digits at `p` (n <= 10) are the number `text`, a literal without a
+// leading zero: leading zeros are read past, as the readers' arithmetic does.
+template <size_t N>
+bool DigitsAre(const char* p, size_t n, const char (&text)[N]) {
+  constexpr size_t kSize = N - 1;
+  if (n < kSize || std::memcmp(p + n - kSize, text, kSize) != 0) {
+    return false;
+  }
+  for (size_t i = 0; i + kSize < n; ++i) {
+    if (p[i] != '0') {
+      return false;
+    }
+  }
+  return true;
+}
+
+// Whether the `n` decimal digits at `p` (n <= 10) fit an unsigned int.
+bool DigitsFit(const char* p, size_t n) { return n < 10 || std::memcmp(p, "4294967295", 10) <= 0; }
+
+// Whether [p, end) begins with the literal `text`.
+template <size_t N>
+bool Begins(const char* p, const char* end, const char (&text)[N]) {
+  return static_cast<size_t>(end - p) >= N - 1 && std::memcmp(p, text, N - 1) == 0;
+}
 
 uint64_t Hash(const char* data, size_t size, uint64_t h = 1469598103934665603ULL) {
   for (size_t i = 0; i < size; ++i) {
@@ -590,13 +675,7 @@ class BlockReader {
   // Reads the next line into `line`, capturing at most `limit` bytes of each path; false when
   // the file has nothing left. A read error ends the file where it happened.
   bool Next(ReadLine& line, size_t limit) {
-    if (m_skip > 0) {
-      while (m_fill < m_skip && !m_eof) {
-        Fill();
-      }
-      m_pos = std::min(m_skip, m_fill);
-      m_skip = 0;
-    }
+    Start();
     char* data = m_buffer.get();
     const char* newline = nullptr;
     size_t searched = m_pos;
@@ -633,6 +712,81 @@ class BlockReader {
     return true;
   }
 
+  // What Skim's callback makes of a line.
+  enum class Take {
+    kSkip,    // done with it, go on
+    kStop,    // done with it, and with reading
+    kRefuse,  // leave it to Next
+  };
+
+  // Hands the lines the buffer already holds, from where reading stands, to
+  // `take(begin, fill, newline)` for as long as it takes them: it sets `newline` to the "\n" that
+  // ends a line it takes. `end` gets the offset after the last line taken. The line refused, and
+  // a line the buffer does not hold whole, are left for Next. False when `take` asked to stop.
+  template <class F>
+  bool Skim(F&& take, off_t& end) {
+    Start();
+    const char* data = m_buffer.get();
+    const char* p = data + m_pos;
+    const char* const fill = data + m_fill;
+    bool stop = false;
+    while (p < fill) {
+      const char* newline = nullptr;
+      const Take verdict = take(p, fill, newline);
+      if (verdict == Take::kRefuse) {
+        break;
+      }
+      p = newline + 1;
+      if (verdict == Take::kStop) {
+        stop = true;
+        break;
+      }
+    }
+    if (p != data + m_pos) {
+      m_pos = static_cast<size_t>(p - data);
+      end = Offset(m_pos);
+    }
+    return !stop;
+  }
+
+  // A plain line (see Plain) at `p`, read straight from the buffer that holds bytes up to
+  // `fill`: returns the "\n" that ends it, or nullptr when the line is not plain or its end is
+  // not at hand.
+  static const char* PlainLine(const char* p, const char* fill, bool& moved, std::string_view& path,
+                               std::string_view& pathOld) {
+    if (Begins(p, fill, R"({"event":)")) {
+      p += sizeof R"({"event":)" - 1;
+    } else if (Begins(p, fill, R"({"data":null,"event":)")) {
+      p += sizeof R"({"data":null,"event":)" - 1;
+    } else {
+      return nullptr;
+    }
+    const size_t n = LeadingDigits(p, fill);
+    if (n == 0 || n > 10 || !DigitsFit(p, n) || !Begins(p + n, fill, R"(,"path":")")) {
+      return nullptr;
+    }
+    moved = DigitsAre(p, n, "256");
+    p += n + sizeof R"(,"path":")" - 1;
+    const char* quote = FindAny(p, fill, '"', '\\', '\n');
+    if (quote == fill || *quote != '"') {
+      return nullptr;
+    }
+    path = std::string_view(p, static_cast<size_t>(quote - p));
+    pathOld = std::string_view();
+    if (Begins(quote, fill, R"(","path_old":")")) {
+      p = quote + sizeof R"(","path_old":")" - 1;
+      quote = FindAny(p, fill, '"', '\\', '\n');
+      if (quote == fill || *quote != '"') {
+        return nullptr;
+      }
+      pathOld = std::string_view(p, static_cast<size_t>(quote - p));
+    }
+    if (fill - quote < 3 || quote[1] != '}' || quote[2] != '\n') {
+      return nullptr;
+    }
+    return quote + 2;
+  }
+
   // The offset just after the last complete line handed out, and the hash of the `kWindow` bytes
   // (or fewer, from the start of the file) before it, when the buffer still holds them.
   bool TailWindow(off_t end, uint64_t& hash, size_t& size) const {
@@ -663,6 +817,17 @@ class BlockReader {
   };
 
   off_t Offset(size_t at) const { return m_base + static_cast<off_t>(at); }
+
+  // Before the first line: the bytes read only for the window are passed over.
+  void Start() {
+    if (m_skip > 0) {
+      while (m_fill < m_skip && !m_eof) {
+        Fill();
+      }
+      m_pos = std::min(m_skip, m_fill);
+      m_skip = 0;
+    }
+  }
 
   // Moves the bytes from `kWindow` before `from` to the front; returns how far they moved.
   size_t Compact(size_t from) {
@@ -727,6 +892,7 @@ class BlockReader {
     }
   }
 
+ public:
   // The shapes the writers produce most, {"event":N,"path":"P"}, {"event":N,"path":"P",
   // "path_old":"O"} and {"data":null,"event":N,"path":"P"}, with plain decimals and strings
   // without a backslash, are taken straight from the buffer; the parser reads them exactly so.
@@ -827,27 +993,19 @@ class BlockReader {
   // Whether a line surely is no reindex event because it begins as a plain line with another
   // code: valid or not, it cannot be one.
   static bool OtherCode(const char* p, const char* end) {
-    static constexpr char kEvent[] = R"({"event":)";
-    static constexpr char kNullData[] = R"({"data":null,"event":)";
-    const auto take = [&p, end](const char* text, size_t size) {
-      if (static_cast<size_t>(end - p) < size || std::memcmp(p, text, size) != 0) {
-        return false;
-      }
-      p += size;
-      return true;
-    };
-    if (!take(kEvent, sizeof kEvent - 1) && !take(kNullData, sizeof kNullData - 1)) {
+    if (Begins(p, end, R"({"event":)")) {
+      p += sizeof R"({"event":)" - 1;
+    } else if (Begins(p, end, R"({"data":null,"event":)")) {
+      p += sizeof R"({"data":null,"event":)" - 1;
+    } else {
       return false;
     }
-    uint64_t code = 0;
-    const char* digits = p;
-    while (p != end && *p >= '0' && *p <= '9' && p - digits < 11) {
-      code = code * 10 + static_cast<uint64_t>(*p++ - '0');
-    }
-    return p != digits && p - digits <= 10 && p != end && (*p == ',' || *p == '}') &&
-           code != static_cast<uint64_t>(kEventReindex);
+    const size_t n = LeadingDigits(p, end);
+    return n != 0 && n <= 10 && p + n != end && (p[n] == ',' || p[n] == '}') &&
+           !DigitsAre(p, n, "65536");
   }
 
+ private:
   void Classify(ReadLine& line, const char* begin, const char* end, size_t limit) const {
     if (m_onlyReindex && OtherCode(begin, end)) {
       line.isEvent = false;
@@ -1120,14 +1278,29 @@ class FolderSet {
       m_minSize = std::min(m_minSize, path.size());
       m_maxSize = std::max(m_maxSize, path.size());
       if (m_sizes.size() <= path.size()) {
-        m_sizes.resize(path.size() + 1, false);
+        m_sizes.resize(path.size() + 1, 0);
       }
-      m_sizes[path.size()] = true;
+      m_sizes[path.size()] = 1;
     }
     for (const size_t i : m_odd) {
       m_maxSize = std::max(m_maxSize, m_paths[i].size());
     }
-    m_sizes.resize(m_maxSize + 1, false);
+    m_sizes.resize(m_maxSize + 1, 0);
+    size_t slots = 8;
+    m_shift = 61;
+    while (slots < 2 * m_byPath.size()) {
+      slots *= 2;
+      --m_shift;
+    }
+    m_table.resize(slots);
+    for (const auto& entry : m_byPath) {
+      const uint64_t key = Key(entry.first.data(), entry.first.size());
+      size_t h = key >> m_shift;
+      while (m_table[h].folders != nullptr) {
+        h = (h + 1) & (slots - 1);
+      }
+      m_table[h] = Slot{key, &entry.first, &entry.second};
+    }
   }
 
   // Bytes of an event's path that the test needs.
@@ -1142,17 +1315,30 @@ class FolderSet {
     const size_t upto = std::min(fullSize, m_maxSize);
     // Every folder begins with the folders' common start; then only the ends of the path's
     // components can be folders.
+    // Siblings differ near the end of the common start, so its last byte is looked at first.
+    const size_t common = m_common.size();
     if (!m_byPath.empty() && fullSize >= m_minSize &&
-        path.compare(0, m_common.size(), m_common) == 0) {
-      for (size_t i = m_minSize; i <= upto;) {
-        const size_t slash = i < path.size() ? path.find('/', i) : std::string_view::npos;
-        const size_t end = slash != std::string_view::npos ? slash : fullSize;
-        if (end > upto) {
-          break;
+        (common == 0 || path[common - 1] == m_common[common - 1]) &&
+        std::memcmp(path.data(), m_common.data(), common) == 0) {
+      for (size_t end = m_minSize; end <= upto; ++end) {
+        if (m_sizes[end] == 0 || (end != fullSize && path[end] != '/')) {
+          continue;
         }
-        const auto it = m_sizes[end] ? m_byPath.find(path.substr(0, end)) : m_byPath.end();
-        if (it != m_byPath.end()) {
-          for (const size_t f : it->second) {
+        const uint64_t key = Key(path.data(), end);
+        for (size_t h = key >> m_shift; m_table[h].folders != nullptr;
+             h = (h + 1) & (m_table.size() - 1)) {
+          const Slot& slot = m_table[h];
+          if (slot.key != key) {
+            continue;
+          }
+          // A path already found needs no comparing.
+          const std::vector<size_t>& folders = *slot.folders;
+          if (std::all_of(folders.begin(), folders.end(),
+                          [&found](size_t f) { return found[f]; }) ||
+              slot.path->size() != end || std::memcmp(slot.path->data(), path.data(), end) != 0) {
+            continue;
+          }
+          for (const size_t f : folders) {
             if (!found[f]) {
               found[f] = true;
               marks.push_back(f);
@@ -1160,7 +1346,6 @@ class FolderSet {
             }
           }
         }
-        i = end + 1;
       }
     }
     for (const size_t f : m_odd) {
@@ -1174,6 +1359,21 @@ class FolderSet {
   }
 
  private:
+  // A folder path in the table: its key, the path, the folders with that path.
+  struct Slot {
+    uint64_t key = 0;
+    const std::string_view* path = nullptr;
+    const std::vector<size_t>* folders = nullptr;
+  };
+
+  // The key of the first `size` bytes at `path`: their length and last eight bytes, mixed.
+  static uint64_t Key(const char* path, size_t size) {
+    uint64_t last = 0;
+    const size_t n = std::min<size_t>(size, sizeof last);
+    std::memcpy(&last, path + size - n, n);
+    return (last ^ (size * 0x9E3779B97F4A7C15ULL)) * 0xBF58476D1CE4E5B9ULL;
+  }
+
   static bool HoldsOdd(const std::string& folder, std::string_view path, size_t fullSize) {
     if (folder.size() > fullSize) {
       return false;
@@ -1194,8 +1394,10 @@ class FolderSet {
   const std::vector<std::string>& m_paths;
   std::unordered_map<std::string_view, std::vector<size_t>> m_byPath;
   std::vector<size_t> m_odd;
-  std::vector<bool> m_sizes;
-  std::string m_common;  // what all folders without a NUL begin with
+  std::vector<char> m_sizes;  // whether some folder's path is this long
+  std::vector<Slot> m_table;  // open addressing on Key; at most half full
+  unsigned int m_shift = 61;  // a key's top bits choose its slot
+  std::string m_common;       // what all folders without a NUL begin with
   size_t m_minSize = 0;
   size_t m_maxSize = 0;
 };
@@ -1255,7 +1457,24 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
     const FolderSet set(wanted);
     reader = std::make_unique<BlockReader>(fd, from, options.blockSize);
     ReadLine line;
-    while (left > 0 && reader->Next(line, set.Limit())) {
+    // Plain lines are tested straight from the buffer.
+    bool moved = false;
+    std::string_view path;
+    std::string_view pathOld;
+    const auto test = [&](const char* begin, const char* fill, const char*& newline) {
+      newline = BlockReader::PlainLine(begin, fill, moved, path, pathOld);
+      if (newline == nullptr) {
+        return BlockReader::Take::kRefuse;
+      }
+      marks.clear();
+      left -= set.Mark(path, path.size(), asked, wantedFound, marks);
+      if (moved) {
+        left -= set.Mark(pathOld, pathOld.size(), asked, wantedFound, marks);
+      }
+      lastEnded = true;
+      return left > 0 ? BlockReader::Take::kSkip : BlockReader::Take::kStop;
+    };
+    while (left > 0 && reader->Skim(test, end) && reader->Next(line, set.Limit())) {
       marks.clear();
       if (!line.isEvent) {
         if (line.stop > quietUpTo) {
@@ -1385,7 +1604,19 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile,
   ReadLine line;
   bool queued = false;
   off_t end = have ? entry.file.offset : 0;
-  while (!queued && reader.Next(line, limit)) {
+  // Plain lines with another code are passed over in bulk.
+  const auto other = [](const char* begin, const char* fill, const char*& newline) {
+    if (!BlockReader::OtherCode(begin, fill)) {
+      return BlockReader::Take::kRefuse;
+    }
+    newline = FindAny(begin, fill, '\n', '\n', '\n');
+    return newline != fill ? BlockReader::Take::kSkip : BlockReader::Take::kRefuse;
+  };
+  while (!queued) {
+    reader.Skim(other, end);
+    if (!reader.Next(line, limit)) {
+      break;
+    }
     if (!line.isEvent || line.event.event != static_cast<unsigned int>(kEventReindex)) {
       if (line.ended) {
         end = line.stop;
