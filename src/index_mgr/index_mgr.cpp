@@ -247,6 +247,9 @@ bool RegisterShare(const std::string& share, const std::string& queue, const Fol
   return true;
 }
 
+const std::string& PathOf(const Folder& folder) { return folder.GetPath(); }
+const std::string& PathOf(const std::string& path) { return path; }
+
 // Adds the share of the share path `path` to `shares`.
 bool AddShareOf(const std::string& path, std::set<std::string>& shares) {
   std::string share;
@@ -286,12 +289,15 @@ bool UpsertFolders(const Json::Value& request) {
       }
     }
 
-    std::vector<Folder> before;
+    std::vector<Folder> before;  // in byte order of the paths
     list.List(before);
-    std::set<std::string> stored;
-    for (const Folder& folder : before) {
-      stored.insert(folder.GetPath());
-    }
+    std::set<std::string> added;
+    const auto isNew = [&before, &added](const std::string& path) {
+      const bool stored =
+          std::binary_search(before.begin(), before.end(), path,
+                             [](const auto& a, const auto& b) { return PathOf(a) < PathOf(b); });
+      return !stored && added.insert(path).second;
+    };
     std::vector<std::string> paths;
     std::set<std::string> shares;
     std::set<std::string> grown;  // the shares that gained a folder
@@ -306,7 +312,7 @@ bool UpsertFolders(const Json::Value& request) {
       if (!AddShareOf(path, shares)) {
         return false;
       }
-      if (stored.insert(path).second) {
+      if (isNew(path)) {
         AddShareOf(path, grown);
       }
       paths.push_back(path);
