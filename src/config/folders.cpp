@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "config/folder_additional.h"
+#include "config/folder_page.h"
 #include "fileindex/eligibility.h"
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
@@ -204,9 +205,25 @@ std::string Folders::GetLockPath() const { return FolderLockPath(); }
 
 std::string Folders::GetPath() const { return FolderConfPath(); }
 
-bool Folders::Load() {
+std::vector<Folder> FolderRecordsOf(const Json::Value& document) {
   // Every folder of a share lies on the same volume: the share is looked up once per load.
   const ShareLookupMemo memo;
+  std::vector<Folder> records;
+  records.reserve(document.size());
+  for (auto it = document.begin(); it != document.end(); ++it) {
+    // A folder whose share is gone is kept: it reports itself as not valid, and the user removes
+    // it. That is no failure of the load, so the code its full path left is not kept either.
+    // The stored "path" is ignored; the member's name is the folder's path.
+    records.emplace_back();
+    const _tag_fileindex_err_ code = ErrorHandler::GetError();
+    if (!records.back().Load(it.name(), *it)) {
+      ErrorHandler::SetError(code);
+    }
+  }
+  return records;
+}
+
+bool Folders::Load() {
   if (!LoadJson()) {
     return false;
   }
@@ -215,17 +232,9 @@ bool Folders::Load() {
     ErrorHandler::SetError(FILEINDEX_ERR_MALFORMED_FOLDERS);
     return false;
   }
-  for (auto it = m_jsRoot.begin(); it != m_jsRoot.end(); ++it) {
-    // A folder whose share is gone is kept: it reports itself as not valid, and the user removes
-    // it. That is no failure of the load, so the code its full path left is not kept either.
-    // The stored "path" is ignored; the member's name is the folder's path.
-    Folder folder;
-    const std::string path = it.name();
-    const _tag_fileindex_err_ code = ErrorHandler::GetError();
-    if (!folder.Load(path, *it)) {
-      ErrorHandler::SetError(code);
-    }
-    m_folders.emplace(path, std::move(folder));
+  for (Folder& folder : FolderRecordsOf(m_jsRoot)) {
+    std::string path = folder.GetPath();
+    m_folders.emplace(std::move(path), std::move(folder));
   }
   return true;
 }
@@ -285,6 +294,13 @@ bool Folders::List(Json::Value& out, unsigned long offset, unsigned long limit,
                    const Json::Value& additional) const {
   std::vector<Folder> folders;
   List(folders);
+  FolderPage(folders, out, offset, limit, sort_by, sort_direction, additional);
+  return true;
+}
+
+void FolderPage(const std::vector<Folder>& folders, Json::Value& out, unsigned long offset,
+                unsigned long limit, const std::string& sort_by, const std::string& sort_direction,
+                const Json::Value& additional) {
   const size_t total = folders.size();
 
   out = Json::Value(Json::objectValue);
@@ -341,7 +357,6 @@ bool Folders::List(Json::Value& out, unsigned long offset, unsigned long limit,
     page.append(FolderJsonWith(*onPage[i], additional, known));
   }
   out["folder"] = std::move(page);
-  return true;
 }
 
 bool Folders::Get(Json::Value& out, const std::string& path) const {

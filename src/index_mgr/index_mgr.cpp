@@ -14,6 +14,7 @@
 #include <string>
 #include <vector>
 
+#include "config/folder_page.h"
 #include "config/snapshot.h"
 #include "config/transaction.h"
 #include "fileindex/daemon.h"
@@ -456,19 +457,35 @@ bool ReindexPaths(const Json::Value& request) {
   return true;
 }
 
-}  // namespace
-
-bool IndexMgr::List(std::vector<Folder>& folders) {
+// The folder records as a load of the list gives them, built from the kept snapshot's document
+// when it has one. False, logged with a code set, when folder.conf cannot be loaded.
+bool CurrentRecords(std::vector<Folder>& folders) {
+  const std::shared_ptr<const FolderSnapshot> snapshot = FolderListSnapshot();
+  if (snapshot == nullptr) {
+    return false;
+  }
+  if (const Json::Value* document = snapshot->Document()) {
+    folders = FolderRecordsOf(*document);
+    return true;
+  }
   Folders list;
   return list.Load() && list.List(folders);
 }
+
+}  // namespace
+
+bool IndexMgr::List(std::vector<Folder>& folders) { return CurrentRecords(folders); }
 
 bool IndexMgr::List(Json::Value& result, unsigned long offset, unsigned long limit,
                     const std::string& sortBy, const std::string& sortDirection,
                     const Json::Value& additional) {
   return RefuseOnJsonError(additional, [&] {
-    Folders list;
-    return list.Load() && list.List(result, offset, limit, sortBy, sortDirection, additional);
+    std::vector<Folder> folders;
+    if (!CurrentRecords(folders)) {
+      return false;
+    }
+    FolderPage(folders, result, offset, limit, sortBy, sortDirection, additional);
+    return true;
   });
 }
 
