@@ -20,7 +20,7 @@ std::vector<Folder> FolderRecordsOf(const Json::Value& document);
 
 // One page of `folders` (in byte order of the paths), as Folders::List gives it.
 void FolderPage(const std::vector<Folder>& folders, Json::Value& out, unsigned long offset,
-                unsigned long limit, const std::string& sortBy, const std::string& sortDirection,
+                unsigned long limit, const std::string& sort_by, const std::string& sort_direction,
                 const Json::Value& additional);
 
 }  // namespace FILEINDEX

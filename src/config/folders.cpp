@@ -95,8 +95,8 @@ bool HoldsJsonOf(const Json::Value& stored, const Folder& folder) {
 // both texts through Unicode case folding every time, and a sort makes some ten calls per folder).
 class FolderOrder {
  public:
-  FolderOrder(const std::vector<Folder>& folders, const std::string& sortBy)
-      : m_folders(folders), m_sortBy(sortBy) {
+  FolderOrder(const std::vector<Folder>& folders, std::string sortBy)
+      : m_folders(folders), m_sortBy(std::move(sortBy)) {
     if (m_sortBy != "name") {
       m_sortBy = IsKind(m_sortBy) ? m_sortBy : "path";
     }
