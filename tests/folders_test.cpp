@@ -1,8 +1,11 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <json/writer.h>
 
+#include <strings.h>
 #include <algorithm>
 #include <filesystem>
+#include <iterator>
 
 #include "fake_platform.h"
 #include "fileindex/error.h"
@@ -72,7 +75,7 @@ TEST_F(FoldersTest, AdditionalValuesKeepGoingPastAnUnknownNameButNotPastANonStri
 // Members of the wrong type are dropped; a folder whose share is gone is kept as it is.
 TEST_F(FoldersTest, FileRoundTripWritesKeyOrderAndIgnoresTheStoredPath) {
   Folders folders;
-  LoadText(folders, R"({"/video/b":{"path":"/elsewhere","name":"B","video":true},
+  LoadText(folders, R"({"/video/b":{"path":"/elsewhere","name":"B","video":true,"x":1},
                         "/gone/a":{"name":"A"}, "/photo":7,
                         "/photo/2019":{"name":"2019","photo":true,"audio":"true","video":1}})");
   std::vector<Folder> all;
@@ -94,11 +97,27 @@ TEST_F(FoldersTest, FileRoundTripWritesKeyOrderAndIgnoresTheStoredPath) {
     EXPECT_LT(at, text.find(key)) << key;
     at = text.find(key);
   }
-  const Json::Value saved = ParseJson(text);
-  EXPECT_EQ(saved["/video/b"]["path"], "/video/b");
-  EXPECT_EQ(saved["/gone/a"], ParseJson(R"({"path":"/gone/a","name":"A","document":false,
-                                        "audio":false,"video":false,"photo":false})"));
+  EXPECT_EQ(ParseJson(text)["/gone/a"], ParseJson(R"({"path":"/gone/a","name":"A","document":false,
+                                                 "audio":false,"video":false,"photo":false})"));
   EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);
+  // Byte for byte the render of the records alone, after the load and after a change, an
+  // addition and a removal: stray members, stored paths and wrong types never survive a save.
+  const auto rendered = [&folders] {
+    std::vector<Folder> records;
+    folders.List(records);
+    Json::Value document(Json::objectValue);
+    for (const Folder& record : records) record.AddToJson(document);
+    Json::StreamWriterBuilder builder;
+    builder["emitUTF8"] = true;
+    return Json::writeString(builder, document) + "\n";
+  };
+  EXPECT_EQ(text, rendered());
+  Json::Value report;
+  ASSERT_TRUE(folders.Upsert(report, ParseJson(R"({"path":"/photo/2019","name":"2019"})")));
+  ASSERT_TRUE(folders.Upsert(report, ParseJson(R"({"path":"/video/c","video":true})")));
+  ASSERT_TRUE(folders.Delete(report, "/photo"));
+  ASSERT_TRUE(folders.Save());
+  EXPECT_EQ(testsupport::ReadFile(FolderConfPath()), rendered());
 }
 
 TEST_F(FoldersTest, OnlyAnObjectIsAFolderList) {
@@ -174,6 +193,30 @@ TEST_F(FoldersTest, PagedListingNeedsNoConsistentOrderFromThePlatform) {
     if (compare != nullptr) std::sort(paths.begin(), paths.end());
     EXPECT_EQ(paths, byteOrder);
   }
+}
+
+// ASCII texts, whose order the listing works out itself, sort as the platform compares them,
+// among texts that it must ask the platform about (non-ASCII, a NUL that ends the C string).
+TEST_F(FoldersTest, PagedListingSortsNamesAsThePlatformComparesThem) {
+  const std::string names[] = {
+      "_b", "B", "a", "[",  "\xC3\xA4", "A\xC3\xA4", "a", std::string("a\0z", 3),
+      "Zz", "{", "`", "AB", "ab"};
+  Json::Value list(Json::objectValue);
+  std::vector<std::pair<std::string, std::string>> expected;  // path and name, in byte order
+  for (size_t i = 0; i < std::size(names); ++i) {
+    expected.emplace_back("/photo/" + std::to_string(10 + i), names[i]);
+    list[expected.back().first]["name"] = names[i];
+  }
+  std::stable_sort(expected.begin(), expected.end(), [](const auto& a, const auto& b) {
+    return strcasecmp(a.second.c_str(), b.second.c_str()) < 0;
+  });
+  Folders folders;
+  LoadText(folders, JsonToString(list));
+  Json::Value page;
+  ASSERT_TRUE(folders.List(page, 0, 100, "name", "ASC", Json::Value(Json::arrayValue)));
+  std::vector<std::string> paths;
+  for (const auto& folder : expected) paths.push_back(folder.first);
+  EXPECT_EQ(PathsOf(page), paths);
 }
 
 // A changed folder takes only what the request carries; the rest goes back to empty.

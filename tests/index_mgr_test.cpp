@@ -170,11 +170,17 @@ TEST_F(QueryTest, KeptSnapshotsAnswerAsAFreshLoadAfterEveryChange) {
                 listed && IndexMgr::IsPathContainIndexed("/photo", folders));
       EXPECT_EQ(IndexMgr::IsFullPathIndexed(volume + "/photo/b"),
                 listed && IndexMgr::IsFullPathIndexed(volume + "/photo/b", folders));
+      Json::Value page;
+      Json::Value freshPage;
+      const Json::Value none(Json::arrayValue);
+      EXPECT_EQ(IndexMgr::List(page, 0, 9, "", "ASC", none), listed);
+      if (listed) fresh.List(freshPage, 0, 9, "", "ASC", none);
+      EXPECT_EQ(page, listed ? freshPage : Json::Value());
       EXPECT_EQ(StatusMgr::ShareIsNoSpace("photo"), noSpace);
       EXPECT_EQ(ErrorHandler::GetError(), code);
       std::vector<std::string> expected;
       if (!c.log.empty()) {
-        expected.assign(5, c.log[0]);  // one read of the list per folder question
+        expected.assign(6, c.log[0]);  // one read of the list per folder question
         expected.push_back(c.log[1]);
       }
       EXPECT_EQ(log.Lines(), expected);

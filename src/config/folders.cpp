@@ -6,10 +6,13 @@
 
 #include <algorithm>
 #include <cstddef>
+#include <optional>
+#include <string>
 #include <utility>
 #include <vector>
 
 #include "config/folder_additional.h"
+#include "config/folder_page.h"
 #include "fileindex/eligibility.h"
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
@@ -37,44 +40,139 @@ Json::Value ChangeReport(const Json::Value& before, const Json::Value& after) {
   return report;
 }
 
-using FolderOrder = bool (*)(const Folder&, const Folder&);
-
-FolderOrder OrderBy(const std::string& sortBy) {
-  if (sortBy == "name") {
-    return [](const Folder& a, const Folder& b) {
-      return WLIBCUnicodeUTF8StrCaseCmp(a.GetName().c_str(), b.GetName().c_str()) < 0;
-    };
-  }
-  if (sortBy == "document") {
-    return [](const Folder& a, const Folder& b) { return !a.GetDocument() && b.GetDocument(); };
-  }
-  if (sortBy == "audio") {
-    return [](const Folder& a, const Folder& b) { return !a.GetAudio() && b.GetAudio(); };
-  }
-  if (sortBy == "video") {
-    return [](const Folder& a, const Folder& b) { return !a.GetVideo() && b.GetVideo(); };
-  }
-  if (sortBy == "photo") {
-    return [](const Folder& a, const Folder& b) { return !a.GetPhoto() && b.GetPhoto(); };
-  }
-  return [](const Folder& a, const Folder& b) {
-    return WLIBCUnicodeUTF8StrCaseCmp(a.GetPath().c_str(), b.GetPath().c_str()) < 0;
-  };
+// Whether a folder placed at `folderFull` holds `fullPath`: the same place or an ancestor.
+bool Encloses(const std::string& folderFull, const std::string& fullPath) {
+  return fullPath.size() >= folderFull.size() &&
+         fullPath.compare(0, folderFull.size(), folderFull) == 0 &&
+         (fullPath.size() == folderFull.size() || fullPath[folderFull.size()] == '/');
 }
+
+const Folder& RecordOf(const Folder& folder) { return folder; }
+const Folder& RecordOf(const std::pair<const std::string, Folder>& entry) { return entry.second; }
+
+// The JSON form of the folder whose setting applies at `fullPath` among `folders` (records or
+// path -> record entries, in share-path order); an empty object when none applies.
+template <typename Records>
+Json::Value SettingAt(const Records& folders, const std::string& fullPath) {
+  const Folder* match = nullptr;
+  for (const auto& element : folders) {
+    const Folder& folder = RecordOf(element);
+    // A folder whose share is gone holds no place; asking it for one would log and set a code.
+    // The last match wins: in share-path order that is the deepest folder enclosing the target.
+    if (folder.HasFullPath() && Encloses(folder.GetFullPath(), fullPath)) {
+      match = &folder;
+    }
+  }
+  return match != nullptr ? match->asJson() : Json::Value(Json::objectValue);
+}
+
+// Whether `stored`, a member of the document loaded, is exactly the JSON form of `folder`.
+bool HoldsJsonOf(const Json::Value& stored, const Folder& folder) {
+  constexpr size_t kMembers = 6;  // path, name and the four kinds
+  if (!stored.isObject() || stored.size() != kMembers) {
+    return false;
+  }
+  const auto text = [&stored](const char* key, const std::string& want) {
+    const Json::Value* value = stored.find(key, key + std::char_traits<char>::length(key));
+    const char* begin = nullptr;
+    const char* end = nullptr;
+    return value != nullptr && value->isString() && value->getString(&begin, &end) &&
+           want.compare(0, std::string::npos, begin, static_cast<size_t>(end - begin)) == 0;
+  };
+  const auto flag = [&stored](const char* key, bool want) {
+    const Json::Value* value = stored.find(key, key + std::char_traits<char>::length(key));
+    return value != nullptr && value->isBool() && value->asBool() == want;
+  };
+  return text("path", folder.GetPath()) && text("name", folder.GetName()) &&
+         flag("document", folder.GetDocument()) && flag("audio", folder.GetAudio()) &&
+         flag("video", folder.GetVideo()) && flag("photo", folder.GetPhoto());
+}
+
+// The order of `sortBy` over `folders`, by index: true when folder `a` sorts before folder `b`.
+// Names and paths compare without regard to case through the platform, except that two texts of
+// ASCII alone (no NUL) compare by their bytes with A-Z lowered, each folded once: that is
+// what the platform's comparison answers for them, at a fraction of a call's cost (a call folds
+// both texts through Unicode case folding every time, and a sort makes some ten calls per folder).
+class FolderOrder {
+ public:
+  FolderOrder(const std::vector<Folder>& folders, std::string sortBy)
+      : m_folders(folders), m_sortBy(std::move(sortBy)) {
+    if (m_sortBy != "name") {
+      m_sortBy = IsKind(m_sortBy) ? m_sortBy : "path";
+    }
+    if (m_sortBy == "name" || m_sortBy == "path") {
+      m_folded.reserve(folders.size());
+      for (const Folder& folder : folders) {
+        m_folded.emplace_back(Folded(TextOf(folder)));
+      }
+    }
+  }
+
+  bool operator()(size_t a, size_t b) const {
+    if (!m_folded.empty()) {
+      if (m_folded[a].has_value() && m_folded[b].has_value()) {
+        return *m_folded[a] < *m_folded[b];
+      }
+      return WLIBCUnicodeUTF8StrCaseCmp(TextOf(m_folders[a]).c_str(),
+                                        TextOf(m_folders[b]).c_str()) < 0;
+    }
+    // Folders lacking the kind before those having it.
+    return !KindOf(m_folders[a]) && KindOf(m_folders[b]);
+  }
+
+ private:
+  static bool IsKind(const std::string& name) {
+    return name == "document" || name == "audio" || name == "video" || name == "photo";
+  }
+
+  const std::string& TextOf(const Folder& folder) const {
+    return m_sortBy == "name" ? folder.GetName() : folder.GetPath();
+  }
+
+  bool KindOf(const Folder& folder) const {
+    if (m_sortBy == "document") {
+      return folder.GetDocument();
+    }
+    if (m_sortBy == "audio") {
+      return folder.GetAudio();
+    }
+    return m_sortBy == "video" ? folder.GetVideo() : folder.GetPhoto();
+  }
+
+  // `text` with A-Z lowered, or nothing when it holds a byte outside 0x01-0x7F.
+  static std::optional<std::string> Folded(const std::string& text) {
+    std::string folded = text;
+    constexpr unsigned char kNonAscii = 0x80;
+    for (char& c : folded) {
+      const auto byte = static_cast<unsigned char>(c);
+      if (byte == 0 || byte >= kNonAscii) {
+        return std::nullopt;
+      }
+      if (c >= 'A' && c <= 'Z') {
+        c = static_cast<char>(c - 'A' + 'a');
+      }
+    }
+    return folded;
+  }
+
+  const std::vector<Folder>& m_folders;
+  std::string m_sortBy;
+  std::vector<std::optional<std::string>> m_folded;
+};
 
 // `folders` in the order of `before`, by a bottom-up merge sort. Folders that compare equal keep
 // their order in `folders` (the list's byte order of paths), so a page never depends on the
 // sort's whims. It also stays within the vector and ends whatever `before` answers: the
 // platform's text comparison need not be a strict weak ordering for every byte string, and
 // std::sort given one that is not may read past the vector's end.
-std::vector<const Folder*> SortedFolders(const std::vector<Folder>& folders, FolderOrder before) {
-  std::vector<const Folder*> order;
-  order.reserve(folders.size());
-  for (const Folder& folder : folders) {
-    order.push_back(&folder);
+std::vector<const Folder*> SortedFolders(const std::vector<Folder>& folders,
+                                         const FolderOrder& before) {
+  const size_t size = folders.size();
+  std::vector<size_t> order(size);
+  for (size_t i = 0; i < size; ++i) {
+    order[i] = i;
   }
-  const size_t size = order.size();
-  std::vector<const Folder*> merged;
+  std::vector<size_t> merged;
   merged.reserve(size);
   for (size_t width = 1; width < size; width *= 2) {
     merged.clear();
@@ -84,7 +182,7 @@ std::vector<const Folder*> SortedFolders(const std::vector<Folder>& folders, Fol
       size_t left = low;
       size_t right = middle;
       while (left < middle && right < high) {
-        merged.push_back(before(*order[right], *order[left]) ? order[right++] : order[left++]);
+        merged.push_back(before(order[right], order[left]) ? order[right++] : order[left++]);
       }
       merged.insert(merged.end(), order.begin() + static_cast<std::ptrdiff_t>(left),
                     order.begin() + static_cast<std::ptrdiff_t>(middle));
@@ -93,7 +191,12 @@ std::vector<const Folder*> SortedFolders(const std::vector<Folder>& folders, Fol
     }
     order.swap(merged);
   }
-  return order;
+  std::vector<const Folder*> sorted;
+  sorted.reserve(size);
+  for (const size_t i : order) {
+    sorted.push_back(&folders[i]);
+  }
+  return sorted;
 }
 
 }  // namespace
@@ -102,9 +205,25 @@ std::string Folders::GetLockPath() const { return FolderLockPath(); }
 
 std::string Folders::GetPath() const { return FolderConfPath(); }
 
-bool Folders::Load() {
+std::vector<Folder> FolderRecordsOf(const Json::Value& document) {
   // Every folder of a share lies on the same volume: the share is looked up once per load.
   const ShareLookupMemo memo;
+  std::vector<Folder> records;
+  records.reserve(document.size());
+  for (auto it = document.begin(); it != document.end(); ++it) {
+    // A folder whose share is gone is kept: it reports itself as not valid, and the user removes
+    // it. That is no failure of the load, so the code its full path left is not kept either.
+    // The stored "path" is ignored; the member's name is the folder's path.
+    records.emplace_back();
+    const _tag_fileindex_err_ code = ErrorHandler::GetError();
+    if (!records.back().Load(it.name(), *it)) {
+      ErrorHandler::SetError(code);
+    }
+  }
+  return records;
+}
+
+bool Folders::Load() {
   if (!LoadJson()) {
     return false;
   }
@@ -113,26 +232,42 @@ bool Folders::Load() {
     ErrorHandler::SetError(FILEINDEX_ERR_MALFORMED_FOLDERS);
     return false;
   }
-  for (auto it = m_jsRoot.begin(); it != m_jsRoot.end(); ++it) {
-    // A folder whose share is gone is kept: it reports itself as not valid, and the user removes
-    // it. That is no failure of the load, so the code its full path left is not kept either.
-    // The stored "path" is ignored; the member's name is the folder's path.
-    Folder folder;
-    const std::string path = it.name();
-    const _tag_fileindex_err_ code = ErrorHandler::GetError();
-    if (!folder.Load(path, *it)) {
-      ErrorHandler::SetError(code);
-    }
-    m_folders.emplace(path, std::move(folder));
+  for (Folder& folder : FolderRecordsOf(m_jsRoot)) {
+    std::string path = folder.GetPath();
+    m_folders.emplace(std::move(path), std::move(folder));
   }
   return true;
 }
 
 bool Folders::Save() {
-  m_jsRoot = Json::Value(Json::objectValue);
-  for (const auto& entry : m_folders) {
-    if (!entry.second.AddToJson(m_jsRoot)) {
-      return false;
+  // The document loaded is brought in line with the records: a member that already holds its
+  // record's JSON form stays as it is, so a change of one folder rebuilds one member, not the list.
+  if (!m_jsRoot.isObject()) {
+    m_jsRoot = Json::Value(Json::objectValue);
+  }
+  std::vector<std::string> gone;
+  size_t kept = 0;
+  for (auto member = m_jsRoot.begin(); member != m_jsRoot.end(); ++member) {
+    std::string path = member.name();
+    const auto record = m_folders.find(path);
+    if (record == m_folders.end()) {
+      gone.push_back(std::move(path));
+      continue;
+    }
+    ++kept;
+    if (!HoldsJsonOf(*member, record->second)) {
+      *member = record->second.asJson();
+    }
+  }
+  for (const std::string& path : gone) {
+    m_jsRoot.removeMember(path);
+  }
+  if (kept != m_folders.size()) {
+    for (const auto& entry : m_folders) {
+      if (m_jsRoot.find(entry.first.data(), entry.first.data() + entry.first.size()) == nullptr &&
+          !entry.second.AddToJson(m_jsRoot)) {
+        return false;
+      }
     }
   }
   return SaveJson();
@@ -159,13 +294,20 @@ bool Folders::List(Json::Value& out, unsigned long offset, unsigned long limit,
                    const Json::Value& additional) const {
   std::vector<Folder> folders;
   List(folders);
+  FolderPage(folders, out, offset, limit, sort_by, sort_direction, additional);
+  return true;
+}
+
+void FolderPage(const std::vector<Folder>& folders, Json::Value& out, unsigned long offset,
+                unsigned long limit, const std::string& sort_by, const std::string& sort_direction,
+                const Json::Value& additional) {
   const size_t total = folders.size();
 
   out = Json::Value(Json::objectValue);
   out["total"] = static_cast<Json::UInt>(total);
   out["offset"] = static_cast<Json::UInt64>(offset);
 
-  const std::vector<const Folder*> sorted = SortedFolders(folders, OrderBy(sort_by));
+  const std::vector<const Folder*> sorted = SortedFolders(folders, FolderOrder(folders, sort_by));
 
   const size_t count = offset >= total ? 0 : std::min<size_t>(total - offset, limit);
   // A descending page is the start of the ascending order, reversed, whatever the offset; the
@@ -215,7 +357,6 @@ bool Folders::List(Json::Value& out, unsigned long offset, unsigned long limit,
     page.append(FolderJsonWith(*onPage[i], additional, known));
   }
   out["folder"] = std::move(page);
-  return true;
 }
 
 bool Folders::Get(Json::Value& out, const std::string& path) const {
@@ -230,11 +371,6 @@ bool Folders::Get(Json::Value& out, const std::string& path) const {
 }
 
 bool Folders::Upsert(Json::Value& result, const Json::Value& request) {
-  std::vector<Folder> before;
-  if (!List(before)) {
-    return false;
-  }
-
   std::string path;
   std::string fullPath;
   if (!RetrieveStringFromJsonObj(path, "path", request) ||
@@ -244,6 +380,8 @@ bool Folders::Upsert(Json::Value& result, const Json::Value& request) {
     return false;
   }
 
+  // Taken before the change: the setting in force may be the changed folder's own.
+  const Json::Value before = SettingAt(m_folders, fullPath);
   auto it = m_folders.find(path);
   if (it == m_folders.end()) {
     Folder folder;
@@ -261,43 +399,27 @@ bool Folders::Upsert(Json::Value& result, const Json::Value& request) {
     it->second = std::move(changed);
   }
 
-  result = ChangeReport(GetMostSuitableCfg(std::move(before), fullPath), it->second.asJson());
+  result = ChangeReport(before, it->second.asJson());
   return true;
 }
 
 bool Folders::Delete(Json::Value& result, const std::string& path) {
-  std::vector<Folder> before;
-  if (!List(before)) {
-    return false;
-  }
-  m_folders.erase(path);
-  std::vector<Folder> after;
-  if (!List(after)) {
-    return false;
-  }
-
   std::string fullPath;
-  if (!WEZO::FILEINDEX::GetFullPath(fullPath, path)) {
+  const bool placed = WEZO::FILEINDEX::GetFullPath(fullPath, path);
+  if (!placed) {
+    m_folders.erase(path);
     return true;
   }
+  const Json::Value before = SettingAt(m_folders, fullPath);
+  m_folders.erase(path);
   result = Json::Value(Json::objectValue);
-  result[path] = ChangeReport(GetMostSuitableCfg(std::move(before), fullPath),
-                              GetMostSuitableCfg(std::move(after), fullPath));
+  result[path] = ChangeReport(before, SettingAt(m_folders, fullPath));
   return true;
 }
 
 // NOLINTNEXTLINE(performance-unnecessary-value-param): callers hand over lists they are done with
 Json::Value GetMostSuitableCfg(std::vector<Folder> folders, const std::string& fullPath) {
-  const std::string target = fullPath + "/";
-  const Folder* match = nullptr;
-  for (const Folder& folder : folders) {
-    // A folder whose share is gone holds no place; asking it for one would log and set a code.
-    // The last match wins: in share-path order that is the deepest folder enclosing the target.
-    if (folder.HasFullPath() && StringStartWith(target, folder.GetFullPath() + "/")) {
-      match = &folder;
-    }
-  }
-  return match != nullptr ? match->asJson() : Json::Value(Json::objectValue);
+  return SettingAt(folders, fullPath);
 }
 
 }  // namespace FILEINDEX

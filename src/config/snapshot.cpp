@@ -138,7 +138,8 @@ bool ReadStamped(const std::string& path, std::string& text, FileStamp& stamp) {
   return true;
 }
 
-// The snapshot of the file at `path`. `make` builds one from the parsed document, or null when
+// The snapshot of the file at `path`. `make` builds one from the parsed document, which it may
+// take over, or null when
 // the document will not do; `load` reads the file as its class does, which logs and sets the code
 // of a failure, and also serves a file that was replaced while it was read here.
 template <typename T, typename Make, typename Load>
@@ -190,6 +191,11 @@ FolderSnapshot::FolderSnapshot(std::vector<std::string> paths) : m_paths(std::mo
   }
   std::sort(m_shares.begin(), m_shares.end());
   m_shares.erase(std::unique(m_shares.begin(), m_shares.end()), m_shares.end());
+}
+
+FolderSnapshot::FolderSnapshot(Json::Value document) : FolderSnapshot(document.getMemberNames()) {
+  m_document = std::move(document);
+  m_hasDocument = true;
 }
 
 bool FolderSnapshot::Holds(std::string_view path) const {
@@ -258,11 +264,11 @@ std::shared_ptr<const FolderSnapshot> FolderListSnapshot() {
   static const auto kNone = std::make_shared<const FolderSnapshot>(std::vector<std::string>());
   return Acquire<FolderSnapshot>(
       FolderKeeper(), FolderConfPath(), kNone,
-      [](const Json::Value& document) -> std::shared_ptr<const FolderSnapshot> {
+      [](Json::Value& document) -> std::shared_ptr<const FolderSnapshot> {
         if (!document.isObject()) {
           return nullptr;
         }
-        return std::make_shared<const FolderSnapshot>(document.getMemberNames());
+        return std::make_shared<const FolderSnapshot>(std::move(document));
       },
       []() -> std::shared_ptr<const FolderSnapshot> {
         Folders list;
@@ -283,8 +289,8 @@ std::shared_ptr<const Status> StatusSnapshot() {
   static const std::shared_ptr<const Status> kNone = std::make_shared<const Status>();
   return Acquire<Status>(
       StatusKeeper(), StatusConfPath(), kNone,
-      [](const Json::Value& document) -> std::shared_ptr<const Status> {
-        return std::make_shared<const StatusImage>(document);
+      [](Json::Value& document) -> std::shared_ptr<const Status> {
+        return std::make_shared<const StatusImage>(std::move(document));
       },
       []() -> std::shared_ptr<const Status> {
         auto status = std::make_shared<Status>();

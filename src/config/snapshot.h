@@ -15,6 +15,8 @@
 #ifndef FILEINDEX_SRC_CONFIG_SNAPSHOT_H_
 #define FILEINDEX_SRC_CONFIG_SNAPSHOT_H_
 
+#include <json/value.h>
+
 #include <chrono>
 #include <memory>
 #include <string>
@@ -26,11 +28,16 @@
 namespace WEZO {
 namespace FILEINDEX {
 
-// The folder list's share paths, without the records: enough for the share-path questions, which
-// never need a full path.
+// The folder list's share paths, enough for the share-path questions, which never need a full
+// path, and the document they were read from, from which the listing builds its records.
 class FolderSnapshot {
  public:
   explicit FolderSnapshot(std::vector<std::string> paths);
+  // From a parsed folder.conf, a JSON object: its member names and the document itself.
+  explicit FolderSnapshot(Json::Value document);
+
+  // The parsed file, or null when this snapshot was made from a list loaded by Folders::Load.
+  const Json::Value* Document() const { return m_hasDocument ? &m_document : nullptr; }
 
   // Whether a folder's path is `path` or one of its ancestors at a "/" boundary.
   bool IsPathIndexed(const std::string& path) const;
@@ -52,6 +59,8 @@ class FolderSnapshot {
   std::vector<std::string> m_paths;   // byte order
   std::vector<std::string> m_shares;  // byte order, distinct
   bool m_unnamed = false;
+  Json::Value m_document;
+  bool m_hasDocument = false;
 };
 
 // The folder list as folder.conf holds it now; null when the file cannot be read or holds no JSON

@@ -14,6 +14,7 @@
 #include <string>
 #include <vector>
 
+#include "config/folder_page.h"
 #include "config/snapshot.h"
 #include "config/transaction.h"
 #include "fileindex/daemon.h"
@@ -247,6 +248,9 @@ bool RegisterShare(const std::string& share, const std::string& queue, const Fol
   return true;
 }
 
+const std::string& PathOf(const Folder& folder) { return folder.GetPath(); }
+const std::string& PathOf(const std::string& path) { return path; }
+
 // Adds the share of the share path `path` to `shares`.
 bool AddShareOf(const std::string& path, std::set<std::string>& shares) {
   std::string share;
@@ -286,12 +290,15 @@ bool UpsertFolders(const Json::Value& request) {
       }
     }
 
-    std::vector<Folder> before;
+    std::vector<Folder> before;  // in byte order of the paths
     list.List(before);
-    std::set<std::string> stored;
-    for (const Folder& folder : before) {
-      stored.insert(folder.GetPath());
-    }
+    std::set<std::string> added;
+    const auto isNew = [&before, &added](const std::string& path) {
+      const bool stored =
+          std::binary_search(before.begin(), before.end(), path,
+                             [](const auto& a, const auto& b) { return PathOf(a) < PathOf(b); });
+      return !stored && added.insert(path).second;
+    };
     std::vector<std::string> paths;
     std::set<std::string> shares;
     std::set<std::string> grown;  // the shares that gained a folder
@@ -306,7 +313,7 @@ bool UpsertFolders(const Json::Value& request) {
       if (!AddShareOf(path, shares)) {
         return false;
       }
-      if (stored.insert(path).second) {
+      if (isNew(path)) {
         AddShareOf(path, grown);
       }
       paths.push_back(path);
@@ -450,19 +457,35 @@ bool ReindexPaths(const Json::Value& request) {
   return true;
 }
 
-}  // namespace
-
-bool IndexMgr::List(std::vector<Folder>& folders) {
+// The folder records as a load of the list gives them, built from the kept snapshot's document
+// when it has one. False, logged with a code set, when folder.conf cannot be loaded.
+bool CurrentRecords(std::vector<Folder>& folders) {
+  const std::shared_ptr<const FolderSnapshot> snapshot = FolderListSnapshot();
+  if (snapshot == nullptr) {
+    return false;
+  }
+  if (const Json::Value* document = snapshot->Document()) {
+    folders = FolderRecordsOf(*document);
+    return true;
+  }
   Folders list;
   return list.Load() && list.List(folders);
 }
+
+}  // namespace
+
+bool IndexMgr::List(std::vector<Folder>& folders) { return CurrentRecords(folders); }
 
 bool IndexMgr::List(Json::Value& result, unsigned long offset, unsigned long limit,
                     const std::string& sortBy, const std::string& sortDirection,
                     const Json::Value& additional) {
   return RefuseOnJsonError(additional, [&] {
-    Folders list;
-    return list.Load() && list.List(result, offset, limit, sortBy, sortDirection, additional);
+    std::vector<Folder> folders;
+    if (!CurrentRecords(folders)) {
+      return false;
+    }
+    FolderPage(folders, result, offset, limit, sortBy, sortDirection, additional);
+    return true;
   });
 }
 
