@@ -2,7 +2,6 @@
 #include <gtest/gtest.h>
 #include <json/writer.h>
 
-#include <strings.h>
 #include <algorithm>
 #include <filesystem>
 #include <iterator>
@@ -193,30 +192,6 @@ TEST_F(FoldersTest, PagedListingNeedsNoConsistentOrderFromThePlatform) {
     if (compare != nullptr) std::sort(paths.begin(), paths.end());
     EXPECT_EQ(paths, byteOrder);
   }
-}
-
-// ASCII texts, whose order the listing works out itself, sort as the platform compares them,
-// among texts that it must ask the platform about (non-ASCII, a NUL that ends the C string).
-TEST_F(FoldersTest, PagedListingSortsNamesAsThePlatformComparesThem) {
-  const std::string names[] = {
-      "_b", "B", "a", "[",  "\xC3\xA4", "A\xC3\xA4", "a", std::string("a\0z", 3),
-      "Zz", "{", "`", "AB", "ab"};
-  Json::Value list(Json::objectValue);
-  std::vector<std::pair<std::string, std::string>> expected;  // path and name, in byte order
-  for (size_t i = 0; i < std::size(names); ++i) {
-    expected.emplace_back("/photo/" + std::to_string(10 + i), names[i]);
-    list[expected.back().first]["name"] = names[i];
-  }
-  std::stable_sort(expected.begin(), expected.end(), [](const auto& a, const auto& b) {
-    return strcasecmp(a.second.c_str(), b.second.c_str()) < 0;
-  });
-  Folders folders;
-  LoadText(folders, JsonToString(list));
-  Json::Value page;
-  ASSERT_TRUE(folders.List(page, 0, 100, "name", "ASC", Json::Value(Json::arrayValue)));
-  std::vector<std::string> paths;
-  for (const auto& folder : expected) paths.push_back(folder.first);
-  EXPECT_EQ(PathsOf(page), paths);
 }
 
 // A changed folder takes only what the request carries; the rest goes back to empty.

@@ -6,7 +6,6 @@
 
 #include <algorithm>
 #include <cstddef>
-#include <optional>
 #include <string>
 #include <utility>
 #include <vector>
@@ -89,10 +88,9 @@ bool HoldsJsonOf(const Json::Value& stored, const Folder& folder) {
 }
 
 // The order of `sortBy` over `folders`, by index: true when folder `a` sorts before folder `b`.
-// Names and paths compare without regard to case through the platform, except that two texts of
-// ASCII alone (no NUL) compare by their bytes with A-Z lowered, each folded once: that is
-// what the platform's comparison answers for them, at a fraction of a call's cost (a call folds
-// both texts through Unicode case folding every time, and a sort makes some ten calls per folder).
+// Names and paths compare without regard to case through the platform, always: how a platform
+// orders texts without regard to case (lowered or raised letters, a locale's collation) is its
+// own, and a shortcut here could sort a page otherwise than the appliance does.
 class FolderOrder {
  public:
   FolderOrder(const std::vector<Folder>& folders, std::string sortBy)
@@ -100,19 +98,10 @@ class FolderOrder {
     if (m_sortBy != "name") {
       m_sortBy = IsKind(m_sortBy) ? m_sortBy : "path";
     }
-    if (m_sortBy == "name" || m_sortBy == "path") {
-      m_folded.reserve(folders.size());
-      for (const Folder& folder : folders) {
-        m_folded.emplace_back(Folded(TextOf(folder)));
-      }
-    }
   }
 
   bool operator()(size_t a, size_t b) const {
-    if (!m_folded.empty()) {
-      if (m_folded[a].has_value() && m_folded[b].has_value()) {
-        return *m_folded[a] < *m_folded[b];
-      }
+    if (m_sortBy == "name" || m_sortBy == "path") {
       return WLIBCUnicodeUTF8StrCaseCmp(TextOf(m_folders[a]).c_str(),
                                         TextOf(m_folders[b]).c_str()) < 0;
     }
@@ -139,25 +128,8 @@ class FolderOrder {
     return m_sortBy == "video" ? folder.GetVideo() : folder.GetPhoto();
   }
 
-  // `text` with A-Z lowered, or nothing when it holds a byte outside 0x01-0x7F.
-  static std::optional<std::string> Folded(const std::string& text) {
-    std::string folded = text;
-    constexpr unsigned char kNonAscii = 0x80;
-    for (char& c : folded) {
-      const auto byte = static_cast<unsigned char>(c);
-      if (byte == 0 || byte >= kNonAscii) {
-        return std::nullopt;
-      }
-      if (c >= 'A' && c <= 'Z') {
-        c = static_cast<char>(c - 'A' + 'a');
-      }
-    }
-    return folded;
-  }
-
   const std::vector<Folder>& m_folders;
   std::string m_sortBy;
-  std::vector<std::optional<std::string>> m_folded;
 };
 
 // `folders` in the order of `before`, by a bottom-up merge sort. Folders that compare equal keep
