@@ -29,7 +29,8 @@ trap 'rm -f "$json"' EXIT
 status=0
 "$build/bench/read_paths_bench" "${args[@]}" >"$json" || status=$?
 
-sandbox_fs=$(stat -f -c %T "${TMPDIR:-/tmp}")
+# df names the file system as mounted (stat -f cannot tell ext4 from ext2).
+sandbox_fs=$(df --output=fstype "${TMPDIR:-/tmp}" | tail -n 1)
 python3 - "$json" "$status" "$sandbox_fs" <<'PYTHON'
 import json
 import sys
