@@ -11,7 +11,6 @@
 #include <mutex>
 #include <utility>
 
-#include "fileindex/folders.h"
 #include "fileindex/utils.h"
 #include "json_io.h"
 #include "paths.h"
@@ -260,7 +259,7 @@ bool FolderSnapshot::HoldsShare(const std::string& share) const {
   return std::binary_search(m_shares.begin(), m_shares.end(), share);
 }
 
-std::shared_ptr<const FolderSnapshot> FolderListSnapshot() {
+std::shared_ptr<const FolderSnapshot> FolderListSnapshot(FolderListLoader load) {
   static const auto kNone = std::make_shared<const FolderSnapshot>(std::vector<std::string>());
   return Acquire<FolderSnapshot>(
       FolderKeeper(), FolderConfPath(), kNone,
@@ -270,19 +269,7 @@ std::shared_ptr<const FolderSnapshot> FolderListSnapshot() {
         }
         return std::make_shared<const FolderSnapshot>(std::move(document));
       },
-      []() -> std::shared_ptr<const FolderSnapshot> {
-        Folders list;
-        std::vector<Folder> folders;
-        if (!list.Load() || !list.List(folders)) {
-          return nullptr;
-        }
-        std::vector<std::string> paths;
-        paths.reserve(folders.size());
-        for (const Folder& folder : folders) {
-          paths.push_back(folder.GetPath());
-        }
-        return std::make_shared<const FolderSnapshot>(std::move(paths));
-      });
+      load);
 }
 
 std::shared_ptr<const Status> StatusSnapshot() {

@@ -63,9 +63,14 @@ class FolderSnapshot {
   bool m_hasDocument = false;
 };
 
+// A reading of folder.conf by the folder list itself, for a file that cannot be kept: the
+// snapshot of the list as Folders::Load reads it, or null after a failure that it logged and set
+// the code of. Given by the caller, since the folder list stands above this layer.
+using FolderListLoader = std::shared_ptr<const FolderSnapshot> (*)();
+
 // The folder list as folder.conf holds it now; null when the file cannot be read or holds no JSON
-// object (logged, with the code that Folders::Load sets).
-std::shared_ptr<const FolderSnapshot> FolderListSnapshot();
+// object (logged by `load`, with the code that Folders::Load sets).
+std::shared_ptr<const FolderSnapshot> FolderListSnapshot(FolderListLoader load);
 
 // The status file as status.conf holds it now; null when it cannot be read (logged, with the code
 // that Status::Load sets).
