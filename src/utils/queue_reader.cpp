@@ -1318,8 +1318,8 @@ class FolderSet {
     // Siblings differ near the end of the common start, so its last byte is looked at first.
     const size_t common = m_common.size();
     if (!m_byPath.empty() && fullSize >= m_minSize &&
-        (common == 0 || path[common - 1] == m_common[common - 1]) &&
-        std::memcmp(path.data(), m_common.data(), common) == 0) {
+        (common == 0 || (path[common - 1] == m_common[common - 1] &&
+                         std::memcmp(path.data(), m_common.data(), common) == 0))) {
       for (size_t end = m_minSize; end <= upto; ++end) {
         if (m_sizes[end] == 0 || (end != fullSize && path[end] != '/')) {
           continue;
@@ -1335,7 +1335,8 @@ class FolderSet {
           const std::vector<size_t>& folders = *slot.folders;
           if (std::all_of(folders.begin(), folders.end(),
                           [&found](size_t f) { return found[f]; }) ||
-              slot.path->size() != end || std::memcmp(slot.path->data(), path.data(), end) != 0) {
+              slot.path->size() != end ||
+              (end != 0 && std::memcmp(slot.path->data(), path.data(), end) != 0)) {
             continue;
           }
           for (const size_t f : folders) {
@@ -1370,7 +1371,9 @@ class FolderSet {
   static uint64_t Key(const char* path, size_t size) {
     uint64_t last = 0;
     const size_t n = std::min<size_t>(size, sizeof last);
-    std::memcpy(&last, path + size - n, n);
+    if (n != 0) {  // an empty path may have no bytes at all
+      std::memcpy(&last, path + size - n, n);
+    }
     return (last ^ (size * 0x9E3779B97F4A7C15ULL)) * 0xBF58476D1CE4E5B9ULL;
   }
 
