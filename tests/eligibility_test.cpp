@@ -66,6 +66,7 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
       {"/photo/#recycle-notes", "recycle", R::kRecycleBin, "WEZOShareIsShareRecycle", ""},
       {"/photo/#snapshot", "snapshot", R::kSnapshot, "WLIBFhsPathInSnapshot", ""},
       {"/photo/#snapshot", "snapshot snapshot?", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
+      {"/photo/#snapshot", "", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
       {"", "unknown-fs", R::kUnknownFileSystem, "WEZOGetFSType", ""},
       // A remote file system is refused before the share is looked at.
       {"/surveillance/cam", "remote-fs", R::kRemoteFileSystem, "WEZOFSIsRemoteFS", ""},
