@@ -332,6 +332,9 @@ TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {
     EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_BAD_PARAM);
     EXPECT_THAT(Log(), ::testing::MatchesRegex("index_mgr:N Bad param: [^;]*"));
   }
+  log.Clear();
+  EXPECT_FALSE(IndexMgr::ShareRename("..", "photo"));  // the line names both shares
+  EXPECT_EQ(Log(), R"(index_mgr:N Bad param: ["..","photo"])");
   EXPECT_EQ(ReadFile(FolderConfPath()), before);
   EXPECT_EQ(Effects(), "");
   EXPECT_EQ(Events("photo"), "");
