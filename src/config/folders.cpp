@@ -18,6 +18,7 @@
 #include "json_io.h"
 #include "paths.h"
 #include "status_mgr/progress.h"
+#include "utils/eligibility_pass.h"
 #include "utils/log.h"
 #include "utils/share_memo.h"
 
@@ -306,10 +307,11 @@ void FolderPage(const std::vector<Folder>& folders, Json::Value& out, unsigned l
   std::vector<bool> valid;
   std::vector<std::string> states;
   std::vector<std::string> paths;
+  EligibilityPass eligibility;
   for (const Folder* folder : onPage) {
     paths.push_back(folder->GetPath());
     if (wantValid) {
-      valid.push_back(CanPathBeIndexed(folder->GetPath()));
+      valid.push_back(eligibility.CanPathBeIndexed(folder->GetPath()));
     }
   }
   if (wantStatus) {
