@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cstddef>
+#include <memory>
 #include <string>
 #include <utility>
 #include <vector>
@@ -194,6 +195,20 @@ std::vector<Folder> FolderRecordsOf(const Json::Value& document) {
     }
   }
   return records;
+}
+
+std::shared_ptr<const FolderSnapshot> LoadFolderList() {
+  Folders list;
+  std::vector<Folder> folders;
+  if (!list.Load() || !list.List(folders)) {
+    return nullptr;
+  }
+  std::vector<std::string> paths;
+  paths.reserve(folders.size());
+  for (const Folder& folder : folders) {
+    paths.push_back(folder.GetPath());
+  }
+  return std::make_shared<const FolderSnapshot>(std::move(paths));
 }
 
 bool Folders::Load() {
