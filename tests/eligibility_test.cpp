@@ -11,6 +11,7 @@
 #include "fileindex/eligibility.h"
 #include "fileindex/error.h"
 #include "test_support.h"
+#include "utils/eligibility_pass.h"
 
 namespace WEZO::FILEINDEX {
 namespace {
@@ -107,7 +108,51 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
     std::string line = *logLine ? std::string("utils:N ") + logLine : "";
     if (line.find("%s") != std::string::npos) line.replace(line.find("%s"), 2, fullPath);
     EXPECT_EQ(log.Lines().empty() ? "" : log.Lines().back(), line);
+    // A pass over the one folder answers alike.
+    log.Clear();
+    EXPECT_EQ(EligibilityPass().FullPathRule(fullPath), rule);
+    EXPECT_EQ(log.Lines().empty() ? "" : log.Lines().back(), line);
+    EXPECT_EQ(fake::Get().openShareRecords, 0);
     ErrorHandler::SetError(FILEINDEX_ERR_NONE);
+  }
+}
+
+// Folders of one pass, in this order, get the answers of the folder-by-folder check, although
+// the pass asks once per share and resolves each directory once.
+TEST_F(EligibilityTest, APassAnswersEachFolderAsTheFolderByFolderCheck) {
+  std::filesystem::create_directories(volume + "/photo/2019/sub/deep");
+  std::filesystem::create_directories(volume + "/video/clips");
+  std::filesystem::create_symlink(volume + "/photo/2019/sub", volume + "/photo/2019/lsub");
+  fake::Get().facts[volume + "/video/clips"].fsType = fake::kRemoteFs;
+  fake::Get().facts[volume + "/photo/2019/sub/deep"].mountPoint = 1;
+  const std::vector<std::string> folders = {
+      "/photo/link/sub",  "/photo/link/sub/deep",  "/photo/2019/sub",
+      "/photo/2019/lsub", "/photo/2019/lsub/deep", "/photo/2019/sub/deep",
+      "/photo/2019/gone", "/photo/2019/./sub",     "/photo/2019//sub",
+      "/photo/2019/sub/", "/photo/2019/..",        "/video/clips",
+      "/video",           "/video/gone/x"};
+  std::vector<IndexRule> expected;
+  for (const std::string& folder : folders) expected.push_back(FullPathIndexRule(volume + folder));
+  fake::Get().calls.clear();
+  {
+    EligibilityPass pass;
+    for (size_t i = 0; i < folders.size(); ++i) {
+      EXPECT_EQ(pass.FullPathRule(volume + folders[i]), expected[i]) << folders[i];
+    }
+  }
+  EXPECT_EQ(fake::Get().CallsTo("WEZOShareGet").size(), 2U);
+  EXPECT_EQ(fake::Get().CallsTo("WLIBShareIsEncryptionGet").size(), 1U);
+  // A share that goes between two passes is seen gone by the second; a share record that cannot
+  // be had is logged once per pass.
+  fake::Get().shares.erase("video");
+  for (int i = 0; i < 2; ++i) {
+    EligibilityPass later;
+    EXPECT_EQ(later.FullPathRule(volume + "/video"), IndexRule::kNoShare);
+    log.Clear();
+    fake::Get().share_get_fails_after = 1;  // GetFullPath's lookup, then the rules' lookup fails
+    EXPECT_FALSE(later.CanPathBeIndexed("/photo/2019") || later.CanPathBeIndexed("/photo/x"));
+    EXPECT_THAT(log.Lines(), ElementsAre("utils:N WEZOShareGet failed, share=photo"));
+    fake::Get().share_get_fails_after = -1;
   }
 }
 

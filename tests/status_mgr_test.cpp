@@ -170,6 +170,12 @@ TEST_F(ProgressTest, TheServiceIsFinishedWhenNoIndexableShareHasAQueueFile) {
   std::filesystem::remove(FolderConfPath());
   ASSERT_TRUE(StatusMgr::GetStatus(word));
   EXPECT_EQ(word, "finished");
+  // A folder under the empty path is placed, and refused, with the lines of a load of the list.
+  WriteFile(FolderConfPath(), R"({"":{},"/photo/a":{}})");
+  log.Clear();
+  EXPECT_FALSE(StatusMgr::GetStatus(word));
+  EXPECT_THAT(log.Lines(), ElementsAre("utils:N GetShareNameByPath failed, path=",
+                                       "status_mgr:N Failed to get share name from path: "));
 }
 
 // The listing's and the status manager's one read per queue, for many folders of several shares,

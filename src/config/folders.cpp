@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cstddef>
+#include <memory>
 #include <string>
 #include <utility>
 #include <vector>
@@ -18,6 +19,7 @@
 #include "json_io.h"
 #include "paths.h"
 #include "status_mgr/progress.h"
+#include "utils/eligibility_pass.h"
 #include "utils/log.h"
 #include "utils/share_memo.h"
 
@@ -195,6 +197,20 @@ std::vector<Folder> FolderRecordsOf(const Json::Value& document) {
   return records;
 }
 
+std::shared_ptr<const FolderSnapshot> LoadFolderList() {
+  Folders list;
+  std::vector<Folder> folders;
+  if (!list.Load() || !list.List(folders)) {
+    return nullptr;
+  }
+  std::vector<std::string> paths;
+  paths.reserve(folders.size());
+  for (const Folder& folder : folders) {
+    paths.push_back(folder.GetPath());
+  }
+  return std::make_shared<const FolderSnapshot>(std::move(paths));
+}
+
 bool Folders::Load() {
   if (!LoadJson()) {
     return false;
@@ -306,10 +322,11 @@ void FolderPage(const std::vector<Folder>& folders, Json::Value& out, unsigned l
   std::vector<bool> valid;
   std::vector<std::string> states;
   std::vector<std::string> paths;
+  EligibilityPass eligibility;
   for (const Folder* folder : onPage) {
     paths.push_back(folder->GetPath());
     if (wantValid) {
-      valid.push_back(CanPathBeIndexed(folder->GetPath()));
+      valid.push_back(eligibility.CanPathBeIndexed(folder->GetPath()));
     }
   }
   if (wantStatus) {

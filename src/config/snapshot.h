@@ -52,6 +52,8 @@ class FolderSnapshot {
   // Whether a folder is stored under the empty path, which names no share.
   bool HoldsUnnamedFolder() const { return m_unnamed; }
   bool Empty() const { return m_paths.empty(); }
+  // The folders' share paths, in byte order, as Folders::List gives them.
+  const std::vector<std::string>& Paths() const { return m_paths; }
 
  private:
   bool Holds(std::string_view path) const;

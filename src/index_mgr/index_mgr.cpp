@@ -457,21 +457,6 @@ bool ReindexPaths(const Json::Value& request) {
   return true;
 }
 
-// The list as Folders::Load reads it, for a folder.conf that the snapshot cannot keep.
-std::shared_ptr<const FolderSnapshot> LoadFolderList() {
-  Folders list;
-  std::vector<Folder> folders;
-  if (!list.Load() || !list.List(folders)) {
-    return nullptr;
-  }
-  std::vector<std::string> paths;
-  paths.reserve(folders.size());
-  for (const Folder& folder : folders) {
-    paths.push_back(folder.GetPath());
-  }
-  return std::make_shared<const FolderSnapshot>(std::move(paths));
-}
-
 // The folder records as a load of the list gives them, built from the kept snapshot's document
 // when it has one. False, logged with a code set, when folder.conf cannot be loaded.
 bool CurrentRecords(std::vector<Folder>& folders) {

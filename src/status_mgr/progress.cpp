@@ -11,6 +11,7 @@
 #include "fileindex/status.h"
 #include "fileindex/utils.h"
 #include "status_mgr/status_change.h"
+#include "utils/eligibility_pass.h"
 #include "utils/log.h"
 #include "utils/queue_reader.h"
 #include "utils/storage.h"
@@ -39,13 +40,14 @@ const char* RunningOrPaused(long long resumeTime) {
 
 bool OverallProgress(const std::vector<std::string>& paths, std::string& status) {
   std::set<std::string> shares;
+  EligibilityPass eligibility;
   for (const std::string& path : paths) {
     std::string share;
     if (!GetShareNameByPath(share, path)) {
       FILEINDEX_LOG("Failed to get share name from path: %s", path.c_str());
       return false;
     }
-    if (CanPathBeIndexed(path)) {
+    if (eligibility.CanPathBeIndexed(path)) {
       shares.insert(share);
     }
   }
@@ -108,8 +110,10 @@ std::vector<std::string> FoldersProgress(const std::vector<std::string>& paths,
                                          const std::vector<bool>* indexable) {
   std::vector<std::string> states(paths.size(), kFinished);
   std::map<std::string, std::vector<size_t>> byShare;
+  // Also answers the full paths below from one lookup per share.
+  EligibilityPass eligibility;
   for (size_t i = 0; i < paths.size(); ++i) {
-    if (!(indexable != nullptr ? (*indexable)[i] : CanPathBeIndexed(paths[i]))) {
+    if (!(indexable != nullptr ? (*indexable)[i] : eligibility.CanPathBeIndexed(paths[i]))) {
       states[i] = kPaused;
       continue;
     }

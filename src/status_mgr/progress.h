@@ -25,8 +25,9 @@ std::string FolderProgress(const std::string& path);
 
 // The states of the folders at the share paths `paths`, in their order, each exactly as
 // FolderProgress gives it, in one pass: eligibility once per folder (taken from `indexable`, one
-// entry per path, when the caller has it already), the status file once, each share's queue path
-// once and each share's queue and companion read once for all of its folders.
+// entry per path, when the caller has it already) and each share's facts once (eligibility_pass.h),
+// the status file once, each share's queue path once and each share's queue and companion read
+// once for all of its folders.
 std::vector<std::string> FoldersProgress(const std::vector<std::string>& paths,
                                          const std::vector<bool>* indexable = nullptr);
 

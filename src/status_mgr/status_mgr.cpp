@@ -7,9 +7,12 @@
 #include <cstdint>
 #include <ctime>
 #include <limits>
+#include <memory>
 #include <string>
 #include <vector>
 
+#include "config/folder_page.h"
+#include "config/snapshot.h"
 #include "fileindex/error.h"
 #include "fileindex/folders.h"
 #include "fileindex/status.h"
@@ -75,6 +78,15 @@ bool StatusMgr::Pause(const int& hours) {
 }
 
 bool StatusMgr::GetStatus(std::string& status) {
+  const std::shared_ptr<const FolderSnapshot> snapshot = FolderListSnapshot(&LoadFolderList);
+  if (snapshot == nullptr) {
+    return false;
+  }
+  // A load places every folder, and placing one under the empty path logs: a list that holds one
+  // and that no load has read yet is read as a load reads it.
+  if (!snapshot->HoldsUnnamedFolder() || snapshot->Document() == nullptr) {
+    return OverallProgress(snapshot->Paths(), status);
+  }
   Folders list;
   std::vector<Folder> folders;
   if (!list.Load() || !list.List(folders)) {

@@ -3,16 +3,19 @@
 
 #include "fileindex/eligibility.h"
 
+#include <sys/stat.h>
 #include <wezo/platform.h>
 
 #include <algorithm>
 #include <array>
 #include <climits>
 #include <cstdlib>
+#include <map>
 
 #include "fileindex/error.h"
 #include "fileindex/utils.h"
 #include "layout.h"
+#include "utils/eligibility_pass.h"
 #include "utils/log.h"
 #include "utils/share_record.h"
 
@@ -132,7 +135,145 @@ const RuleText* FindRuleText(IndexRule rule) {
   return nullptr;
 }
 
+// What the folder rules ask of a share: looked up once per folder, or once per pass.
+struct ShareFacts {
+  ShareRecord record;  // null when the lookup failed
+  IndexRule rule = IndexRule::kShareUnreadable;
+  bool mountRuleKnown = false;
+  bool refusesMountPoint = false;
+};
+
+ShareFacts LookedUp(const std::string& name) {
+  ShareFacts facts;
+  if (LookUpShare(name, facts.record) < 0 || !facts.record) {
+    FILEINDEX_LOG("WEZOShareGet failed, share=%s", name.c_str());
+    facts.record.reset();
+    return facts;
+  }
+  facts.rule = ShareIndexRule(facts.record.get());
+  return facts;
+}
+
+// A volume mounted inside a share is refused, except on a share set up for encryption, whose own
+// directory is such a mount. A share whose encryption setting cannot be read lets it through.
+bool RefusesMountPoint(ShareFacts& share) {
+  if (!share.mountRuleKnown) {
+    int encryption = 0;
+    share.refusesMountPoint =
+        WLIBShareIsEncryptionGet(share.record.get(), &encryption) == 0 && encryption == 0;
+    share.mountRuleKnown = true;
+  }
+  return share.refusesMountPoint;
+}
+
+// The folder must be exactly where it says: no symbolic link on the way, no trailing slash, no
+// "." or ".." and no doubled slash; and it must exist.
+bool ResolvesToItself(const std::string& path) {
+  char resolved[PATH_MAX];
+  return realpath(path.c_str(), resolved) != nullptr && path == resolved;
+}
+
+// ResolvesToItself(path), with the answers for directories kept in `dirs`. A resolved path is
+// clean, exists and has no symbolic link in it, so a path resolves to itself exactly when its
+// directory does and its last name is a clean one that exists and is no symbolic link: one lstat
+// per directory of the pass and per folder, where realpath reads every component of every path.
+// NOLINTNEXTLINE(misc-no-recursion): one level per component of a path shorter than PATH_MAX
+bool ResolvesToItselfIn(const std::string& path, std::map<std::string, bool>& dirs) {
+  // No resolved path is as long as PATH_MAX.
+  if (path.size() >= PATH_MAX) {
+    return false;
+  }
+  const size_t slash = path.rfind('/');
+  if (slash == std::string::npos || slash == 0) {
+    return ResolvesToItself(path);
+  }
+  const std::string name = path.substr(slash + 1);
+  if (name.empty() || name == "." || name == ".." || path.find('\0') != std::string::npos) {
+    return false;
+  }
+  std::string dir = path.substr(0, slash);
+  auto known = dirs.find(dir);
+  if (known == dirs.end()) {
+    const bool resolves = ResolvesToItselfIn(dir, dirs);
+    known = dirs.emplace(std::move(dir), resolves).first;
+  }
+  struct stat st {};
+  return known->second && lstat(path.c_str(), &st) == 0 && !S_ISLNK(st.st_mode);
+}
+
 }  // namespace
+
+struct EligibilityPass::Memo {
+  std::map<std::string, ShareFacts> shares;  // by share name
+  std::map<std::string, bool> dirs;          // whether the directory resolves to itself
+};
+
+namespace {
+
+// The folder rules in their order, with share facts and directories kept in `memo` if given.
+IndexRule RuleOf(const std::string& fullPath, EligibilityPass::Memo* memo) {
+  if (InRecycleBin(fullPath)) {
+    return IndexRule::kRecycleBin;
+  }
+  if (InSnapshot(fullPath)) {
+    return IndexRule::kSnapshot;
+  }
+  const IndexRule fileSystem = FileSystemRule(WEZOGetFSType(fullPath.c_str(), 0));
+  if (fileSystem != IndexRule::kIndexable) {
+    return fileSystem;
+  }
+
+  std::string shareName;
+  std::string sharePath;
+  if (!GetShareNamePathByFullPath(shareName, sharePath, fullPath)) {
+    FILEINDEX_LOG("GetShareNamePathByFullPath failed, path=%s", fullPath.c_str());
+    return IndexRule::kNoShare;
+  }
+  ShareFacts own;
+  ShareFacts* share = &own;
+  if (memo != nullptr) {
+    auto known = memo->shares.find(shareName);
+    if (known == memo->shares.end()) {
+      known = memo->shares.emplace(shareName, LookedUp(shareName)).first;
+    }
+    share = &known->second;
+  } else {
+    own = LookedUp(shareName);
+  }
+  if (share->rule != IndexRule::kIndexable) {
+    return share->rule;
+  }
+
+  if (WEZOFSDirIsMntPoint(fullPath.c_str()) == 1 && RefusesMountPoint(*share)) {
+    FILEINDEX_LOG("Mount point[%s] is not allowed to be indexed", fullPath.c_str());
+    return IndexRule::kMountPoint;
+  }
+  if (!(memo != nullptr ? ResolvesToItselfIn(fullPath, memo->dirs) : ResolvesToItself(fullPath))) {
+    FILEINDEX_LOG("check realpath failed, path=%s", fullPath.c_str());
+    return IndexRule::kResolvesElsewhere;
+  }
+  return IndexRule::kIndexable;
+}
+
+}  // namespace
+
+EligibilityPass::EligibilityPass() : m_memo(std::make_unique<Memo>()) {}
+
+EligibilityPass::~EligibilityPass() = default;
+
+IndexRule EligibilityPass::FullPathRule(const std::string& fullPath) {
+  return RuleOf(fullPath, m_memo.get());
+}
+
+bool EligibilityPass::CanPathBeIndexed(const std::string& path) {
+  std::string fullPath;
+  if (!GetFullPath(fullPath, path)) {
+    FILEINDEX_LOG("GetFullPath failed, path=%s", path.c_str());
+    ErrorHandler::SetError(FILEINDEX_ERR_PATH);
+    return false;
+  }
+  return FullPathRule(fullPath) == IndexRule::kIndexable;
+}
 
 bool CanShareBeIndexed(_tag_WEZOSHARE* share) {
   return ShareIndexRule(share) == IndexRule::kIndexable;
@@ -158,53 +299,7 @@ bool IsSkipIndex(const std::string& fullPath) {
   return rule != IndexRule::kIndexable && rule != IndexRule::kUnknownFileSystem;
 }
 
-IndexRule FullPathIndexRule(const std::string& fullPath) {
-  if (InRecycleBin(fullPath)) {
-    return IndexRule::kRecycleBin;
-  }
-  if (InSnapshot(fullPath)) {
-    return IndexRule::kSnapshot;
-  }
-  const IndexRule fileSystem = FileSystemRule(WEZOGetFSType(fullPath.c_str(), 0));
-  if (fileSystem != IndexRule::kIndexable) {
-    return fileSystem;
-  }
-
-  std::string shareName;
-  std::string sharePath;
-  if (!GetShareNamePathByFullPath(shareName, sharePath, fullPath)) {
-    FILEINDEX_LOG("GetShareNamePathByFullPath failed, path=%s", fullPath.c_str());
-    return IndexRule::kNoShare;
-  }
-  ShareRecord share;
-  if (LookUpShare(shareName, share) < 0 || !share) {
-    FILEINDEX_LOG("WEZOShareGet failed, share=%s", shareName.c_str());
-    return IndexRule::kShareUnreadable;
-  }
-  const IndexRule shareRule = ShareIndexRule(share.get());
-  if (shareRule != IndexRule::kIndexable) {
-    return shareRule;
-  }
-
-  // A volume mounted inside a share is refused, except on a share set up for encryption, whose
-  // own directory is such a mount. A share whose encryption setting cannot be read lets it through.
-  if (WEZOFSDirIsMntPoint(fullPath.c_str()) == 1) {
-    int encryption = 0;
-    if (WLIBShareIsEncryptionGet(share.get(), &encryption) == 0 && encryption == 0) {
-      FILEINDEX_LOG("Mount point[%s] is not allowed to be indexed", fullPath.c_str());
-      return IndexRule::kMountPoint;
-    }
-  }
-
-  // The folder must be exactly where it says: no symbolic link on the way, no trailing slash, no
-  // "." or ".." and no doubled slash; and it must exist.
-  char resolved[PATH_MAX];
-  if (realpath(fullPath.c_str(), resolved) == nullptr || fullPath != resolved) {
-    FILEINDEX_LOG("check realpath failed, path=%s", fullPath.c_str());
-    return IndexRule::kResolvesElsewhere;
-  }
-  return IndexRule::kIndexable;
-}
+IndexRule FullPathIndexRule(const std::string& fullPath) { return RuleOf(fullPath, nullptr); }
 
 bool CanFullPathBeIndexed(const std::string& fullPath) {
   return FullPathIndexRule(fullPath) == IndexRule::kIndexable;
