@@ -78,7 +78,8 @@ class BlockReader {
     }
     while (p < fill) {
       if (!m_indexed) {
-        index.Build(p, std::min(fill, p + LineIndex::kSpan), LineIndex::Kind::kNewlines);
+        index.Build(p, p + std::min<size_t>(fill - p, LineIndex::kSpan),
+                    LineIndex::Kind::kNewlines);
         m_indexed = true;
         i = 0;
       }
@@ -130,7 +131,7 @@ class BlockReader {
     while (p < fill) {
       if (!m_indexed || p >= index.End()) {
         // Up to the last "\n" of the stretch, so that every stop looked for is found in it.
-        const auto size = static_cast<size_t>(std::min(fill, p + LineIndex::kSpan) - p);
+        const size_t size = std::min<size_t>(fill - p, LineIndex::kSpan);
         const void* last = memrchr(p, '\n', size);
         if (last == nullptr) {
           m_indexed = false;
