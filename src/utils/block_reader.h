@@ -251,7 +251,7 @@ class BlockReader {
 
   LineIndex& Index() {
     if (!m_index) {
-      m_index.reset(new LineIndex);  // NOLINT(cppcoreguidelines-owning-memory): left uninitialised
+      m_index.reset(new LineIndex);  // NOLINT(modernize-make-unique): left uninitialised
     }
     return *m_index;
   }

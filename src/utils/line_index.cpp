@@ -66,7 +66,7 @@ uint64_t ScalarMask(const char* p) {
 template <Kind kKind>
 uint64_t Sse2Mask(const char* p) {
   uint64_t mask = 0;
-  for (unsigned int i = 0; i < 4; ++i) {
+  for (size_t i = 0; i < 4; ++i) {
     const __m128i v = _mm_loadu_si128(reinterpret_cast<const __m128i*>(p + 16 * i));
     __m128i hit = _mm_cmpeq_epi8(v, _mm_set1_epi8('\n'));
     if (kKind == Kind::kStops) {
