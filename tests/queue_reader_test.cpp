@@ -324,6 +324,50 @@ TEST_F(QueueReaderTest, PlainLinesWithOddCodesAnswerAsTheParser) {
   }
 }
 
+// The readers look at the buffer 64 bytes and 16 KiB at a time: lines that end at or across
+// those boundaries, odd or not, the last one with or without "\n", answer as the parser says.
+TEST_F(QueueReaderTest, LinesAtTheEdgesOfWhatIsLookedAtOnceAnswerAsTheParser) {
+  const std::string f = volume + "/photo/a";
+  const std::string probes[] = {
+      Ev("2", f + "/x"),
+      Ev("65536", f),
+      Ev("256", "/z", R"(,"path_old":")" + f + "/y\""),
+      R"({"event":2,"path":")" + f + R"("x"})",                // a quote inside the path
+      R"({"event":256,"path":"/z","path_old:"")" + f + "\"}",  // one quote of the name moved
+      R"({"event":256,"path":")" + f + R"(/","path_old":"/z"})",
+      Ev("2", f + "\\/x"),
+      R"({"ev\u0065nt":65536,"path":")" + f + "\"}",
+      Ev("65536", f, R"(,"data":"\\")"), Ev("65536", f) + "x"};
+  for (const std::string& probe : probes) {
+    QueueEvent e;
+    const bool isEvent = ParseQueueLine(probe.data(), probe.size(), e);
+    const bool inFolder =
+        isEvent && (StringStartWith(e.path + "/", f + "/") ||
+                    (e.event == 256 && StringStartWith(e.pathOld + "/", f + "/")));
+    const bool reindex = isEvent && e.event == 65536 && e.path == f;
+    // Its "\n" (or the file's end) at byte 63, 0 or 1 of a 64-byte chunk, or of a 16 KiB stretch.
+    for (const size_t at : {1023, 1024, 1025, 16383, 16384, 16385, 16400}) {
+      std::string text;
+      for (size_t left = at - probe.size(); left > 0;) {  // plain lines outside the folder
+        const size_t size = left <= 200 ? left : left - 200 >= 26 ? 200 : left - 26;
+        text += R"({"event":2,"path":"/v/)" + std::string(size - 25, 'x') + "\"}\n";
+        left -= size;
+      }
+      for (const char* end : {"\n", ""}) {
+        Queue(text + probe + end);
+        for (const size_t blockSize : {size_t{1} << 20, size_t{61}}) {
+          SCOPED_TRACE(probe + " at " + std::to_string(at) + end + " / " +
+                       std::to_string(blockSize));
+          std::vector<bool> found;
+          detail::QueueFoldersWithEvents({f}, queue, found, {blockSize, false});
+          EXPECT_EQ(found[0], inFolder);
+          EXPECT_EQ(detail::IsReindexQueued(f, queue, {blockSize, false}), reindex);
+        }
+      }
+    }
+  }
+}
+
 // The process reads only what was appended to the same file; a queue that the daemon replaced or
 // truncated and wrote again, at the same size too, is read again from its start.
 TEST_F(QueueReaderTest, RemembersWhatItReadOnlyWhileTheQueueIsTheSameFileWithTheSameBytes) {

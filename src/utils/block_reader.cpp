@@ -84,6 +84,7 @@ void BlockReader::Start() {
 size_t BlockReader::Compact(size_t from) {
   const size_t keep = from > kWindow ? from - kWindow : 0;
   if (keep > 0) {
+    m_indexed = false;
     std::memmove(m_buffer.get(), m_buffer.get() + keep, m_fill - keep);
     m_fill -= keep;
     m_pos -= std::min(m_pos, keep);

@@ -7,10 +7,12 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <memory>
 #include <string>
 #include <string_view>
 
+#include "utils/line_index.h"
 #include "utils/line_scanner.h"
 #include "utils/queue_reader.h"
 #include "utils/scan_bytes.h"
@@ -55,7 +57,54 @@ class BlockReader {
   // the file has nothing left. A read error ends the file where it happened.
   bool Next(ReadLine& line, size_t limit);
 
-  // What Skim's callback makes of a line.
+  // Hands the lines the buffer already holds, from where reading stands, to `take(index, i)`,
+  // line `i` of `index` (built of kNewlines), for as long as it takes them. `end` gets the
+  // offset after the last line taken. The line refused, and a line the buffer does not hold
+  // whole (or one longer than the index's span), are left for Next.
+  template <class F>
+  void SkimLines(F&& take, off_t& end) {
+    Start();
+    const char* const data = m_buffer.get();
+    const char* p = data + m_pos;
+    const char* const fill = data + m_fill;
+    LineIndex& index = Index();
+    // After Next read the line refused, the index still holds the lines after it.
+    size_t i = m_line;
+    const bool same = m_indexed && index.Built() == LineIndex::Kind::kNewlines;
+    if (same && m_line < index.Lines() && index.LineStart(m_line + 1) == p) {
+      ++i;
+    } else if (!(same && m_line < index.Lines() && index.LineStart(m_line) == p)) {
+      m_indexed = false;
+    }
+    while (p < fill) {
+      if (!m_indexed) {
+        index.Build(p, p + std::min<size_t>(fill - p, LineIndex::kSpan),
+                    LineIndex::Kind::kNewlines);
+        m_indexed = true;
+        i = 0;
+      }
+      const size_t lines = index.Lines();
+      while (i < lines && take(index, i)) {
+        ++i;
+      }
+      if (i < lines) {
+        m_line = i;
+        p = index.LineStart(i);
+        break;
+      }
+      m_indexed = false;  // all taken: on to the next stretch
+      if (lines == 0) {
+        break;
+      }
+      p = index.Newline(lines - 1) + 1;
+    }
+    if (p != data + m_pos) {
+      m_pos = static_cast<size_t>(p - data);
+      end = Offset(m_pos);
+    }
+  }
+
+  // What SkimPlain's callback makes of a line.
   enum class Take {
     kSkip,    // done with it, go on
     kStop,    // done with it, and with reading
@@ -63,19 +112,36 @@ class BlockReader {
   };
 
   // Hands the lines the buffer already holds, from where reading stands, to
-  // `take(begin, fill, newline)` for as long as it takes them: it sets `newline` to the "\n" that
-  // ends a line it takes. `end` gets the offset after the last line taken. The line refused, and
-  // a line the buffer does not hold whole, are left for Next. False when `take` asked to stop.
+  // `take(index, begin, newline)`, with `index` built of kStops over a stretch that ends with a
+  // "\n" after `begin`, for as long as it takes them: it sets `newline` to the "\n" that ends a
+  // line it takes. `end` gets the offset after the last line taken. The line refused, and a line
+  // the buffer does not hold whole (or one longer than the index's span), are left for Next.
+  // False when `take` asked to stop.
   template <class F>
-  bool Skim(F&& take, off_t& end) {
+  bool SkimPlain(F&& take, off_t& end) {
     Start();
-    const char* data = m_buffer.get();
+    const char* const data = m_buffer.get();
     const char* p = data + m_pos;
     const char* const fill = data + m_fill;
+    LineIndex& index = Index();
+    if (m_indexed && !(index.Built() == LineIndex::Kind::kStops && index.Begin() <= p)) {
+      m_indexed = false;
+    }
     bool stop = false;
     while (p < fill) {
+      if (!m_indexed || p >= index.End()) {
+        // Up to the last "\n" of the stretch, so that every stop looked for is found in it.
+        const size_t size = std::min<size_t>(fill - p, LineIndex::kSpan);
+        const void* last = memrchr(p, '\n', size);
+        if (last == nullptr) {
+          m_indexed = false;
+          break;
+        }
+        index.Build(p, static_cast<const char*>(last) + 1, LineIndex::Kind::kStops);
+        m_indexed = true;
+      }
       const char* newline = nullptr;
-      const Take verdict = take(p, fill, newline);
+      const Take verdict = take(index, p, newline);
       if (verdict == Take::kRefuse) {
         break;
       }
@@ -92,39 +158,40 @@ class BlockReader {
     return !stop;
   }
 
-  // A plain line (see Plain) at `p`, read straight from the buffer that holds bytes up to
-  // `fill`: returns the "\n" that ends it, or nullptr when the line is not plain or its end is
-  // not at hand.
-  static const char* PlainLine(const char* p, const char* fill, bool& moved, std::string_view& path,
-                               std::string_view& pathOld) {
-    if (Begins(p, fill, R"({"event":)")) {
+  // A plain line (see Plain) at `p`, in the stretch of `index` (built of kStops) that holds it:
+  // returns the "\n" that ends it, or nullptr when the line is not plain.
+  static const char* PlainLine(const LineIndex& index, const char* p, bool& moved,
+                               std::string_view& path, std::string_view& pathOld) {
+    const char* const end = index.End();
+    if (Begins(p, end, R"({"event":)")) {
       p += sizeof R"({"event":)" - 1;
-    } else if (Begins(p, fill, R"({"data":null,"event":)")) {
+    } else if (Begins(p, end, R"({"data":null,"event":)")) {
       p += sizeof R"({"data":null,"event":)" - 1;
     } else {
       return nullptr;
     }
-    const size_t n = LeadingDigits(p, fill);
-    if (n == 0 || n > 10 || !DigitsFit(p, n) || !Begins(p + n, fill, R"(,"path":")")) {
+    const size_t n = LeadingDigits(p, end);
+    if (n == 0 || n > 10 || !DigitsFit(p, n) || !Begins(p + n, end, R"(,"path":")")) {
       return nullptr;
     }
     moved = DigitsAre(p, n, "256");
     p += n + sizeof R"(,"path":")" - 1;
-    const char* quote = FindAny(p, fill, '"', '\\', '\n');
-    if (quote == fill || *quote != '"') {
+    // The stretch ends with a "\n": a stop is found, and the byte after a quote is in it.
+    const char* quote = index.NextStop(p);
+    if (*quote != '"') {
       return nullptr;
     }
     path = std::string_view(p, static_cast<size_t>(quote - p));
     pathOld = std::string_view();
-    if (Begins(quote, fill, R"(","path_old":")")) {
+    if (Begins(quote, end, R"(","path_old":")")) {
       p = quote + sizeof R"(","path_old":")" - 1;
-      quote = FindAny(p, fill, '"', '\\', '\n');
-      if (quote == fill || *quote != '"') {
+      quote = index.NextStop(p);
+      if (*quote != '"') {
         return nullptr;
       }
       pathOld = std::string_view(p, static_cast<size_t>(quote - p));
     }
-    if (fill - quote < 3 || quote[1] != '}' || quote[2] != '\n') {
+    if (quote[1] != '}' || quote[2] != '\n') {
       return nullptr;
     }
     return quote + 2;
@@ -182,6 +249,13 @@ class BlockReader {
 
   off_t Offset(size_t at) const { return m_base + static_cast<off_t>(at); }
 
+  LineIndex& Index() {
+    if (!m_index) {
+      m_index.reset(new LineIndex);  // NOLINT(modernize-make-unique): left uninitialised
+    }
+    return *m_index;
+  }
+
   // Before the first line: the bytes read only for the window are passed over.
   void Start();
   // Moves the bytes from `kWindow` before `from` to the front; returns how far they moved.
@@ -203,6 +277,9 @@ class BlockReader {
   bool m_eof = false;
   bool m_lineEnded = false;
   bool m_onlyReindex = false;
+  std::unique_ptr<LineIndex> m_index;  // made at the first skim
+  bool m_indexed = false;              // m_index describes the buffer as it is
+  size_t m_line = 0;                   // the line of m_index that SkimLines stopped at
   std::string m_head;
   std::string m_logHead;
 };

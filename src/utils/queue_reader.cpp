@@ -35,7 +35,6 @@ namespace FILEINDEX {
 namespace {
 
 using detail::BlockReader;
-using detail::FindAny;
 using detail::FolderSet;
 using detail::Hash;
 using detail::kWindow;
@@ -262,8 +261,8 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
     bool moved = false;
     std::string_view path;
     std::string_view pathOld;
-    const auto test = [&](const char* begin, const char* fill, const char*& newline) {
-      newline = BlockReader::PlainLine(begin, fill, moved, path, pathOld);
+    const auto test = [&](const detail::LineIndex& index, const char* begin, const char*& newline) {
+      newline = BlockReader::PlainLine(index, begin, moved, path, pathOld);
       if (newline == nullptr) {
         return BlockReader::Take::kRefuse;
       }
@@ -275,7 +274,7 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
       lastEnded = true;
       return left > 0 ? BlockReader::Take::kSkip : BlockReader::Take::kStop;
     };
-    while (left > 0 && reader->Skim(test, end) && reader->Next(line, set.Limit())) {
+    while (left > 0 && reader->SkimPlain(test, end) && reader->Next(line, set.Limit())) {
       marks.clear();
       if (!line.isEvent) {
         if (line.stop > quietUpTo) {
@@ -399,15 +398,11 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile,
   bool queued = false;
   off_t end = have ? entry.file.offset : 0;
   // Plain lines with another code are passed over in bulk.
-  const auto other = [](const char* begin, const char* fill, const char*& newline) {
-    if (!BlockReader::OtherCode(begin, fill)) {
-      return BlockReader::Take::kRefuse;
-    }
-    newline = FindAny(begin, fill, '\n', '\n', '\n');
-    return newline != fill ? BlockReader::Take::kSkip : BlockReader::Take::kRefuse;
+  const auto other = [](const detail::LineIndex& lines, size_t i) {
+    return BlockReader::OtherCode(lines.LineStart(i), lines.Newline(i));
   };
   while (!queued) {
-    reader.Skim(other, end);
+    reader.SkimLines(other, end);
     if (!reader.Next(line, limit)) {
       break;
     }

@@ -1,5 +1,5 @@
-// Byte-level helpers of the queue readers: searches sized for short lines, decimal codes told by
-// their digits, and the hash that checks a file's bytes are unchanged.
+// Byte-level helpers of the queue readers: decimal codes told by their digits, and the hash that
+// checks a file's bytes are unchanged.
 #ifndef FILEINDEX_SRC_UTILS_SCAN_BYTES_H_
 #define FILEINDEX_SRC_UTILS_SCAN_BYTES_H_
 
@@ -16,41 +16,6 @@
 namespace WEZO {
 namespace FILEINDEX {
 namespace detail {
-
-// The first of the bytes `a`, `b` and `c` in [p, end), or `end`. Lines are short: a library
-// search would spend more on setting up than on searching.
-inline const char* FindAny(const char* p, const char* end, char a, char b, char c) {
-#if defined(__SSE2__)
-  const __m128i va = _mm_set1_epi8(a);
-  const __m128i vb = _mm_set1_epi8(b);
-  const __m128i vc = _mm_set1_epi8(c);
-  const auto hits = [&va, &vb, &vc](const char* at) {
-    const __m128i v = _mm_loadu_si128(reinterpret_cast<const __m128i*>(at));
-    const __m128i hit = _mm_or_si128(_mm_or_si128(_mm_cmpeq_epi8(v, va), _mm_cmpeq_epi8(v, vb)),
-                                     _mm_cmpeq_epi8(v, vc));
-    return static_cast<unsigned int>(_mm_movemask_epi8(hit));
-  };
-  // 32 bytes a step: most lines end within a step or two.
-  while (end - p >= 32) {
-    const unsigned int mask = hits(p) | (hits(p + 16) << 16);
-    if (mask != 0) {
-      return p + __builtin_ctz(mask);
-    }
-    p += 32;
-  }
-  if (end - p >= 16) {
-    const unsigned int mask = hits(p);
-    if (mask != 0) {
-      return p + __builtin_ctz(mask);
-    }
-    p += 16;
-  }
-#endif
-  while (p != end && *p != a && *p != b && *p != c) {
-    ++p;
-  }
-  return p;
-}
 
 // The plain readers tell these codes by their digits.
 static_assert(kEventMoved == 256 && kEventReindex == 65536, "codes told by their digits");
