@@ -12,10 +12,9 @@ namespace {
 // Where the next component of `path` that begins at `pos` ends: at a "/" before `scan` bytes, or
 // at `size` when `size` is no more than `most`; `std::string_view::npos` otherwise.
 size_t NextEnd(const char* path, size_t pos, size_t scan, size_t size, size_t most) {
-  if (pos < scan) {
-    const void* slash = std::memchr(path + pos, '/', scan - pos);
-    if (slash != nullptr) {
-      return static_cast<size_t>(static_cast<const char*>(slash) - path);
+  for (; pos < scan; ++pos) {  // components are short
+    if (path[pos] == '/') {
+      return pos;
     }
   }
   return size <= most ? size : std::string_view::npos;
@@ -89,11 +88,25 @@ void FolderSet::Build() {
   }
   m_table.assign(slots, Slot{});
   const size_t common = m_common.size();
+  m_pairs.assign(size_t{1} << 10, 0);
+  const auto pair = [this](unsigned char first, unsigned char second) {
+    const size_t at = first << 8 | second;
+    m_pairs[at >> 6] |= uint64_t{1} << (at & 63);
+  };
   for (size_t g = 0; g < m_groups.size(); ++g) {
     if (!m_groups[g].left) {
       continue;
     }
     const std::string_view path = m_groups[g].path;
+    // A path in the folder has "/" or its end where the folder's path ends.
+    if (path.size() == common) {
+      for (unsigned int second = 0; second < 256; ++second) {
+        pair('/', static_cast<unsigned char>(second));
+      }
+    } else {
+      pair(static_cast<unsigned char>(path[common]),
+           static_cast<unsigned char>(common + 1 < path.size() ? path[common + 1] : '/'));
+    }
     size_t parent = 0;
     for (size_t pos = common;;) {
       const size_t end = NextEnd(path.data(), pos, path.size(), path.size(), path.size());
@@ -136,8 +149,9 @@ size_t FolderSet::Find(size_t parent, const char* path, size_t size, bool add) {
   return m_nodes.size() - 1;
 }
 
-size_t FolderSet::MarkIn(std::string_view path, size_t fullSize, const std::vector<bool>& asked,
-                         std::vector<bool>& found, std::vector<size_t>& marks) {
+size_t FolderSet::MarkIn(std::string_view path, size_t fullSize, bool in,
+                         const std::vector<bool>& asked, std::vector<bool>& found,
+                         std::vector<size_t>& marks) {
   size_t marked = 0;
   size_t newly = 0;
   const auto mark = [&](size_t f) {
@@ -149,7 +163,7 @@ size_t FolderSet::MarkIn(std::string_view path, size_t fullSize, const std::vect
   };
   // Walk the path's components from the common start down the nodes, while some folder is left
   // under the one reached.
-  if (fullSize >= m_minSize && InCommon(path)) {
+  if (in) {
     const size_t scan = std::min(fullSize, m_maxSize + 1);
     size_t parent = 0;
     for (size_t pos = m_common.size();;) {

@@ -31,19 +31,52 @@ class FolderSet {
   size_t Mark(std::string_view path, size_t fullSize, const std::vector<bool>& asked,
               std::vector<bool>& found, std::vector<size_t>& marks) {
     // Most paths are too short for every folder left, or do not begin with their common start.
-    if (m_odd.empty() && (fullSize < m_minSize || !InCommon(path))) {
+    const bool in = fullSize >= m_minSize && InCommon(path) && PairLeft(path);
+    if (!in && m_odd.empty()) {
       return 0;
     }
-    return MarkIn(path, fullSize, asked, found, marks);
+    return MarkIn(path, fullSize, in, asked, found, marks);
   }
 
  private:
   // A path that begins as the folders' common start; siblings differ near its end, so its last
-  // byte is looked at first. The path has at least m_minSize bytes.
+  // eight bytes are looked at first. The path has at least m_minSize bytes.
   bool InCommon(std::string_view path) const {
+    size_t n = m_common.size();
+    const char* a = path.data();
+    const char* b = m_common.data();
+    if (n < sizeof(uint64_t)) {
+      for (size_t i = 0; i < n; ++i) {
+        if (a[i] != b[i]) {
+          return false;
+        }
+      }
+      return true;
+    }
+    if (Load(a + n - sizeof(uint64_t)) != Load(b + n - sizeof(uint64_t))) {
+      return false;
+    }
+    for (; n > sizeof(uint64_t);
+         n -= sizeof(uint64_t), a += sizeof(uint64_t), b += sizeof(uint64_t)) {
+      if (Load(a) != Load(b)) {
+        return false;
+      }
+    }
+    return true;
+  }
+  // Whether the two bytes after the common start ("/" past the end) can begin a folder left.
+  bool PairLeft(std::string_view path) const {
     const size_t common = m_common.size();
-    return common == 0 || (path[common - 1] == m_common[common - 1] &&
-                           std::memcmp(path.data(), m_common.data(), common - 1) == 0);
+    const auto first = static_cast<unsigned char>(common < path.size() ? path[common] : '/');
+    const auto second =
+        static_cast<unsigned char>(common + 1 < path.size() ? path[common + 1] : '/');
+    const size_t pair = first << 8 | second;
+    return (m_pairs[pair >> 6] >> (pair & 63) & 1) != 0;
+  }
+  static uint64_t Load(const char* at) {
+    uint64_t word;
+    std::memcpy(&word, at, sizeof word);
+    return word;
   }
 
   // Folders with the same path.
@@ -79,7 +112,8 @@ class FolderSet {
            0xBF58476D1CE4E5B9ULL;
   }
 
-  size_t MarkIn(std::string_view path, size_t fullSize, const std::vector<bool>& asked,
+  // `in`: the path is long enough and begins with the common start.
+  size_t MarkIn(std::string_view path, size_t fullSize, bool in, const std::vector<bool>& asked,
                 std::vector<bool>& found, std::vector<size_t>& marks);
   // Builds the nodes and their table for the groups left.
   void Build();
@@ -88,16 +122,17 @@ class FolderSet {
   static bool HoldsOdd(const std::string& folder, std::string_view path, size_t fullSize);
 
   const std::vector<std::string>& m_paths;
-  std::vector<Group> m_groups;  // the folders without a NUL, by path
-  std::vector<size_t> m_odd;    // the folders with a NUL, not found yet
-  std::vector<Node> m_nodes;    // the common start first
-  std::vector<Slot> m_table;    // open addressing on Key; at most half full
-  unsigned int m_shift = 61;    // a key's top bits choose its slot
-  size_t m_left = 0;            // groups left
-  size_t m_built = 0;           // groups left when the nodes were built
-  std::string m_common;         // what all groups left begin with
-  size_t m_minSize = 0;         // the shortest path of a group left
-  size_t m_maxSize = 0;         // the longest path of a folder left, at most
+  std::vector<Group> m_groups;    // the folders without a NUL, by path
+  std::vector<size_t> m_odd;      // the folders with a NUL, not found yet
+  std::vector<Node> m_nodes;      // the common start first
+  std::vector<Slot> m_table;      // open addressing on Key; at most half full
+  std::vector<uint64_t> m_pairs;  // a bit for each pair of bytes that begins a folder left
+  unsigned int m_shift = 61;      // a key's top bits choose its slot
+  size_t m_left = 0;              // groups left
+  size_t m_built = 0;             // groups left when the nodes were built
+  std::string m_common;           // what all groups left begin with
+  size_t m_minSize = 0;           // the shortest path of a group left
+  size_t m_maxSize = 0;           // the longest path of a folder left, at most
 };
 
 }  // namespace detail
