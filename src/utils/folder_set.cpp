@@ -78,7 +78,12 @@ void FolderSet::Build() {
     m_common.resize(same);
     m_minSize = std::min(m_minSize, path.size());
     m_maxSize = std::max(m_maxSize, path.size());
-    bound += 1 + static_cast<size_t>(std::count(path.begin(), path.end(), '/'));
+  }
+  for (const Group& group : m_groups) {
+    if (group.left) {
+      bound += 1 + static_cast<size_t>(
+                       std::count(group.path.begin() + m_common.size(), group.path.end(), '/'));
+    }
   }
   size_t slots = 8;
   m_shift = 61;
@@ -88,25 +93,15 @@ void FolderSet::Build() {
   }
   m_table.assign(slots, Slot{});
   const size_t common = m_common.size();
-  m_pairs.assign(size_t{1} << 10, 0);
-  const auto pair = [this](unsigned char first, unsigned char second) {
-    const size_t at = first << 8 | second;
-    m_pairs[at >> 6] |= uint64_t{1} << (at & 63);
-  };
+  m_starts.assign((size_t{1} << kStartBits) / 64, 0);
   for (size_t g = 0; g < m_groups.size(); ++g) {
     if (!m_groups[g].left) {
       continue;
     }
     const std::string_view path = m_groups[g].path;
-    // A path in the folder has "/" or its end where the folder's path ends.
-    if (path.size() == common) {
-      for (unsigned int second = 0; second < 256; ++second) {
-        pair('/', static_cast<unsigned char>(second));
-      }
-    } else {
-      pair(static_cast<unsigned char>(path[common]),
-           static_cast<unsigned char>(common + 1 < path.size() ? path[common + 1] : '/'));
-    }
+    // A path in the folder has the same bytes up to the "/" or the end where the folder ends.
+    const uint64_t start = Start(path, common);
+    m_starts[start >> 6] |= uint64_t{1} << (start & 63);
     size_t parent = 0;
     for (size_t pos = common;;) {
       const size_t end = NextEnd(path.data(), pos, path.size(), path.size(), path.size());
@@ -119,6 +114,15 @@ void FolderSet::Build() {
       pos = end + 1;
     }
   }
+}
+
+uint64_t FolderSet::StartOfShort(std::string_view path, size_t from) {
+  uint64_t word = 0;
+  for (size_t i = 0; i < sizeof word; ++i) {
+    const char c = from + i < path.size() ? path[from + i] : '/';
+    word |= uint64_t{static_cast<unsigned char>(c)} << (8 * i);
+  }
+  return word;
 }
 
 size_t FolderSet::Find(size_t parent, const char* path, size_t size, bool add) {

@@ -31,7 +31,7 @@ class FolderSet {
   size_t Mark(std::string_view path, size_t fullSize, const std::vector<bool>& asked,
               std::vector<bool>& found, std::vector<size_t>& marks) {
     // Most paths are too short for every folder left, or do not begin with their common start.
-    const bool in = fullSize >= m_minSize && InCommon(path) && PairLeft(path);
+    const bool in = fullSize >= m_minSize && InCommon(path) && StartLeft(path);
     if (!in && m_odd.empty()) {
       return 0;
     }
@@ -64,15 +64,34 @@ class FolderSet {
     }
     return true;
   }
-  // Whether the two bytes after the common start ("/" past the end) can begin a folder left.
-  bool PairLeft(std::string_view path) const {
-    const size_t common = m_common.size();
-    const auto first = static_cast<unsigned char>(common < path.size() ? path[common] : '/');
-    const auto second =
-        static_cast<unsigned char>(common + 1 < path.size() ? path[common + 1] : '/');
-    const size_t pair = first << 8 | second;
-    return (m_pairs[pair >> 6] >> (pair & 63) & 1) != 0;
+  // Whether the eight bytes after the common start, up to the first "/" (that ends what is past
+  // the path's end), can begin a folder left; a bit for each begin, by its hash.
+  bool StartLeft(std::string_view path) const {
+    const uint64_t start = Start(path, m_common.size());
+    return (m_starts[start >> 6] >> (start & 63) & 1) != 0;
   }
+  static uint64_t Start(std::string_view path, size_t from) {
+    uint64_t word = 0;
+    if (path.size() >= from + sizeof word) {
+      for (size_t i = 0; i < sizeof word; ++i) {  // one load where bytes are little-endian
+        word |= uint64_t{static_cast<unsigned char>(path[from + i])} << (8 * i);
+      }
+    } else {
+      word = StartOfShort(path, from);
+    }
+    // A byte of 0 where the word has "/"; the bytes after the first one are left out.
+    constexpr uint64_t kOnes = 0x0101010101010101ULL;
+    constexpr uint64_t kLow = 0x7F7F7F7F7F7F7F7FULL;
+    const uint64_t other = word ^ ('/' * kOnes);
+    const uint64_t slash = ~(((other & kLow) + kLow) | other | kLow);
+    if (slash != 0) {
+      const unsigned int last = static_cast<unsigned int>(__builtin_ctzll(slash));
+      word &= last == 63 ? ~uint64_t{0} : (uint64_t{1} << (last + 1)) - 1;
+    }
+    return (word * 0x9E3779B97F4A7C15ULL) >> (64 - kStartBits);
+  }
+  static uint64_t StartOfShort(std::string_view path, size_t from);
+  static constexpr unsigned int kStartBits = 16;
   static uint64_t Load(const char* at) {
     uint64_t word;
     std::memcpy(&word, at, sizeof word);
@@ -122,17 +141,17 @@ class FolderSet {
   static bool HoldsOdd(const std::string& folder, std::string_view path, size_t fullSize);
 
   const std::vector<std::string>& m_paths;
-  std::vector<Group> m_groups;    // the folders without a NUL, by path
-  std::vector<size_t> m_odd;      // the folders with a NUL, not found yet
-  std::vector<Node> m_nodes;      // the common start first
-  std::vector<Slot> m_table;      // open addressing on Key; at most half full
-  std::vector<uint64_t> m_pairs;  // a bit for each pair of bytes that begins a folder left
-  unsigned int m_shift = 61;      // a key's top bits choose its slot
-  size_t m_left = 0;              // groups left
-  size_t m_built = 0;             // groups left when the nodes were built
-  std::string m_common;           // what all groups left begin with
-  size_t m_minSize = 0;           // the shortest path of a group left
-  size_t m_maxSize = 0;           // the longest path of a folder left, at most
+  std::vector<Group> m_groups;     // the folders without a NUL, by path
+  std::vector<size_t> m_odd;       // the folders with a NUL, not found yet
+  std::vector<Node> m_nodes;       // the common start first
+  std::vector<Slot> m_table;       // open addressing on Key; at most half full
+  std::vector<uint64_t> m_starts;  // the hashes of how folders left begin, see StartLeft
+  unsigned int m_shift = 61;       // a key's top bits choose its slot
+  size_t m_left = 0;               // groups left
+  size_t m_built = 0;              // groups left when the nodes were built
+  std::string m_common;            // what all groups left begin with
+  size_t m_minSize = 0;            // the shortest path of a group left
+  size_t m_maxSize = 0;            // the longest path of a folder left, at most
 };
 
 }  // namespace detail
