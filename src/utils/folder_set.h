@@ -73,9 +73,10 @@ class FolderSet {
   static uint64_t Start(std::string_view path, size_t from) {
     uint64_t word = 0;
     if (path.size() >= from + sizeof word) {
-      for (size_t i = 0; i < sizeof word; ++i) {  // one load where bytes are little-endian
-        word |= uint64_t{static_cast<unsigned char>(path[from + i])} << (8 * i);
-      }
+      std::memcpy(&word, path.data() + from, sizeof word);
+#if defined(__BYTE_ORDER__) && __BYTE_ORDER__ == __ORDER_BIG_ENDIAN__
+      word = __builtin_bswap64(word);  // the first byte lowest
+#endif
     } else {
       word = StartOfShort(path, from);
     }
@@ -84,10 +85,8 @@ class FolderSet {
     constexpr uint64_t kLow = 0x7F7F7F7F7F7F7F7FULL;
     const uint64_t other = word ^ ('/' * kOnes);
     const uint64_t slash = ~(((other & kLow) + kLow) | other | kLow);
-    if (slash != 0) {
-      const unsigned int last = static_cast<unsigned int>(__builtin_ctzll(slash));
-      word &= last == 63 ? ~uint64_t{0} : (uint64_t{1} << (last + 1)) - 1;
-    }
+    const uint64_t first = slash & (~slash + 1);  // its top bit; 0 for none
+    word &= (first << 1) - 1;                     // all bytes for none, or for the last
     return (word * 0x9E3779B97F4A7C15ULL) >> (64 - kStartBits);
   }
   static uint64_t StartOfShort(std::string_view path, size_t from);
