@@ -30,7 +30,8 @@ class FolderSet {
   // returns how many of those marked anew are `asked`.
   size_t Mark(std::string_view path, size_t fullSize, const std::vector<bool>& asked,
               std::vector<bool>& found, std::vector<size_t>& marks) {
-    // Most paths are too short for every folder left, or do not begin with their common start.
+    // Most paths are too short for every folder left, do not begin with their common start or
+    // go on from it as none of them does.
     const bool in = fullSize >= m_minSize && InCommon(path) && StartLeft(path);
     if (!in && m_odd.empty()) {
       return 0;
