@@ -2,6 +2,7 @@
 #ifndef FILEINDEX_SRC_UTILS_FOLDER_SET_H_
 #define FILEINDEX_SRC_UTILS_FOLDER_SET_H_
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
@@ -32,7 +33,7 @@ class FolderSet {
               std::vector<bool>& found, std::vector<size_t>& marks) {
     // Most paths are too short for every folder left, do not begin with their common start or
     // go on from it as none of them does.
-    const bool in = fullSize >= m_minSize && InCommon(path) && StartLeft(path);
+    const bool in = fullSize >= m_minSize && EndsCommon(path) && StartLeft(path) && InCommon(path);
     if (!in && m_odd.empty()) {
       return 0;
     }
@@ -40,28 +41,25 @@ class FolderSet {
   }
 
  private:
-  // A path that begins as the folders' common start; siblings differ near its end, so its last
-  // eight bytes are looked at first. The path has at least m_minSize bytes.
+  // Whether the path may begin as the folders' common start: its last eight bytes, where
+  // siblings differ, or all of a shorter one. The path has at least m_minSize bytes.
+  bool EndsCommon(std::string_view path) const {
+    const size_t n = m_common.size();
+    if (n < sizeof(uint64_t)) {
+      return std::equal(m_common.begin(), m_common.end(), path.begin());
+    }
+    return Load(path.data() + n - sizeof(uint64_t)) == Load(m_common.data() + n - sizeof(uint64_t));
+  }
+  // Whether it does, once EndsCommon said so: the rest a word at a time.
   bool InCommon(std::string_view path) const {
-    size_t n = m_common.size();
     const char* a = path.data();
     const char* b = m_common.data();
-    if (n < sizeof(uint64_t)) {
-      for (size_t i = 0; i < n; ++i) {
-        if (a[i] != b[i]) {
-          return false;
-        }
-      }
-      return true;
-    }
-    if (Load(a + n - sizeof(uint64_t)) != Load(b + n - sizeof(uint64_t))) {
-      return false;
-    }
-    for (; n > sizeof(uint64_t);
-         n -= sizeof(uint64_t), a += sizeof(uint64_t), b += sizeof(uint64_t)) {
+    for (size_t n = m_common.size(); n > sizeof(uint64_t); n -= sizeof(uint64_t)) {
       if (Load(a) != Load(b)) {
         return false;
       }
+      a += sizeof(uint64_t);
+      b += sizeof(uint64_t);
     }
     return true;
   }
