@@ -79,13 +79,13 @@ class FolderSet {
     } else {
       word = StartOfShort(path, from);
     }
-    // A byte of 0 where the word has "/"; the bytes after the first one are left out.
+    // `slash` has the top bit of each byte that is "/"; the bytes after the first are left out.
     constexpr uint64_t kOnes = 0x0101010101010101ULL;
     constexpr uint64_t kLow = 0x7F7F7F7F7F7F7F7FULL;
-    const uint64_t other = word ^ ('/' * kOnes);
+    const uint64_t other = word ^ ('/' * kOnes);  // 0 where "/"
     const uint64_t slash = ~(((other & kLow) + kLow) | other | kLow);
-    const uint64_t first = slash & (~slash + 1);  // its top bit; 0 for none
-    word &= (first << 1) - 1;                     // all bytes for none, or for the last
+    const uint64_t first = slash & (~slash + 1);  // the first one's bit; 0 for none
+    word &= (first << 1) - 1;                     // all bytes when none or the last is "/"
     return (word * 0x9E3779B97F4A7C15ULL) >> (64 - kStartBits);
   }
   static uint64_t StartOfShort(std::string_view path, size_t from);
