@@ -254,7 +254,7 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
   off_t end = from;
   std::unique_ptr<BlockReader> reader;
   if (left > 0) {
-    const FolderSet set(wanted);
+    FolderSet set(wanted, wantedFound);
     reader = std::make_unique<BlockReader>(fd, from, options.blockSize);
     ReadLine line;
     // Plain lines are tested straight from the buffer.
