@@ -9,12 +9,10 @@
 #include <limits>
 #include <memory>
 #include <string>
-#include <vector>
 
 #include "config/folder_page.h"
 #include "config/snapshot.h"
 #include "fileindex/error.h"
-#include "fileindex/folders.h"
 #include "fileindex/status.h"
 #include "status_mgr/progress.h"
 #include "status_mgr/status_change.h"
@@ -87,17 +85,8 @@ bool StatusMgr::GetStatus(std::string& status) {
   if (!snapshot->HoldsUnnamedFolder() || snapshot->Document() == nullptr) {
     return OverallProgress(snapshot->Paths(), status);
   }
-  Folders list;
-  std::vector<Folder> folders;
-  if (!list.Load() || !list.List(folders)) {
-    return false;
-  }
-  std::vector<std::string> paths;
-  paths.reserve(folders.size());
-  for (const Folder& folder : folders) {
-    paths.push_back(folder.GetPath());
-  }
-  return OverallProgress(paths, status);
+  const std::shared_ptr<const FolderSnapshot> loaded = LoadFolderList();
+  return loaded != nullptr && OverallProgress(loaded->Paths(), status);
 }
 
 std::string StatusMgr::GetFolderStatus(const std::string& path) {

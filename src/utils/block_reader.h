@@ -158,16 +158,24 @@ class BlockReader {
     return !stop;
   }
 
+  // Where the code begins in a line at `p` that begins as the writers begin theirs,
+  // {"event": or, the library's reindex events, {"data":null,"event":; nullptr for another line.
+  static const char* AfterCodeName(const char* p, const char* end) {
+    static constexpr char kEvent[] = R"({"event":)";
+    static constexpr char kNullData[] = R"({"data":null,"event":)";
+    if (Begins(p, end, kEvent)) {
+      return p + sizeof kEvent - 1;
+    }
+    return Begins(p, end, kNullData) ? p + sizeof kNullData - 1 : nullptr;
+  }
+
   // A plain line (see Plain) at `p`, in the stretch of `index` (built of kStops) that holds it:
   // returns the "\n" that ends it, or nullptr when the line is not plain.
   static const char* PlainLine(const LineIndex& index, const char* p, bool& moved,
                                std::string_view& path, std::string_view& pathOld) {
     const char* const end = index.End();
-    if (Begins(p, end, R"({"event":)")) {
-      p += sizeof R"({"event":)" - 1;
-    } else if (Begins(p, end, R"({"data":null,"event":)")) {
-      p += sizeof R"({"data":null,"event":)" - 1;
-    } else {
+    p = AfterCodeName(p, end);
+    if (p == nullptr) {
       return nullptr;
     }
     const size_t n = LeadingDigits(p, end);
@@ -224,11 +232,8 @@ class BlockReader {
   // Whether a line surely is no reindex event because it begins as a plain line with another
   // code: valid or not, it cannot be one.
   static bool OtherCode(const char* p, const char* end) {
-    if (Begins(p, end, R"({"event":)")) {
-      p += sizeof R"({"event":)" - 1;
-    } else if (Begins(p, end, R"({"data":null,"event":)")) {
-      p += sizeof R"({"data":null,"event":)" - 1;
-    } else {
+    p = AfterCodeName(p, end);
+    if (p == nullptr) {
       return false;
     }
     const size_t n = LeadingDigits(p, end);
