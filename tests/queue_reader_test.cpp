@@ -7,12 +7,14 @@
 #include <algorithm>
 #include <fstream>
 #include <functional>
+#include <memory>
 #include <random>
 #include <sstream>
 
 #include "fileindex/utils.h"
 #include "test_support.h"
 #include "utils/folder_set.h"
+#include "utils/line_index.h"
 
 namespace WEZO::FILEINDEX {
 namespace {
@@ -338,7 +340,8 @@ TEST_F(QueueReaderTest, LinesAtTheEdgesOfWhatIsLookedAtOnceAnswerAsTheParser) {
       R"({"event":256,"path":")" + f + R"(/","path_old":"/z"})",
       Ev("2", f + "\\/x"),
       R"({"ev\u0065nt":65536,"path":")" + f + "\"}",
-      Ev("65536", f, R"(,"data":"\\")"), Ev("65536", f) + "x"};
+      Ev("65536", f, R"(,"data":"\\")"),
+      Ev("65536", f) + "x"};
   for (const std::string& probe : probes) {
     QueueEvent e;
     const bool isEvent = ParseQueueLine(probe.data(), probe.size(), e);
@@ -490,6 +493,42 @@ TEST(FolderSetTest, MarksAsThePathLiesInTheFolderWhileFoldersAreFound) {
     std::string after;
     for (const bool f : found) after += f ? '1' : '0';
     EXPECT_EQ(after, row.after) << row.folders[0];
+  }
+}
+
+// A stretch's index against a reading byte by byte: every "\n" in order, and from every byte the
+// next stop, for stretches ending before, at and after the 64-byte steps, stops often adjacent.
+TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
+  std::mt19937 rng(7);
+  static constexpr char kBytes[] = "ab\"\\\n/{}";
+  std::string bytes(600, 'x');
+  for (char& c : bytes) {
+    c = kBytes[rng() % (sizeof kBytes - 1)];
+  }
+  const auto index = std::make_unique<detail::LineIndex>();
+  for (const size_t size : {1, 63, 64, 65, 127, 128, 200, 600}) {
+    SCOPED_TRACE(size);
+    const char* const begin = bytes.data();
+    const char* const end = begin + size;
+    index->Build(begin, end, detail::LineIndex::Kind::kNewlines);
+    std::vector<const char*> newlines;
+    for (const char* p = begin; p != end; ++p) {
+      if (*p == '\n') {
+        newlines.push_back(p);
+      }
+    }
+    ASSERT_EQ(index->Lines(), newlines.size());
+    for (size_t i = 0; i < newlines.size(); ++i) {
+      EXPECT_EQ(index->Newline(i), newlines[i]) << i;
+    }
+    index->Build(begin, end, detail::LineIndex::Kind::kStops);
+    const char* next = nullptr;  // asked only where a stop follows
+    for (const char* p = end; p-- != begin;) {
+      next = *p == '"' || *p == '\\' || *p == '\n' ? p : next;
+      if (next != nullptr) {
+        EXPECT_EQ(index->NextStop(p), next) << p - begin;
+      }
+    }
   }
 }
 
