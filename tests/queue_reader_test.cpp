@@ -506,10 +506,22 @@ TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
     c = kBytes[rng() % (sizeof kBytes - 1)];
   }
   const auto index = std::make_unique<detail::LineIndex>();
-  for (const size_t size : {1, 63, 64, 65, 127, 128, 200, 600}) {
-    SCOPED_TRACE(size);
+  for (const auto& [baseline, size] : {std::pair{false, 1},
+                                       {false, 63},
+                                       {false, 64},
+                                       {false, 65},
+                                       {false, 200},
+                                       {false, 600},
+                                       {true, 1},
+                                       {true, 63},
+                                       {true, 64},
+                                       {true, 65},
+                                       {true, 200},
+                                       {true, 600}}) {
+    SCOPED_TRACE(testing::Message() << size << (baseline ? " baseline" : ""));
+    detail::UseBaselineLineIndex(baseline);
     const char* const begin = bytes.data();
-    const char* const end = begin + size;
+    const char* const end = begin + static_cast<size_t>(size);
     index->Build(begin, end, detail::LineIndex::Kind::kNewlines);
     std::vector<const char*> newlines;
     for (const char* p = begin; p != end; ++p) {
@@ -530,6 +542,7 @@ TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
       }
     }
   }
+  detail::UseBaselineLineIndex(false);
 }
 
 }  // namespace

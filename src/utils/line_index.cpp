@@ -5,6 +5,7 @@
 #define FILEINDEX_LINE_INDEX_X86 1
 #endif
 
+#include <atomic>
 #include <cstring>
 
 namespace WEZO {
@@ -152,7 +153,11 @@ bool HasAvx2() {
 }
 #endif
 
+std::atomic<bool> g_baselineOnly{false};
+
 }  // namespace
+
+void UseBaselineLineIndex(bool baseline) { g_baselineOnly = baseline; }
 
 void LineIndex::Build(const char* begin, const char* end, Kind kind) {
   m_begin = begin;
@@ -160,7 +165,7 @@ void LineIndex::Build(const char* begin, const char* end, Kind kind) {
   m_kind = kind;
   const auto size = static_cast<size_t>(end - begin);
 #if defined(FILEINDEX_LINE_INDEX_X86)
-  if (HasAvx2()) {
+  if (HasAvx2() && !g_baselineOnly.load(std::memory_order_relaxed)) {
     kind == Kind::kStops ? BuildAvx2<Kind::kStops>(*this, begin, size)
                          : BuildAvx2<Kind::kNewlines>(*this, begin, size);
     return;

@@ -65,6 +65,10 @@ class LineIndex {
 
 static_assert(LineIndex::kSpan <= 65536, "positions fit 16 bits");
 
+// With `baseline`, every index is built as on a processor without AVX2 (for the tests: both
+// builds must find the same).
+void UseBaselineLineIndex(bool baseline);
+
 }  // namespace detail
 }  // namespace FILEINDEX
 }  // namespace WEZO
