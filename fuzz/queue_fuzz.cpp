@@ -5,8 +5,9 @@
 // asked about is the same location as a share path. Both readers must answer exactly as the
 // reference below, read plainly and through what the process remembers, with the file's second
 // part appended between two questions; the folder reader must log each malformed line it reads
-// once and stop at the first event in the folder; the scanner must never answer otherwise than
-// the parser.
+// once and stop at the first event in the folder, and answer for many folders at once (the one
+// asked about, its ancestors and those of the first events) as for each alone; the scanner must
+// never answer otherwise than the parser.
 #include <json/value.h>
 
 #include <cstddef>
@@ -108,6 +109,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   bool reindexQueued = false;
   bool folderEvent = false;
   size_t malformed = 0;  // up to the first event in the folder
+  std::vector<QueueEvent> events;
   for (const std::string& line : SplitLines(content)) {
     CheckScanAgreesWithParse(line);
     QueueEvent event;
@@ -115,6 +117,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
       malformed += folderEvent ? 0 : 1;
       continue;
     }
+    events.push_back(event);
     reindexQueued =
         reindexQueued || (event.event == static_cast<unsigned>(WEZO::FILEINDEX::kEventReindex) &&
                           event.path == fullPath);
@@ -157,6 +160,34 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   if (logged != malformed) {
     fuzzsupport::Fail("logged " + std::to_string(logged) + " malformed lines of " +
                       std::to_string(malformed));
+  }
+
+  // Many folders in one read: the one asked about, its ancestors and those of the first events'
+  // paths, so that nested folders, siblings and duplicates are looked for together.
+  std::vector<std::string> folders{folderFull};
+  const auto addAncestors = [&folders](const std::string& path) {
+    for (size_t at = path.find('/', 1); at != std::string::npos && folders.size() < 24;
+         at = path.find('/', at + 1)) {
+      folders.push_back(path.substr(0, at));
+    }
+  };
+  addAncestors(folderFull);
+  for (size_t i = 0; i < events.size() && i < 8; ++i) {
+    addAncestors(events[i].path);
+  }
+  WEZO::FILEINDEX::detail::QueueFoldersWithEvents(folders, queue, found, plain);
+  (void)fuzzsupport::TakeMalformedLineCount();
+  for (size_t f = 0; f < folders.size(); ++f) {
+    bool expected = false;
+    for (const QueueEvent& event : events) {
+      expected = expected || Inside(event.path, folders[f]) ||
+                 (event.event == static_cast<unsigned>(WEZO::FILEINDEX::kEventMoved) &&
+                  Inside(event.pathOld, folders[f]));
+    }
+    if (found[f] != expected) {
+      fuzzsupport::Fail("QueueFoldersWithEvents of " + std::to_string(folders.size()) +
+                        " folders answered " + std::to_string(found[f]) + " for " + folders[f]);
+    }
   }
   return 0;
 }
