@@ -355,6 +355,17 @@ class LineScanner {
     }
   }
 
+  // After a member or an element: "," (kOk, `closed` false) or `close` (kOk, `closed` true).
+  Step Separator(char close, bool& closed) {
+    SkipSpace();
+    if (!Avail()) {
+      return Step::kMalformed;
+    }
+    const char c = *m_src.p++;
+    closed = c == close;
+    return closed || c == ',' ? Step::kOk : Step::kUnsure;
+  }
+
   // After "[".
   Step Elements(int depth) {
     SkipSpace();
@@ -365,19 +376,12 @@ class LineScanner {
     for (;;) {
       SkipSpace();
       Step step = Value(depth);
-      if (step != Step::kOk) {
+      bool closed = false;
+      if (step == Step::kOk) {
+        step = Separator(']', closed);
+      }
+      if (step != Step::kOk || closed) {
         return step;
-      }
-      SkipSpace();
-      if (!Avail()) {
-        return Step::kMalformed;
-      }
-      const char c = *m_src.p++;
-      if (c == ']') {
-        return Step::kOk;
-      }
-      if (c != ',') {
-        return Step::kUnsure;
       }
     }
   }
@@ -464,19 +468,12 @@ class LineScanner {
       } else {
         step = Value(depth);
       }
-      if (step != Step::kOk) {
+      bool closed = false;
+      if (step == Step::kOk) {
+        step = Separator('}', closed);
+      }
+      if (step != Step::kOk || closed) {
         return step;
-      }
-      SkipSpace();
-      if (!Avail()) {
-        return Step::kMalformed;
-      }
-      const char c = *m_src.p++;
-      if (c == '}') {
-        return Step::kOk;
-      }
-      if (c != ',') {
-        return Step::kUnsure;
       }
     }
   }
