@@ -5,6 +5,7 @@
 #include <sys/stat.h>
 
 #include <algorithm>
+#include <cctype>
 #include <fstream>
 #include <functional>
 #include <memory>
@@ -496,49 +497,56 @@ TEST(FolderSetTest, MarksAsThePathLiesInTheFolderWhileFoldersAreFound) {
   }
 }
 
-// A stretch's index against a reading byte by byte: every "\n" in order, and from every byte the
-// next stop, for stretches ending before, at and after the 64-byte steps, stops often adjacent.
+// The stretch's stops and the reindex hints against a reading byte by byte, for stretches ending
+// before, at and after the steps of 16, 32 and 64 bytes, stops and hints often adjacent, with and
+// without AVX2.
 TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
   std::mt19937 rng(7);
-  static constexpr char kBytes[] = "ab\"\\\n/{}";
+  static constexpr char kBytes[] = "ab\"\\\n/{}6553eE0.9u";
   std::string bytes(600, 'x');
   for (char& c : bytes) {
     c = kBytes[rng() % (sizeof kBytes - 1)];
   }
+  for (const size_t at : {13, 29, 30, 62, 63, 127, 300, 596}) {
+    bytes.replace(at, 4, "6553");
+  }
+  // A hint: "6553", or an exponent after digits and points that no letter comes before.
+  const auto hint = [&bytes](size_t i, size_t size) {
+    if (bytes.compare(i, 4, "6553") == 0 && i + 4 <= size) {
+      return true;
+    }
+    if ((bytes[i] | 0x20) != 'e') {
+      return false;
+    }
+    size_t j = i;
+    while (j > 0 &&
+           (std::isdigit(static_cast<unsigned char>(bytes[j - 1])) || bytes[j - 1] == '.')) {
+      --j;
+    }
+    return j < i && (j == 0 || !std::isalpha(static_cast<unsigned char>(bytes[j - 1])));
+  };
   const auto index = std::make_unique<detail::LineIndex>();
-  for (const auto& [baseline, size] : {std::pair{false, 1},
-                                       {false, 63},
-                                       {false, 64},
-                                       {false, 65},
-                                       {false, 200},
-                                       {false, 600},
-                                       {true, 1},
-                                       {true, 63},
-                                       {true, 64},
-                                       {true, 65},
-                                       {true, 200},
-                                       {true, 600}}) {
-    SCOPED_TRACE(testing::Message() << size << (baseline ? " baseline" : ""));
+  for (const bool baseline : {false, true}) {
     detail::UseBaselineLineIndex(baseline);
-    const char* const begin = bytes.data();
-    const char* const end = begin + static_cast<size_t>(size);
-    index->Build(begin, end, detail::LineIndex::Kind::kNewlines);
-    std::vector<const char*> newlines;
-    for (const char* p = begin; p != end; ++p) {
-      if (*p == '\n') {
-        newlines.push_back(p);
+    for (const size_t size : {1, 15, 16, 17, 31, 32, 33, 63, 64, 65, 200, 600}) {
+      SCOPED_TRACE(testing::Message() << size << (baseline ? " baseline" : ""));
+      const char* const begin = bytes.data();
+      const char* const end = begin + size;
+      index->Build(begin, end);
+      const char* next = nullptr;  // asked only where a stop follows
+      for (const char* p = end; p-- != begin;) {
+        next = *p == '"' || *p == '\\' || *p == '\n' ? p : next;
+        if (next != nullptr) {
+          EXPECT_EQ(index->NextStop(p), next) << p - begin;
+        }
       }
-    }
-    ASSERT_EQ(index->Lines(), newlines.size());
-    for (size_t i = 0; i < newlines.size(); ++i) {
-      EXPECT_EQ(index->Newline(i), newlines[i]) << i;
-    }
-    index->Build(begin, end, detail::LineIndex::Kind::kStops);
-    const char* next = nullptr;  // asked only where a stop follows
-    for (const char* p = end; p-- != begin;) {
-      next = *p == '"' || *p == '\\' || *p == '\n' ? p : next;
-      if (next != nullptr) {
-        EXPECT_EQ(index->NextStop(p), next) << p - begin;
+      for (size_t from = 0; from < size; from += 7) {
+        size_t first = from;
+        while (first < size && !hint(first, size)) {
+          ++first;
+        }
+        const char* found = detail::NextReindexHint(begin, begin + from, end);
+        EXPECT_EQ(found == nullptr ? size : static_cast<size_t>(found - begin), first) << from;
       }
     }
   }

@@ -57,49 +57,26 @@ class BlockReader {
   // the file has nothing left. A read error ends the file where it happened.
   bool Next(ReadLine& line, size_t limit);
 
-  // Hands the lines the buffer already holds, from where reading stands, to `take(index, i)`,
-  // line `i` of `index` (built of kNewlines), for as long as it takes them. `end` gets the
-  // offset after the last line taken. The line refused, and a line the buffer does not hold
-  // whole (or one longer than the index's span), are left for Next.
-  template <class F>
-  void SkimLines(F&& take, off_t& end) {
+  // Passes over the lines the buffer holds whole, from where reading stands, that hold no hint of
+  // a reindex event (NextReindexHint): none of them can be one. Stops at the start of the first
+  // line that holds one, left for Next, or after the last line held whole; `end` gets the offset
+  // after the last line passed over.
+  void SkipUnhinted(off_t& end) {
     Start();
     const char* const data = m_buffer.get();
-    const char* p = data + m_pos;
-    const char* const fill = data + m_fill;
-    LineIndex& index = Index();
-    // After Next read the line refused, the index still holds the lines after it.
-    size_t i = m_line;
-    const bool same = m_indexed && index.Built() == LineIndex::Kind::kNewlines;
-    if (same && m_line < index.Lines() && index.LineStart(m_line + 1) == p) {
-      ++i;
-    } else if (!(same && m_line < index.Lines() && index.LineStart(m_line) == p)) {
-      m_indexed = false;
+    const char* const from = data + m_pos;
+    const void* last = memrchr(from, '\n', m_fill - m_pos);
+    if (last == nullptr) {
+      return;
     }
-    while (p < fill) {
-      if (!m_indexed) {
-        index.Build(p, p + std::min<size_t>(fill - p, LineIndex::kSpan),
-                    LineIndex::Kind::kNewlines);
-        m_indexed = true;
-        i = 0;
-      }
-      const size_t lines = index.Lines();
-      while (i < lines && take(index, i)) {
-        ++i;
-      }
-      if (i < lines) {
-        m_line = i;
-        p = index.LineStart(i);
-        break;
-      }
-      m_indexed = false;  // all taken: on to the next stretch
-      if (lines == 0) {
-        break;
-      }
-      p = index.Newline(lines - 1) + 1;
+    const char* to = static_cast<const char*>(last) + 1;
+    const char* const hint = NextReindexHint(data, from, to);
+    if (hint != nullptr) {
+      const void* before = memrchr(from, '\n', static_cast<size_t>(hint - from));
+      to = before != nullptr ? static_cast<const char*>(before) + 1 : from;
     }
-    if (p != data + m_pos) {
-      m_pos = static_cast<size_t>(p - data);
+    if (to != from) {
+      m_pos = static_cast<size_t>(to - data);
       end = Offset(m_pos);
     }
   }
@@ -112,7 +89,7 @@ class BlockReader {
   };
 
   // Hands the lines the buffer already holds, from where reading stands, to
-  // `take(index, begin, newline)`, with `index` built of kStops over a stretch that ends with a
+  // `take(index, begin, newline)`, with `index` built over a stretch that ends with a
   // "\n" after `begin`, for as long as it takes them: it sets `newline` to the "\n" that ends a
   // line it takes. `end` gets the offset after the last line taken. The line refused, and a line
   // the buffer does not hold whole (or one longer than the index's span), are left for Next.
@@ -124,7 +101,7 @@ class BlockReader {
     const char* p = data + m_pos;
     const char* const fill = data + m_fill;
     LineIndex& index = Index();
-    if (m_indexed && !(index.Built() == LineIndex::Kind::kStops && index.Begin() <= p)) {
+    if (m_indexed && index.Begin() > p) {
       m_indexed = false;
     }
     bool stop = false;
@@ -137,7 +114,7 @@ class BlockReader {
           m_indexed = false;
           break;
         }
-        index.Build(p, static_cast<const char*>(last) + 1, LineIndex::Kind::kStops);
+        index.Build(p, static_cast<const char*>(last) + 1);
         m_indexed = true;
       }
       const char* newline = nullptr;
@@ -169,7 +146,7 @@ class BlockReader {
     return Begins(p, end, kNullData) ? p + sizeof kNullData - 1 : nullptr;
   }
 
-  // A plain line (see Plain) at `p`, in the stretch of `index` (built of kStops) that holds it:
+  // A plain line (see Plain) at `p`, in the stretch of `index` that holds it:
   // returns the "\n" that ends it, or nullptr when the line is not plain.
   static const char* PlainLine(const LineIndex& index, const char* p, bool& moved,
                                std::string_view& path, std::string_view& pathOld) {
@@ -284,7 +261,6 @@ class BlockReader {
   bool m_onlyReindex = false;
   std::unique_ptr<LineIndex> m_index;  // made at the first skim
   bool m_indexed = false;              // m_index describes the buffer as it is
-  size_t m_line = 0;                   // the line of m_index that SkimLines stopped at
   std::string m_head;
   std::string m_logHead;
 };

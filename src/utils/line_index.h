@@ -1,6 +1,8 @@
-// A stretch of the read buffer looked at as a whole, 64 bytes at a time, so that the readers
-// classify a line without a search of their own: where each "\n" is, or where the bytes that end
-// a plain string ('"', '\\' and "\n") are.
+// The read buffer looked at many bytes at a time (AVX2 where the processor has it, chosen at run
+// time, SSE2 otherwise, byte by byte on other architectures), so that the readers classify a line
+// without a search of their own: for the folder reader, where the bytes that end a plain string
+// ('"', '\\' and "\n") are in a stretch; for the reindex reader, where a line may hold the code of
+// a reindex event at all.
 #ifndef FILEINDEX_SRC_UTILS_LINE_INDEX_H_
 #define FILEINDEX_SRC_UTILS_LINE_INDEX_H_
 
@@ -11,32 +13,19 @@ namespace WEZO {
 namespace FILEINDEX {
 namespace detail {
 
+// The stops of a stretch, 64 bytes a step.
 class LineIndex {
  public:
   // Bytes looked at at once: the stretch and what is found in it stay in the first-level caches.
   static constexpr size_t kSpan = size_t{16} << 10;
 
-  enum class Kind {
-    kNewlines,  // where each "\n" is
-    kStops,     // where each '"', '\\' and "\n" is
-  };
-
   // Looks at [begin, end), at most `kSpan` bytes.
-  void Build(const char* begin, const char* end, Kind kind);
+  void Build(const char* begin, const char* end);
 
   const char* Begin() const { return m_begin; }
   const char* End() const { return m_end; }
-  Kind Built() const { return m_kind; }
 
-  // kNewlines: the "\n"s found; line `i` ends at the `i`th and begins after the one before (or
-  // at Begin).
-  size_t Lines() const { return m_lines; }
-  const char* Newline(size_t i) const { return m_begin + m_newline[i]; }
-  const char* LineStart(size_t i) const {
-    return i == 0 ? m_begin : m_begin + m_newline[i - 1] + 1;
-  }
-
-  // kStops: the first stop at or after `from`, when the caller knows that there is one before End.
+  // The first stop at or after `from`, when the caller knows that there is one before End.
   const char* NextStop(const char* from) const {
     const auto at = static_cast<size_t>(from - m_begin);
     size_t chunk = at / 64;
@@ -50,23 +39,21 @@ class LineIndex {
  private:
   friend struct LineIndexBuild;
 
-  // Room for a few positions written past the last "\n" found, so that a 64-byte chunk's first
-  // ones are stored without a test each.
-  static constexpr size_t kSlack = 4;
-
   const char* m_begin = nullptr;
   const char* m_end = nullptr;
-  Kind m_kind = Kind::kNewlines;
-  size_t m_lines = 0;
-  uint16_t m_newline[kSpan + kSlack];
-  // kStops: per 64 bytes, which are stops.
-  uint64_t m_mask[kSpan / 64];
+  uint64_t m_mask[kSpan / 64];  // per 64 bytes, which are stops
 };
 
-static_assert(LineIndex::kSpan <= 65536, "positions fit 16 bits");
+// The first byte in [from, end) where the text of a number that reads as 65536 could be: where
+// "6553" begins ("65536", "65535." rounding up, or with zeros before it), or an "e" or "E" after
+// a run of digits and points that no letter comes before (an exponent: no number follows a
+// letter, so "\u00e9" is passed over); nullptr when there is none. A line without one cannot be a
+// reindex event, whatever else it holds. The byte before `from` is read when `from` is not
+// `begin`, the start of what the caller holds.
+const char* NextReindexHint(const char* begin, const char* from, const char* end);
 
-// With `baseline`, every index is built as on a processor without AVX2 (for the tests: both
-// builds must find the same).
+// With `baseline`, the index and the hints are found as on a processor without AVX2 (for the
+// tests: both must find the same).
 void UseBaselineLineIndex(bool baseline);
 
 }  // namespace detail

@@ -28,8 +28,8 @@ class LineSource {
 };
 
 // Reads the line `source` brings as the parser would: kEvent with the event in `out` (at most
-  // `limit` bytes of each path; `pathSize` and `pathOldSize` get their whole decoded lengths),
-  // kNoEvent where the parser surely finds none, kUnsure where only the parser can tell.
+// `limit` bytes of each path; `pathSize` and `pathOldSize` get their whole decoded lengths),
+// kNoEvent where the parser surely finds none, kUnsure where only the parser can tell.
 LineVerdict ScanLine(LineSource& source, size_t limit, QueueEvent& out, size_t& pathSize,
                      size_t& pathOldSize);
 

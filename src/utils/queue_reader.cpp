@@ -397,12 +397,9 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile,
   ReadLine line;
   bool queued = false;
   off_t end = have ? entry.file.offset : 0;
-  // Plain lines with another code are passed over in bulk.
-  const auto other = [](const detail::LineIndex& lines, size_t i) {
-    return BlockReader::OtherCode(lines.LineStart(i), lines.Newline(i));
-  };
   while (!queued) {
-    reader.SkimLines(other, end);
+    // Lines without a hint of a reindex event are passed over in bulk.
+    reader.SkipUnhinted(end);
     if (!reader.Next(line, limit)) {
       break;
     }
