@@ -174,10 +174,12 @@ struct Avx2Step {
 };
 #endif
 
-// Steps while a whole step and the byte after it lie before `end`, each candidate checked by
-// IsHint; the rest byte by byte. The byte before the first step is loaded: a hint at `begin` is
-// looked for on its own.
-#define FILEINDEX_FIND_HINT(Step, begin, from, end)                         \
+// The body of a search for hints of the function's arguments `begin`, `from` and `end`, a step of
+// `Step` at a time while a whole step and the byte after it lie before `end`, each candidate
+// checked by IsHint; the rest byte by byte. The byte before the first step is loaded: a hint at
+// `begin` is looked for on its own. A macro rather than a template, because each copy is compiled
+// for the instruction set of the function it stands in.
+#define FILEINDEX_FIND_HINT(Step)                                           \
   const char* p = from;                                                     \
   if (p == begin && p < end) {                                              \
     if (IsHint(begin, p, end)) {                                            \
@@ -197,14 +199,14 @@ struct Avx2Step {
 
 #if defined(__SSE2__)
 const char* Sse2Hint(const char* begin, const char* from, const char* end) {
-  FILEINDEX_FIND_HINT(Sse2Step, begin, from, end);
+  FILEINDEX_FIND_HINT(Sse2Step);
 }
 #endif
 
 #if defined(FILEINDEX_LINE_INDEX_X86)
 __attribute__((target("avx2"))) const char* Avx2Hint(const char* begin, const char* from,
                                                      const char* end) {
-  FILEINDEX_FIND_HINT(Avx2Step, begin, from, end);
+  FILEINDEX_FIND_HINT(Avx2Step);
 }
 #endif
 
