@@ -210,7 +210,6 @@ TEST_F(QueryTest, ThreadsAskingWhileAnotherSavesSeeOneListOrTheOther) {
 
 class MonitorRegistrationTest : public testsupport::LibraryTest {
  protected:
-  MonitorRegistrationTest() { std::filesystem::create_directories(volume + "/photo"); }
   const std::string queue = volume + "/photo/@eaDir/WEZO@file_index_queue";
 };
 

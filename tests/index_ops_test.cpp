@@ -28,11 +28,6 @@ std::string Stored(bool status) {
 
 class IndexOpsTest : public testsupport::LibraryTest {
  protected:
-  IndexOpsTest() {
-    std::filesystem::create_directories(volume + "/photo");
-    std::filesystem::create_directories(volume + "/video");
-  }
-
   std::string Relative(const std::string& path) const {
     return path.rfind(volume, 0) == 0 ? path.substr(volume.size()) : path;
   }

@@ -14,8 +14,6 @@ using Getter = int (*)(const char*, char*, int);
 
 class StorageTest : public testsupport::LibraryTest {
  protected:
-  StorageTest() { std::filesystem::create_directories(volume + "/photo"); }
-
   const std::string metadata = volume + "/photo/@eaDir";
   const std::string queue = metadata + "/WEZO@file_index_queue";
   const std::string db = metadata + "/WEZO@.fileindexdb";

@@ -83,11 +83,6 @@ int Temporaries(const std::string& name) {
 
 class StressTest : public testsupport::LibraryTest {
  protected:
-  StressTest() {
-    for (const char* share : {"/photo", "/video"})
-      std::filesystem::create_directories(volume + share);
-  }
-
   testsupport::FakeDaemon daemon;
 };
 

@@ -237,7 +237,8 @@ std::vector<Json::Value> FakeDaemon::Commands(size_t count, std::chrono::millise
 }
 
 LibraryTest::LibraryTest() : volume(At("volume1")) {
-  for (const char* dir : {"tmp", "var/run", "usr/wezo/etc/fileindex", "usr/wezo/bin"}) {
+  for (const char* dir : {"tmp", "var/run", "usr/wezo/etc/fileindex", "usr/wezo/bin",
+                          "volume1/photo", "volume1/video"}) {
     std::filesystem::create_directories(At(dir));
   }
   ResetPlatform();

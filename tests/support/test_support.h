@@ -119,8 +119,8 @@ class FakeDaemon {
 };
 
 // Every library test's fixture: a sandbox root with the appliance's directories, a fresh fake
-// platform with shares "photo" and "video" on its /volume1, the log captured, no error,
-// LOG_LEVEL 3.
+// platform with shares "photo" and "video" (both made on its /volume1), the log captured, no
+// error, LOG_LEVEL 3.
 class LibraryTest : public SandboxTest {
  protected:
   LibraryTest();
