@@ -321,6 +321,10 @@ TEST_F(IndexOpsTest, DeletingFoldersTellsTheDaemonQueuesTheLastPathAndCleansAnEm
        false, "/photo/a", "unwatch video",
        "index_mgr:N MonitorQueue::Delete failed; index_mgr:N DeleteWEZtifydCfg failed, "
        "share=video"},
+      // The share is gone once the list is loaded: the update cannot be queued.
+      {[](fake::Platform& p) { p.share_get_fails_after = 3; }, R"("/photo/a":{},"/photo/b":{},)",
+       "/photo/a", false, "/photo/b; /video/v", "",
+       "index_mgr:N GetFullPath failed, path=/photo/a; index_mgr:N Update failed"},
       {[](fake::Platform& p) { p.shares.erase("video"); }, R"("/photo/a":{},)", "/video/v", false,
        "/photo/a", "",
        "utils:N WEZOShareGet failed, name=video, code=3585; index_mgr:N FILEIDXQueuePathGet "
@@ -339,7 +343,7 @@ TEST_F(IndexOpsTest, DeletingFoldersTellsTheDaemonQueuesTheLastPathAndCleansAnEm
     EXPECT_TRUE(!c.saved.empty() || std::filesystem::is_empty(volume + "/video/@eaDir"));
     EXPECT_EQ(Log(), c.log);
   }
-  EXPECT_EQ(daemon.Connections(9, Ms(200)).size(), 6U) << "nobody told of the last";
+  EXPECT_EQ(daemon.Connections(9, Ms(200)).size(), 7U) << "nobody told of the last";
 }
 
 TEST_F(IndexOpsTest, ReindexQueuesNothingUnlessEveryElementIsAcceptable) {
