@@ -79,49 +79,18 @@ TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
 // Answers from what the process read before match a fresh load after each way the files change.
 // Some cases keep every read (no settling time), so that a change the kept snapshot misses shows.
 TEST_F(QueryTest, KeptSnapshotsAnswerAsAFreshLoadAfterEveryChange) {
-  const auto saveAs = [](const char* add, const char* remove, bool noSpace) {
-    Folders list;
-    Json::Value report;
-    ASSERT_TRUE(list.Lock(true) && list.Load() && list.Upsert(report, ParseJson(add)) &&
-                list.Delete(report, remove) && list.Save());
-    list.Unlock();
-    Status status;
-    ASSERT_TRUE(status.Lock(true) && status.Load() && status.ShareSetNoSpace("photo", noSpace) &&
-                status.Save());
-    status.Unlock();
-  };
+  // What each file becomes: its text, "-" for removed, or "" for saved by another writer
+  // (/photo/b added, /photo/a removed, photo's flag cleared). Rewritten ones keep their size.
+  const std::string unreadableStatus = "config:N Failed to load json from " + StatusConfPath();
   const struct {
-    const char* change;
+    const char *change, *folders, *status;
     bool keepEveryRead;
-    std::function<void()> act;
     std::vector<std::string> log;
   } cases[] = {
-      {"saved by another writer",
-       true,
-       [&] { saveAs(R"({"path":"/photo/b"})", "/photo/a", false); },
-       {}},
-      {"rewritten in place, same size, at once",
-       false,
-       [] {
-         WriteFile(FolderConfPath(), R"({"/photo/b":{}})");
-         WriteFile(StatusConfPath(), R"({"no_space":{"photx":true}})");
-       },
-       {}},
-      {"removed",
-       true,
-       [] {
-         std::filesystem::remove(FolderConfPath());
-         std::filesystem::remove(StatusConfPath());
-       },
-       {}},
-      {"malformed",
-       true,
-       [] {
-         WriteFile(FolderConfPath(), "[1]");
-         WriteFile(StatusConfPath(), "{");
-       },
-       {"folders:N Malformed folders: [1]",
-        "config:N Failed to load json from " + StatusConfPath()}},
+      {"saved by another writer", "", "", true, {}},
+      {"rewritten at once", R"({"/photo/b":{}})", R"({"no_space":{"photx":true}})", false, {}},
+      {"removed", "-", "-", true, {}},
+      {"malformed", "[1]", "{", true, {"folders:N Malformed folders: [1]", unreadableStatus}},
   };
   for (const auto& c : cases) {
     SCOPED_TRACE(c.change);
@@ -131,7 +100,23 @@ TEST_F(QueryTest, KeptSnapshotsAnswerAsAFreshLoadAfterEveryChange) {
     WriteFile(FolderConfPath(), R"({"/photo/a":{}})");
     WriteFile(StatusConfPath(), R"({"no_space":{"photo":true}})");
     ASSERT_TRUE(IndexMgr::IsPathIndexed("/photo/a") && StatusMgr::ShareIsNoSpace("photo"));
-    c.act();
+    if (*c.folders == '\0') {
+      Folders list;
+      Json::Value report;
+      ASSERT_TRUE(list.Lock(true) && list.Load() &&
+                  list.Upsert(report, ParseJson(R"({"path":"/photo/b"})")) &&
+                  list.Delete(report, "/photo/a") && list.Save());
+      list.Unlock();
+      Status status;
+      ASSERT_TRUE(status.Lock(true) && status.Load() && status.ShareSetNoSpace("photo", false) &&
+                  status.Save());
+      status.Unlock();
+    }
+    for (const auto& [file, text] :
+         {std::pair{FolderConfPath(), c.folders}, {StatusConfPath(), c.status}}) {
+      if (std::string(text) == "-") std::filesystem::remove(file);
+      if (*text != '\0' && std::string(text) != "-") WriteFile(file, text);
+    }
     for (int ask = 0; ask < 2; ++ask) {  // a failed read fails again, with its line again
       log.Clear();
       ErrorHandler::SetError(FILEINDEX_ERR_NONE);
