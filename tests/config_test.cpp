@@ -1,17 +1,6 @@
-#include <fcntl.h>
-#include <gtest/gtest.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include <ctime>
-#include <filesystem>
 
 #include "file_io.h"
-#include "fileindex/config.h"
-#include "fileindex/error.h"
-#include "fileindex/root.h"
-#include "json_io.h"
-#include "paths.h"
 #include "test_support.h"
 
 namespace WEZO::FILEINDEX {

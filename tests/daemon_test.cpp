@@ -1,23 +1,11 @@
-#include "fileindex/daemon.h"
-
-#include <gtest/gtest.h>
-#include <json/value.h>
 #include <sys/socket.h>
 #include <sys/un.h>
-#include <unistd.h>
 
-#include <chrono>
 #include <csignal>
 #include <cstdint>
 #include <cstring>
-#include <filesystem>
 #include <future>
-#include <string>
-#include <thread>
-#include <vector>
 
-#include "fileindex/root.h"
-#include "paths.h"
 #include "test_support.h"
 
 namespace WEZO::FILEINDEX {

@@ -1,15 +1,8 @@
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <wezo/platform.h>
 
 #include <algorithm>
-#include <filesystem>
 #include <sstream>
-#include <tuple>
 
-#include "fake_platform.h"
-#include "fileindex/eligibility.h"
-#include "fileindex/error.h"
 #include "test_support.h"
 #include "utils/eligibility_pass.h"
 

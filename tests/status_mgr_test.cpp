@@ -1,42 +1,18 @@
-#include <fcntl.h>
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <json/value.h>
-#include <sys/file.h>
-#include <unistd.h>
-
 #include <climits>
 #include <ctime>
-#include <filesystem>
 #include <fstream>
 #include <random>
-#include <string>
 
-#include "fake_platform.h"
-#include "fileindex/eligibility.h"
-#include "fileindex/error.h"
-#include "fileindex/folders.h"
-#include "fileindex/status_mgr.h"
-#include "paths.h"
 #include "status_mgr/progress.h"
 #include "test_support.h"
 
-namespace WEZO {
-namespace FILEINDEX {
+namespace WEZO::FILEINDEX {
 namespace {
 
 using ::testing::ElementsAre;
 using testsupport::FakeDaemon;
 using testsupport::ParseJson;
 using testsupport::WriteFile;
-
-// True while some process holds the status lock.
-bool StatusLockHeld() {
-  const int fd = open(StatusLockPath().c_str(), O_RDONLY | O_CLOEXEC);
-  const bool held = fd >= 0 && flock(fd, LOCK_EX | LOCK_NB) != 0;
-  close(fd);
-  return held;
-}
 
 using StatusMgrTest = testsupport::LibraryTest;
 
@@ -76,7 +52,7 @@ TEST_F(StatusMgrTest, AnUnreachableDaemonFailsTheCallButTheChangeStays) {
   EXPECT_FALSE(StatusMgr::ShareIsNoSpace("photo"));
   EXPECT_THAT(log.Lines(), ElementsAre("status_mgr:N SendCammandToDaemon failed",
                                        "status_mgr:N SendCammandToDaemon failed"));
-  EXPECT_FALSE(StatusLockHeld());
+  EXPECT_FALSE(testsupport::LockHeldElsewhere(StatusLockPath()));
 
   FakeDaemon daemon;
   ASSERT_TRUE(StatusMgr::ShareSetNeedReindex("photo", true));
@@ -115,9 +91,7 @@ TEST_F(ProgressTest, TheServiceIsFinishedWhenNoIndexableShareHasAQueueFile) {
                            const std::string& status) {
     for (const auto& [path, text] : {std::pair{queue, queueText}, {queue + ".tmp", tmpText}}) {
       std::filesystem::remove(path);
-      if (text != "-") {
-        WriteFile(path, text);
-      }
+      if (text != "-") WriteFile(path, text);
     }
     WriteFile(StatusConfPath(), status);
   };
@@ -237,5 +211,4 @@ TEST_F(ProgressTest, ManyFoldersInOneReadPerQueueAnswerAsFolderByFolder) {
 }
 
 }  // namespace
-}  // namespace FILEINDEX
-}  // namespace WEZO
+}  // namespace WEZO::FILEINDEX

@@ -1,13 +1,3 @@
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <json/value.h>
-
-#include <string>
-
-#include "fake_platform.h"
-#include "fileindex/status.h"
-#include "fileindex/utils.h"
-#include "paths.h"
 #include "test_support.h"
 
 namespace WEZO::FILEINDEX {

@@ -1,15 +1,5 @@
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/stat.h>
-
-#include <filesystem>
-#include <functional>
 #include <map>
-#include <tuple>
 
-#include "fake_platform.h"
-#include "fileindex/fileindex_c.h"
-#include "fileindex/index_mgr.h"
 #include "test_support.h"
 #include "utils/queue_reader.h"
 #include "utils/storage.h"
@@ -24,8 +14,6 @@ using Getter = int (*)(const char*, char*, int);
 
 class StorageTest : public testsupport::LibraryTest {
  protected:
-  StorageTest() { std::filesystem::create_directories(volume + "/photo"); }
-
   const std::string metadata = volume + "/photo/@eaDir";
   const std::string queue = metadata + "/WEZO@file_index_queue";
   const std::string db = metadata + "/WEZO@.fileindexdb";

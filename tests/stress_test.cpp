@@ -3,32 +3,17 @@
 // readers in several processes either get a change done or FILEINDEX_ERR_LOCK, a done change stays,
 // and readers always see the folders nobody touches. Longer runs: FILEINDEX_STRESS_TRIALS (kills,
 // default 100) and FILEINDEX_STRESS_ROUNDS (changes per writer, default 30).
-#include <gtest/gtest.h>
-#include <json/value.h>
 #include <poll.h>
 #include <sys/inotify.h>
 #include <sys/mman.h>
 #include <sys/wait.h>
-#include <unistd.h>
 
 #include <atomic>
-#include <chrono>
 #include <climits>
 #include <csignal>
 #include <cstdlib>
-#include <filesystem>
-#include <functional>
 #include <random>
-#include <string>
-#include <thread>
-#include <vector>
 
-#include "fileindex/error.h"
-#include "fileindex/folder.h"
-#include "fileindex/index_mgr.h"
-#include "fileindex/status_mgr.h"
-#include "json_io.h"
-#include "paths.h"
 #include "test_support.h"
 
 namespace WEZO::FILEINDEX {
@@ -98,11 +83,6 @@ int Temporaries(const std::string& name) {
 
 class StressTest : public testsupport::LibraryTest {
  protected:
-  StressTest() {
-    for (const char* share : {"/photo", "/video"})
-      std::filesystem::create_directories(volume + share);
-  }
-
   testsupport::FakeDaemon daemon;
 };
 

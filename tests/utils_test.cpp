@@ -1,15 +1,5 @@
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/stat.h>
-#include <unistd.h>
-
 #include <cerrno>
-#include <tuple>
 
-#include "fake_platform.h"
-#include "fileindex/error.h"
-#include "fileindex/utils.h"
-#include "json_io.h"
 #include "test_support.h"
 #include "utils/log.h"
 

@@ -212,17 +212,6 @@ void WLIBCErrSetEx(int code, const char* szFile, int line) {
   Get().errLine = line;
 }
 
-int WLIBCExec(const char* szPath, const char* szArg1, const char* szArg2, const char* szArg3,
-              const char* szArg4) {
-  std::vector<std::string> args{Str(szPath)};
-  for (const char* arg : {szArg1, szArg2, szArg3, szArg4}) {
-    if (arg == nullptr) break;
-    args.emplace_back(arg);
-  }
-  Record("WLIBCExec", std::move(args));
-  return Get().execResult;
-}
-
 int WLIBCExecv(const char* szPath, const char* const argv[], int flags) {
   std::vector<std::string> args{Str(szPath)};
   for (size_t i = 0; argv != nullptr && argv[i] != nullptr; ++i) args.emplace_back(argv[i]);

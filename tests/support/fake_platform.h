@@ -1,10 +1,11 @@
 // An in-memory platform for the library's tests.
 //
-// It implements every operation of wezo/platform.h and wezo/wezotifyd.h from the state below,
-// records each call with its arguments, and fails an operation on request. Only the platform is
-// faked: the one operation that creates something on disk (WEZOEAMKDir) really creates the
-// directory, because configuration files, locks, queues and sockets in the tests are real files
-// under a sandbox root. The state is per process; each test process starts from Reset().
+// It implements every operation of wezo/platform.h and wezo/wezotifyd.h that the library calls
+// from the state below, records each call with its arguments, and fails an operation on request.
+// Only the platform is faked: the one operation that creates something on disk (WEZOEAMKDir)
+// really creates the directory, because configuration files, locks, queues and sockets in the
+// tests are real files under a sandbox root. The state is per process; each test process starts
+// from Reset().
 #ifndef FILEINDEX_TESTS_SUPPORT_FAKE_PLATFORM_H_
 #define FILEINDEX_TESTS_SUPPORT_FAKE_PLATFORM_H_
 
@@ -51,7 +52,7 @@ struct Platform {
   int quotaError = 0;                   // last error left by a "not enough" answer
   std::map<std::string, bool> running;  // services by name
   int spotlight = 0;                    // 1 on, 0 off
-  int execResult = 0;                   // what WLIBCExec and WLIBCExecv return
+  int execResult = 0;                   // what WLIBCExecv returns
   // Monitor registrations by client, then queue path.
   std::map<std::string, std::map<std::string, Json::Value>> monitor;
   // WLIBCUnicodeUTF8StrCaseCmp's answer when set (strcasecmp otherwise), to play a platform

@@ -30,9 +30,7 @@ class SandboxTest : public ::testing::Test {
   ~SandboxTest() override {
     WEZO::FILEINDEX::SetRootPrefix("");
     std::error_code ec;
-    if (!root_.empty()) {
-      std::filesystem::remove_all(root_, ec);
-    }
+    if (!root_.empty()) std::filesystem::remove_all(root_, ec);
   }
 
   // `relative` ("var/run/x", or "/var/run/x") inside the sandbox.

@@ -1,27 +1,19 @@
 #include "test_support.h"
 
-#include <fcntl.h>
 #include <sys/file.h>
 #include <sys/socket.h>
-#include <sys/stat.h>
 #include <sys/un.h>
 #include <syslog.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
 #include <cstdint>
 #include <cstring>
-#include <filesystem>
 #include <fstream>
 #include <regex>
 #include <sstream>
 #include <utility>
 
-#include "fake_platform.h"
-#include "fileindex/error.h"
-#include "json_io.h"
-#include "paths.h"
 #include "utils/log.h"
 
 namespace testsupport {
@@ -87,6 +79,19 @@ int ModeOf(const std::string& path) {
 int OpenDescriptorCount() {
   const auto fds = std::filesystem::directory_iterator("/proc/self/fd");
   return static_cast<int>(std::distance(begin(fds), end(fds))) - 1;  // less the iterator's own
+}
+
+bool LockHeldElsewhere(const std::string& path) {
+  const int fd = open(path.c_str(), O_RDONLY | O_CLOEXEC);
+  const bool held = fd >= 0 && flock(fd, LOCK_EX | LOCK_NB) != 0;
+  close(fd);
+  return held;
+}
+
+std::string Joined(const std::vector<std::string>& parts) {
+  std::string text;
+  for (const std::string& part : parts) text += (text.empty() ? "" : "; ") + part;
+  return text;
 }
 
 LockHolder::LockHolder(const std::string& path, bool exclusive)
@@ -218,9 +223,7 @@ std::vector<Json::Value> FakeDaemon::Commands(size_t count, std::chrono::millise
   }
   std::vector<Json::Value> out;
   for (const std::string& frame : frames) {
-    if (frame.empty()) {
-      continue;
-    }
+    if (frame.empty()) continue;
     uint32_t length = 0;
     std::memcpy(&length, frame.data(), std::min(frame.size(), sizeof(length)));
     if (frame.size() <= sizeof(length) || length != frame.size() - sizeof(length) ||
@@ -234,14 +237,20 @@ std::vector<Json::Value> FakeDaemon::Commands(size_t count, std::chrono::millise
 }
 
 LibraryTest::LibraryTest() : volume(At("volume1")) {
-  for (const char* dir : {"tmp", "var/run", "usr/wezo/etc/fileindex", "usr/wezo/bin"}) {
+  for (const char* dir : {"tmp", "var/run", "usr/wezo/etc/fileindex", "usr/wezo/bin",
+                          "volume1/photo", "volume1/video"}) {
     std::filesystem::create_directories(At(dir));
   }
+  ResetPlatform();
+  WEZO::FILEINDEX::LOG_LEVEL = 3;
+}
+
+void LibraryTest::ResetPlatform() {
   fake::Reset();
   fake::Get().AddShare("photo", volume + "/photo");
   fake::Get().AddShare("video", volume + "/video");
   WEZO::FILEINDEX::ErrorHandler::SetError(WEZO::FILEINDEX::FILEINDEX_ERR_NONE);
-  WEZO::FILEINDEX::LOG_LEVEL = 3;
+  log.Clear();
 }
 
 Json::Value LibraryTest::StatusFile() {

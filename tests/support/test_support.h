@@ -1,20 +1,34 @@
 // Shared helpers of the library's tests: the fixture with its sandbox root, the captured log,
-// another process that holds a file lock, and a stand-in daemon on the socket.
+// another process that holds a file lock, and a stand-in daemon on the socket. It brings what
+// every library test uses: the library's whole interface, its fixed paths, JSON text and the fake
+// platform.
 #ifndef FILEINDEX_TESTS_SUPPORT_TEST_SUPPORT_H_
 #define FILEINDEX_TESTS_SUPPORT_TEST_SUPPORT_H_
 
+#include <fcntl.h>
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <json/value.h>
+#include <sys/stat.h>
 #include <sys/types.h>
+#include <unistd.h>
 
 #include <chrono>
 #include <condition_variable>
+#include <filesystem>
+#include <functional>
 #include <mutex>
 #include <ostream>
 #include <string>
 #include <thread>
+#include <tuple>
 #include <vector>
 
+#include "fake_platform.h"
+#include "fileindex/fileindex.h"
+#include "fileindex/fileindex_c.h"
+#include "json_io.h"
+#include "paths.h"
 #include "sandbox.h"
 
 namespace Json {
@@ -43,6 +57,8 @@ void WriteFile(const std::string& path, const std::string& text);
 std::string ReadFile(const std::string& path);  // "<missing>" when it cannot be read
 int ModeOf(const std::string& path);            // the permission bits, or -1
 int OpenDescriptorCount();
+bool LockHeldElsewhere(const std::string& path);  // some descriptor holds a flock on `path`
+std::string Joined(const std::vector<std::string>& parts);  // "a; b; c"
 
 // A flock on `path` (opened, created if need be) held until destroyed through a descriptor of its
 // own: flock locks belong to the open file, so the library meets it as another process's lock.
@@ -103,12 +119,13 @@ class FakeDaemon {
 };
 
 // Every library test's fixture: a sandbox root with the appliance's directories, a fresh fake
-// platform with shares "photo" and "video" on its /volume1, the log captured, no error,
-// LOG_LEVEL 3.
+// platform with shares "photo" and "video" (both made on its /volume1), the log captured, no
+// error, LOG_LEVEL 3.
 class LibraryTest : public SandboxTest {
  protected:
   LibraryTest();
 
+  void ResetPlatform();  // the constructor's fresh fake platform again, no error, the log cleared
   static Json::Value StatusFile();  // status.conf parsed; fails the test when it is not JSON
   // The sandbox as older tests name it: Path("/x"), Root().
   struct Paths {
