@@ -502,7 +502,7 @@ TEST(FolderSetTest, MarksAsThePathLiesInTheFolderWhileFoldersAreFound) {
 // without AVX2.
 TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
   std::mt19937 rng(7);
-  static constexpr char kBytes[] = "ab\"\\\n/{}6553eE0.9u";
+  static constexpr char kBytes[] = "ab\"\\\n/{}6553eE0.9u:_-";
   std::string bytes(600, 'x');
   for (char& c : bytes) {
     c = kBytes[rng() % (sizeof kBytes - 1)];
@@ -510,7 +510,7 @@ TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
   for (const size_t at : {13, 29, 30, 62, 63, 127, 300, 596}) {
     bytes.replace(at, 4, "6553");
   }
-  // A hint: "6553", or an exponent after digits and points that no letter comes before.
+  // A hint: "6553", or an exponent after digits and points where a number can begin.
   const auto hint = [&bytes](size_t i, size_t size) {
     if (bytes.compare(i, 4, "6553") == 0 && i + 4 <= size) {
       return true;
@@ -523,7 +523,8 @@ TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
            (std::isdigit(static_cast<unsigned char>(bytes[j - 1])) || bytes[j - 1] == '.')) {
       --j;
     }
-    return j < i && (j == 0 || !std::isalpha(static_cast<unsigned char>(bytes[j - 1])));
+    return j < i && (j == 0 || std::string_view(" \t\r\n:,[/-+").find(bytes[j - 1]) !=
+                                   std::string_view::npos);
   };
   const auto index = std::make_unique<detail::LineIndex>();
   for (const bool baseline : {false, true}) {

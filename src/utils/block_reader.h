@@ -57,10 +57,11 @@ class BlockReader {
   // the file has nothing left. A read error ends the file where it happened.
   bool Next(ReadLine& line, size_t limit);
 
-  // Passes over the lines the buffer holds whole, from where reading stands, that hold no hint of
-  // a reindex event (NextReindexHint): none of them can be one. Stops at the start of the first
-  // line that holds one, left for Next, or after the last line held whole; `end` gets the offset
-  // after the last line passed over.
+  // Passes over the lines the buffer holds whole, from where reading stands, that cannot be a
+  // reindex event: those without a hint of one (NextReindexHint), and those with a hint that begin
+  // as a plain line with another code (OtherCode). Stops at the start of the first other line,
+  // left for Next, or after the last line held whole; `end` gets the offset after the last line
+  // passed over.
   void SkipUnhinted(off_t& end) {
     Start();
     const char* const data = m_buffer.get();
@@ -69,11 +70,19 @@ class BlockReader {
     if (last == nullptr) {
       return;
     }
-    const char* to = static_cast<const char*>(last) + 1;
-    const char* const hint = NextReindexHint(data, from, to);
-    if (hint != nullptr) {
-      const void* before = memrchr(from, '\n', static_cast<size_t>(hint - from));
-      to = before != nullptr ? static_cast<const char*>(before) + 1 : from;
+    const char* const whole = static_cast<const char*>(last) + 1;
+    const char* p = from;
+    const char* to = whole;
+    while (const char* hint = NextReindexHint(data, p, whole)) {
+      const void* before = memrchr(p, '\n', static_cast<size_t>(hint - p));
+      const char* const start = before != nullptr ? static_cast<const char*>(before) + 1 : p;
+      const auto* newline =
+          static_cast<const char*>(std::memchr(hint, '\n', static_cast<size_t>(whole - hint)));
+      if (!OtherCode(start, newline)) {
+        to = start;
+        break;
+      }
+      p = newline + 1;
     }
     if (to != from) {
       m_pos = static_cast<size_t>(to - data);

@@ -46,10 +46,11 @@ class LineIndex {
 
 // The first byte in [from, end) where the text of a number that reads as 65536 could be: where
 // "6553" begins ("65536", "65535." rounding up, or with zeros before it), or an "e" or "E" after
-// a run of digits and points that no letter comes before (an exponent: no number follows a
-// letter, so "\u00e9" is passed over); nullptr when there is none. A line without one cannot be a
-// reindex event, whatever else it holds. The byte before `from` is read when `from` is not
-// `begin`, the start of what the caller holds.
+// a run of digits and points that begins where a number can begin (after a space, ":", ",", "[",
+// the "/" that ends a comment, or a sign: an exponent; "\u00e9" or "_3e7" are passed over);
+// nullptr when there is none. A line without one cannot be a reindex event, whatever else it
+// holds. The byte before `from` is read when `from` is not `begin`, the start of what the caller
+// holds.
 const char* NextReindexHint(const char* begin, const char* from, const char* end);
 
 // With `baseline`, the index and the hints are found as on a processor without AVX2 (for the
