@@ -31,16 +31,25 @@ class FolderSet {
   // returns how many of those marked anew are `asked`.
   size_t Mark(std::string_view path, size_t fullSize, const std::vector<bool>& asked,
               std::vector<bool>& found, std::vector<size_t>& marks) {
-    // Most paths are too short for every folder left, do not begin with their common start or
-    // go on from it as none of them does.
-    const bool in = fullSize >= m_minSize && EndsCommon(path) && StartLeft(path) && InCommon(path);
+    const bool in = MayHold(path, fullSize);
     if (!in && m_odd.empty()) {
       return 0;
     }
     return MarkIn(path, fullSize, in, asked, found, marks);
   }
 
+  // Whether Mark would surely mark nothing for the path, known without a call.
+  bool Dismisses(std::string_view path, size_t fullSize) const {
+    return !MayHold(path, fullSize) && m_odd.empty();
+  }
+
  private:
+  // Most paths are too short for every folder left, do not begin with their common start or go on
+  // from it as none of them does.
+  bool MayHold(std::string_view path, size_t fullSize) const {
+    return fullSize >= m_minSize && EndsCommon(path) && StartLeft(path) && InCommon(path);
+  }
+
   // Whether the path may begin as the folders' common start: its last eight bytes, where
   // siblings differ, or all of a shorter one. The path has at least m_minSize bytes.
   bool EndsCommon(std::string_view path) const {
