@@ -202,23 +202,62 @@ bool NoQueueAt(const std::string& queueFile) {
          (errno == ENOENT || errno == ENOTDIR || errno == EISDIR || errno == ENXIO);
 }
 
-// Passes over the plain lines from `p` in the stretch of `index` whose paths `set` dismisses at
-// once, and returns where the first other line begins (or the stretch's end). The common line
-// costs no call here, so that what a line needs stays in registers from one line to the next.
-__attribute__((noinline)) const char* PassDismissed(const detail::LineIndex& index, const char* p,
-                                                    const FolderSet& set) {
+// The line after the plain line at `p` when `set` dismisses its paths at once; nullptr for any
+// other line.
+inline const char* AfterDismissed(const detail::LineIndex& index, const char* p,
+                                  const FolderSet& set) {
   bool moved = false;
   std::string_view path;
   std::string_view pathOld;
-  while (p < index.End()) {
-    const char* const newline = BlockReader::PlainLine(index, p, moved, path, pathOld);
-    if (newline == nullptr || !set.Dismisses(path, path.size()) ||
-        (moved && !set.Dismisses(pathOld, pathOld.size()))) {
+  const char* const newline = BlockReader::PlainLine(index, p, moved, path, pathOld);
+  if (newline == nullptr || !set.Dismisses(path, path.size()) ||
+      (moved && !set.Dismisses(pathOld, pathOld.size()))) {
+    return nullptr;
+  }
+  return newline + 1;
+}
+
+// Passes over the plain lines from `p` in the stretch of `index` whose paths `set` dismisses at
+// once, and returns where the first other line begins (or the stretch's end). Where a line ends
+// is known only once it is read, so one walk waits on each line before the next; the stretch is
+// walked from its start and from its middle at once, and the second walk counts only once the
+// first reaches where it began. The common line costs no call here, so that the walks stay in
+// registers from one line to the next.
+__attribute__((noinline)) const char* PassDismissed(const detail::LineIndex& index, const char* p,
+                                                    const FolderSet& set) {
+  const char* const end = index.End();
+  const char* mid = end;
+  if (end - p >= 1024) {
+    const void* newline = std::memchr(p + (end - p) / 2, '\n', static_cast<size_t>(end - p) / 2);
+    mid = newline != nullptr ? static_cast<const char*>(newline) + 1 : end;
+  }
+  const char* second = mid;
+  while (p < mid && second < end) {
+    const char* const nextFirst = AfterDismissed(index, p, set);
+    const char* const nextSecond = AfterDismissed(index, second, set);
+    if (nextFirst == nullptr || nextSecond == nullptr) {
+      p = nextFirst != nullptr ? nextFirst : p;
+      second = nextSecond != nullptr ? nextSecond : second;
       break;
     }
-    p = newline + 1;
+    p = nextFirst;
+    second = nextSecond;
   }
-  return p;
+  while (p < mid) {
+    const char* const next = AfterDismissed(index, p, set);
+    if (next == nullptr) {
+      return p;
+    }
+    p = next;
+  }
+  while (second < end) {
+    const char* const next = AfterDismissed(index, second, set);
+    if (next == nullptr) {
+      break;
+    }
+    second = next;
+  }
+  return second;
 }
 
 // The folder test of one open file, with what the process remembers of it.
