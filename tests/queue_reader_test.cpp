@@ -364,8 +364,12 @@ TEST_F(QueueReaderTest, LinesAtTheEdgesOfWhatIsLookedAtOnceAnswerAsTheParser) {
           SCOPED_TRACE(probe + " at " + std::to_string(at) + end + " / " +
                        std::to_string(blockSize));
           std::vector<bool> found;
+          log.Clear();
           detail::QueueFoldersWithEvents({f}, queue, found, {blockSize, false});
           EXPECT_EQ(found[0], inFolder);
+          EXPECT_EQ(log.Lines(),
+                    isEvent ? std::vector<std::string>()
+                            : std::vector<std::string>{"status_mgr:N Malformed command: " + probe});
           EXPECT_EQ(detail::IsReindexQueued(f, queue, {blockSize, false}), reindex);
         }
       }
