@@ -1,6 +1,5 @@
 #include "utils/block_reader.h"
 
-#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -15,31 +14,8 @@ namespace {
 
 // Of a malformed line longer than the block, what its log line shows.
 constexpr size_t kLogHead = size_t{64} << 10;
-// Blocks smaller than this are not worth a second thread, nor files of fewer than
-// kAheadBlocks blocks.
-constexpr size_t kAheadMinBlock = size_t{64} << 10;
-constexpr off_t kAheadBlocks = 4;
 
 }  // namespace
-
-BlockReader::BlockReader(int fd, off_t from, size_t blockSize)
-    : m_fd(fd),
-      m_base(from - std::min<off_t>(from, static_cast<off_t>(kWindow))),
-      m_skip(static_cast<size_t>(from - m_base)) {
-  blockSize = std::max<size_t>(blockSize, 1);
-  struct stat st {};
-  if (blockSize >= kAheadMinBlock && fstat(fd, &st) == 0 && S_ISREG(st.st_mode) &&
-      st.st_size - from >= kAheadBlocks * static_cast<off_t>(blockSize)) {
-    // Two buffers of half a block each hold what one buffer of a block holds.
-    blockSize /= 2;
-    m_room = kWindow + (blockSize / 8 & ~size_t{63});
-    m_spare.reset(new char[blockSize + kWindow]);  // NOLINT(modernize-make-unique): uninitialised
-  }
-  m_size = blockSize + kWindow;
-  m_buffer.reset(new char[m_size]);  // NOLINT(modernize-make-unique): uninitialised
-}
-
-BlockReader::~BlockReader() = default;
 
 // Reads the next line into `line`, capturing at most `limit` bytes of each path; false when
 // the file has nothing left. A read error ends the file where it happened.
@@ -58,11 +34,10 @@ bool BlockReader::Next(ReadLine& line, size_t limit) {
     if (m_eof || m_fill - m_pos + kWindow >= m_size) {
       break;  // the whole rest of the file, or a line longer than the block
     }
-    const size_t ahead = searched - m_pos;
-    Compact(m_pos);
-    Fill();
+    const size_t kept = Compact(m_pos);
+    searched -= kept;
     data = m_buffer.get();
-    searched = m_pos + ahead;
+    Fill();
   }
   if (newline == nullptr && m_pos == m_fill) {
     return false;
@@ -86,7 +61,7 @@ bool BlockReader::Next(ReadLine& line, size_t limit) {
 // (or fewer, from the start of the file) before it, when the buffer still holds them.
 bool BlockReader::TailWindow(off_t end, uint64_t& hash, size_t& size) const {
   size = static_cast<size_t>(std::min<off_t>(end, static_cast<off_t>(kWindow)));
-  if (end - static_cast<off_t>(size) < Offset(m_held) || end > Offset(m_fill)) {
+  if (end - static_cast<off_t>(size) < m_base || end > Offset(m_fill)) {
     return false;
   }
   const auto at = static_cast<size_t>(end - m_base);
@@ -106,25 +81,26 @@ void BlockReader::Start() {
 }
 
 // Moves the bytes from `kWindow` before `from` to the front; returns how far they moved.
-void BlockReader::Compact(size_t from) {
-  const size_t keep = std::max(from > kWindow ? from - kWindow : 0, m_held);
+size_t BlockReader::Compact(size_t from) {
+  const size_t keep = from > kWindow ? from - kWindow : 0;
   if (keep > 0) {
     m_indexed = false;
     std::memmove(m_buffer.get(), m_buffer.get() + keep, m_fill - keep);
     m_fill -= keep;
     m_pos -= std::min(m_pos, keep);
     m_base += static_cast<off_t>(keep);
-    m_held = 0;
-    AttachIndex(0, 0);
   }
+  return keep;
 }
+
 void BlockReader::Fill() {
-  if (m_ahead && m_ahead->Asked() == Offset(m_fill) && TakeAhead()) {
-    AskAhead();
-    return;
-  }
   while (!m_eof && m_fill < m_size) {
-    const ssize_t got = pread(m_fd, m_buffer.get() + m_fill, m_size - m_fill, Offset(m_fill));
+    size_t want = m_size - m_fill;
+    if (m_limit >= 0) {
+      want = static_cast<size_t>(
+          std::min<off_t>(static_cast<off_t>(want), std::max<off_t>(m_limit - Offset(m_fill), 0)));
+    }
+    const ssize_t got = want == 0 ? 0 : pread(m_fd, m_buffer.get() + m_fill, want, Offset(m_fill));
     if (got < 0 && errno == EINTR) {
       continue;
     }
@@ -140,59 +116,8 @@ void BlockReader::Fill() {
       }
     }
     m_fill += static_cast<size_t>(got);
-    AskAhead();
     return;
   }
-}
-
-void BlockReader::AskAhead() {
-  // The thread reads only past the file's first `m_room` bytes, which the reader reads itself:
-  // the head is collected, and the buffer taken over never begins before the file.
-  if (!m_spare || Offset(m_fill) <= static_cast<off_t>(m_room)) {
-    return;
-  }
-  if (!m_aheadTried) {
-    m_aheadTried = true;
-    m_ahead = ReadAhead::Start(m_fd);
-    if (m_ahead && !m_onlyReindex) {
-      const size_t words = (m_size + 63) / 64;
-      m_stops.reset(new uint64_t[words]);       // NOLINT(modernize-make-unique): uninitialised
-      m_spareStops.reset(new uint64_t[words]);  // NOLINT(modernize-make-unique)
-      AttachIndex(0, 0);
-    }
-  }
-  if (m_ahead) {
-    m_ahead->Ask(Offset(m_fill), m_spare.get() + m_room, m_size - m_room,
-                 m_spareStops ? m_spareStops.get() + m_room / 64 : nullptr);
-  }
-}
-
-bool BlockReader::TakeAhead() {
-  const ssize_t got = m_ahead->Wait();
-  if (got <= 0) {
-    return false;  // read again: the file may have grown since, and an error is seen again
-  }
-  char* const block = m_spare.get() + m_room;
-  if (m_fill <= m_room) {
-    // What the buffer carries goes just before the block; the bytes before it are no file's.
-    const size_t shift = m_room - m_fill;
-    std::memcpy(block - m_fill, m_buffer.get(), m_fill);
-    std::swap(m_buffer, m_spare);
-    std::swap(m_stops, m_spareStops);
-    m_base -= static_cast<off_t>(shift);
-    m_pos += shift;
-    m_held = shift;
-    m_fill = m_room + static_cast<size_t>(got);
-    AttachIndex(m_room, m_fill);
-  } else {
-    // A long line's part does not fit before the block: the block is copied after it, as much
-    // as there is room for.
-    const size_t copied = std::min(static_cast<size_t>(got), m_size - m_fill);
-    std::memcpy(m_buffer.get() + m_fill, block, copied);
-    m_fill += copied;
-  }
-  m_indexed = false;
-  return true;
 }
 
 // Brings more of a streamed line into `source`; false at its end.

@@ -15,7 +15,6 @@
 #include "utils/line_index.h"
 #include "utils/line_scanner.h"
 #include "utils/queue_reader.h"
-#include "utils/read_ahead.h"
 #include "utils/scan_bytes.h"
 
 namespace WEZO {
@@ -43,17 +42,19 @@ struct ReadLine {
 
 // Reads a file from an offset in blocks and hands out its lines. The buffer holds one block and
 // `kWindow` bytes more, so the bytes just before the point read to are at hand; it never grows.
-// A file of many blocks is read in half blocks, the next one read ahead on a second thread into
-// a second buffer (ReadAhead), which the reader then takes over with the part of a line it
-// carries placed before it.
 class BlockReader {
  public:
   // Lines are handed out from `from`; the `kWindow` bytes before it are read too, so that the
   // window before the point read to is at hand even when little was appended.
-  BlockReader(int fd, off_t from, size_t blockSize);
-  ~BlockReader();
-  BlockReader(const BlockReader&) = delete;
-  BlockReader& operator=(const BlockReader&) = delete;
+  BlockReader(int fd, off_t from, size_t blockSize)
+      : m_fd(fd),
+        m_size(std::max<size_t>(blockSize, 1) + kWindow),
+        m_buffer(new char[m_size]),
+        m_base(from - std::min<off_t>(from, static_cast<off_t>(kWindow))),
+        m_skip(static_cast<size_t>(from - m_base)) {}
+
+  // The file ends at `limit` for this reader.
+  void StopAt(off_t limit) { m_limit = limit; }
 
   // Reads the next line into `line`, capturing at most `limit` bytes of each path; false when
   // the file has nothing left. A read error ends the file where it happened.
@@ -248,24 +249,12 @@ class BlockReader {
     }
     return *m_index;
   }
-  // Reading ahead, the index keeps the stops in words of the buffer, which the thread fills for
-  // the blocks it reads: those of `from` to `to` are known.
-  void AttachIndex(size_t from, size_t to) {
-    if (m_stops) {
-      Index().Attach(m_buffer.get(), m_stops.get(), from / 64, to / 64);
-    }
-  }
 
   // Before the first line: the bytes read only for the window are passed over.
   void Start();
-  // Moves the bytes from `kWindow` before `from` to the front.
-  void Compact(size_t from);
-  // Reads more after what the buffer holds, or takes the block read ahead.
+  // Moves the bytes from `kWindow` before `from` to the front; returns how far they moved.
+  size_t Compact(size_t from);
   void Fill();
-  // After a fill: the next block asked of the thread, started at the first.
-  void AskAhead();
-  // The block read ahead made the buffer's continuation; false when there was none.
-  bool TakeAhead();
   // Brings more of a streamed line into `source`; false at its end.
   bool MoreOfLine(StreamSource& source);
   void Classify(ReadLine& line, const char* begin, const char* end, size_t limit) const;
@@ -273,28 +262,20 @@ class BlockReader {
   void Stream(ReadLine& line, size_t limit);
 
   int m_fd;
-  size_t m_size = 0;
+  size_t m_size;
   std::unique_ptr<char[]> m_buffer;  // left uninitialised: a short file touches little of it
   off_t m_base;                      // the file offset of the buffer's first byte
-  size_t m_held = 0;                 // the buffer's bytes before this are none of the file's
   size_t m_skip;                     // bytes at the start read only for the window
   size_t m_pos = 0;                  // where the part not yet handed out begins
   size_t m_fill = 0;                 // how much of the buffer holds read bytes
   bool m_eof = false;
+  off_t m_limit = -1;  // where the file ends for this reader, if set
   bool m_lineEnded = false;
   bool m_onlyReindex = false;
   std::unique_ptr<LineIndex> m_index;  // made at the first skim
   bool m_indexed = false;              // m_index describes the buffer as it is
   std::string m_head;
   std::string m_logHead;
-  // Reading ahead: the second buffer, the room at its front for the bytes carried over, and
-  // the thread (last, so that it is gone before the buffers it writes to).
-  std::unique_ptr<char[]> m_spare;
-  std::unique_ptr<uint64_t[]> m_stops;  // of each buffer, for a reader of plain lines
-  std::unique_ptr<uint64_t[]> m_spareStops;
-  size_t m_room = 0;
-  bool m_aheadTried = false;
-  std::unique_ptr<ReadAhead> m_ahead;
 };
 
 }  // namespace detail

@@ -5,13 +5,24 @@
 #define FILEINDEX_LINE_INDEX_X86 1
 #endif
 
-#include <algorithm>
 #include <atomic>
 #include <cstring>
 
 namespace WEZO {
 namespace FILEINDEX {
 namespace detail {
+
+// Takes what was found in one 64-byte chunk after another into the index.
+struct LineIndexBuild {
+  explicit LineIndexBuild(LineIndex& index) : ix(index) {}
+
+  // The chunk at `at` with its stops `stops`, one bit a byte.
+  __attribute__((always_inline)) inline void Stops(size_t at, uint64_t stops) {
+    ix.m_mask[at / 64] = stops;
+  }
+
+  LineIndex& ix;
+};
 
 namespace {
 
@@ -40,19 +51,20 @@ uint64_t Sse2Mask(const char* p) {
 #endif
 
 // The baseline build: SSE2 where the architecture has it, byte by byte elsewhere.
-void BuildPlain(uint64_t* masks, const char* p, size_t size) {
+void BuildPlain(LineIndex& index, const char* p, size_t size) {
+  LineIndexBuild build(index);
   size_t at = 0;
   for (; at + 64 <= size; at += 64) {
 #if defined(__SSE2__)
-    masks[at / 64] = Sse2Mask(p + at);
+    build.Stops(at, Sse2Mask(p + at));
 #else
-    masks[at / 64] = ScalarMask(p + at);
+    build.Stops(at, ScalarMask(p + at));
 #endif
   }
   if (at < size) {
     char pad[64] = {};
     std::memcpy(pad, p + at, size - at);
-    masks[at / 64] = ScalarMask(pad);
+    build.Stops(at, ScalarMask(pad));
   }
 }
 
@@ -74,15 +86,16 @@ __attribute__((target("avx2"), always_inline)) inline uint64_t Avx2Mask(const ch
   return maskLo | (static_cast<uint64_t>(maskHi) << 32);
 }
 
-__attribute__((target("avx2"))) void BuildAvx2(uint64_t* masks, const char* p, size_t size) {
+__attribute__((target("avx2"))) void BuildAvx2(LineIndex& index, const char* p, size_t size) {
+  LineIndexBuild build(index);
   size_t at = 0;
   for (; at + 64 <= size; at += 64) {
-    masks[at / 64] = Avx2Mask(p + at);
+    build.Stops(at, Avx2Mask(p + at));
   }
   if (at < size) {
     char pad[64] = {};
     std::memcpy(pad, p + at, size - at);
-    masks[at / 64] = Avx2Mask(pad);
+    build.Stops(at, Avx2Mask(pad));
   }
 }
 
@@ -224,48 +237,17 @@ std::atomic<bool> g_baselineOnly{false};
 
 void UseBaselineLineIndex(bool baseline) { g_baselineOnly = baseline; }
 
-void LineIndex::Mark(const char* p, size_t size, uint64_t* masks) {
-#if defined(FILEINDEX_LINE_INDEX_X86)
-  if (HasAvx2() && !g_baselineOnly.load(std::memory_order_relaxed)) {
-    BuildAvx2(masks, p, size);
-    return;
-  }
-#endif
-  BuildPlain(masks, p, size);
-}
-
 void LineIndex::Build(const char* begin, const char* end) {
   m_begin = begin;
   m_end = end;
-  if (!m_attached) {
-    m_base = begin;
-    m_masks = m_own;
-    Mark(begin, static_cast<size_t>(end - begin), m_own);
+  const auto size = static_cast<size_t>(end - begin);
+#if defined(FILEINDEX_LINE_INDEX_X86)
+  if (HasAvx2() && !g_baselineOnly.load(std::memory_order_relaxed)) {
+    BuildAvx2(*this, begin, size);
     return;
   }
-  // The whole chunks of the stretch not known yet, then the chunk it ends in, if it ends in
-  // one: what follows the stretch there may not be read yet, so that chunk does not count as
-  // known.
-  const auto first = static_cast<size_t>(begin - m_base) / 64;
-  const auto whole = static_cast<size_t>(end - m_base) / 64;
-  if (m_readyFrom >= m_readyTo) {
-    MarkChunks(first, whole);
-    m_readyFrom = first;
-    m_readyTo = std::max(first, whole);
-  } else {
-    MarkChunks(first, std::min(whole, m_readyFrom));
-    MarkChunks(std::max(first, m_readyTo), whole);
-    if (first < m_readyFrom && whole >= m_readyFrom) {
-      m_readyFrom = first;
-    }
-    if (whole > m_readyTo && first <= m_readyTo) {
-      m_readyTo = whole;
-    }
-  }
-  const char* const tail = m_base + whole * 64;
-  if (tail < end && (whole < m_readyFrom || whole >= m_readyTo)) {
-    Mark(tail, static_cast<size_t>(end - tail), m_masks + whole);
-  }
+#endif
+  BuildPlain(*this, begin, size);
 }
 
 const char* NextReindexHint(const char* begin, const char* from, const char* end) {

@@ -13,27 +13,11 @@ namespace WEZO {
 namespace FILEINDEX {
 namespace detail {
 
-// The stops of a stretch, 64 bytes a step. On its own, the index keeps the stops of the stretch
-// it looks at; attached to a buffer, it keeps them in the buffer's words, one per 64 bytes from
-// the buffer's start, where a thread that read the buffer may have found them already.
+// The stops of a stretch, 64 bytes a step.
 class LineIndex {
  public:
   // Bytes looked at at once: the stretch and what is found in it stay in the first-level caches.
   static constexpr size_t kSpan = size_t{16} << 10;
-
-  // The stops of the `size` bytes at `p`, one word per 64 bytes into `masks` (the last word
-  // for the bytes there are).
-  static void Mark(const char* p, size_t size, uint64_t* masks);
-
-  // From now on the stops of the buffer at `base` are kept in `masks`, those of its 64-byte
-  // chunks [from, to) already found.
-  void Attach(const char* base, uint64_t* masks, size_t from, size_t to) {
-    m_base = base;
-    m_masks = masks;
-    m_readyFrom = from;
-    m_readyTo = to;
-    m_attached = true;
-  }
 
   // Looks at [begin, end), at most `kSpan` bytes.
   void Build(const char* begin, const char* end);
@@ -43,31 +27,21 @@ class LineIndex {
 
   // The first stop at or after `from`, when the caller knows that there is one before End.
   const char* NextStop(const char* from) const {
-    const auto at = static_cast<size_t>(from - m_base);
+    const auto at = static_cast<size_t>(from - m_begin);
     size_t chunk = at / 64;
-    uint64_t mask = m_masks[chunk] & (~uint64_t{0} << (at % 64));
+    uint64_t mask = m_mask[chunk] & (~uint64_t{0} << (at % 64));
     while (mask == 0) {
-      mask = m_masks[++chunk];
+      mask = m_mask[++chunk];
     }
-    return m_base + chunk * 64 + static_cast<size_t>(__builtin_ctzll(mask));
+    return m_begin + chunk * 64 + static_cast<size_t>(__builtin_ctzll(mask));
   }
 
  private:
-  // Finds the stops of the whole chunks [from, to) of the buffer attached.
-  void MarkChunks(size_t from, size_t to) {
-    if (from < to) {
-      Mark(m_base + from * 64, (to - from) * 64, m_masks + from);
-    }
-  }
+  friend struct LineIndexBuild;
 
   const char* m_begin = nullptr;
   const char* m_end = nullptr;
-  const char* m_base = nullptr;  // where the chunks begin
-  uint64_t* m_masks = nullptr;   // per 64 bytes from m_base, which are stops
-  bool m_attached = false;
-  size_t m_readyFrom = 0;  // attached: the chunks whose stops are known
-  size_t m_readyTo = 0;
-  uint64_t m_own[kSpan / 64];  // on its own
+  uint64_t m_mask[kSpan / 64];  // per 64 bytes, which are stops
 };
 
 // The first byte in [from, end) where the text of a number that reads as 65536 could be: where

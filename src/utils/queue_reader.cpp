@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <atomic>
 #include <cerrno>
 #include <climits>
 #include <cstdint>
@@ -16,6 +17,7 @@
 #include <memory>
 #include <mutex>
 #include <string_view>
+#include <thread>
 #include <unordered_map>
 #include <unordered_set>
 #include <utility>
@@ -27,6 +29,7 @@
 #include "utils/block_reader.h"
 #include "utils/folder_set.h"
 #include "utils/log.h"
+#include "utils/quiet_thread.h"
 #include "utils/scan_bytes.h"
 #include "utils/storage.h"
 
@@ -51,6 +54,10 @@ constexpr size_t kRememberedPath = 4096;
 constexpr size_t kMaxRemembered = 4096;
 // Queue files remembered at once; past it, the entry read longest ago goes.
 constexpr size_t kMaxFiles = 64;
+// The folder test reads a file in two halves at once when it has this many blocks to read, of at
+// least this size.
+constexpr off_t kSplitBlocks = 4;
+constexpr size_t kSplitMinBlock = size_t{64} << 10;
 
 int LogWidth(size_t size) { return static_cast<int>(std::min<size_t>(size, INT_MAX)); }
 
@@ -162,9 +169,18 @@ bool StillTheSame(int fd, const FileState& state) {
          Hash(bytes.data(), bytes.size()) == state.tailHash;
 }
 
-// Describes what `reader` read, up to the end of the last complete line `end`, of the file at
-// `fd`; false when it cannot be described (the bytes before `end` are no longer at hand).
-bool Describe(int fd, const BlockReader& reader, off_t end, const FileState* before,
+// The hash of the `kWindow` bytes (or fewer, from the start of the file) before a point read to,
+// when the reader still held them.
+struct Tail {
+  bool ok = false;
+  uint64_t hash = 0;
+  size_t size = 0;
+};
+
+// Describes what was read, up to the end of the last complete line `end`, of the file at `fd`,
+// from the first bytes of the file `head` (when read from its start) and the window before
+// `end`; false when it cannot be described (the bytes are no longer at hand).
+bool Describe(int fd, const std::string& head, const Tail& tail, off_t end, const FileState* before,
               FileState& out) {
   struct stat st {};
   if (fstat(fd, &st) != 0) {
@@ -177,9 +193,11 @@ bool Describe(int fd, const BlockReader& reader, off_t end, const FileState* bef
     out = *before;
     return true;
   }
-  if (!reader.TailWindow(end, out.tailHash, out.tailSize)) {
+  if (!tail.ok) {
     return false;
   }
+  out.tailHash = tail.hash;
+  out.tailSize = tail.size;
   if (before != nullptr &&
       static_cast<off_t>(before->headSize) == std::min<off_t>(end, static_cast<off_t>(kWindow))) {
     out.headSize = before->headSize;
@@ -187,11 +205,18 @@ bool Describe(int fd, const BlockReader& reader, off_t end, const FileState* bef
     return true;
   }
   out.headSize = static_cast<size_t>(std::min<off_t>(end, static_cast<off_t>(kWindow)));
-  if (reader.Head().size() < out.headSize) {
+  if (head.size() < out.headSize) {
     return false;
   }
-  out.headHash = Hash(reader.Head().data(), out.headSize);
+  out.headHash = Hash(head.data(), out.headSize);
   return true;
+}
+
+bool Describe(int fd, const BlockReader& reader, off_t end, const FileState* before,
+              FileState& out) {
+  Tail tail;
+  tail.ok = reader.TailWindow(end, tail.hash, tail.size);
+  return Describe(fd, reader.Head(), tail, end, before, out);
 }
 
 // True when nothing that could be a queue is at `queueFile`: it is missing, or it is not a regular
@@ -217,13 +242,10 @@ inline const char* AfterDismissed(const detail::LineIndex& index, const char* p,
   return newline + 1;
 }
 
-// Passes over the plain lines from `p` in the stretch of `index` whose paths `set` dismisses at
-// once, and returns where the first other line begins (or the stretch's end). Where a line ends
-// is known only once it is read, so one walk waits on each line before the next; the stretch is
-// walked from its start and from its middle at once, and the second walk counts only once the
-// first reaches where it began. The common line costs no call here, so that the walks stay in
-// registers from one line to the next.
-__attribute__((noinline)) const char* PassDismissed(const detail::LineIndex& index, const char* p,
+// WalkDismissed from `p` on, a stretch of at least 1 KiB walked from its start and from its
+// middle at once; the second walk counts only once the first reaches where it began. Kept apart
+// from PassDismissed, so that the walks stay in registers from one line to the next.
+__attribute__((noinline)) const char* WalkDismissed(const detail::LineIndex& index, const char* p,
                                                     const FolderSet& set) {
   const char* const end = index.End();
   const char* mid = end;
@@ -258,6 +280,127 @@ __attribute__((noinline)) const char* PassDismissed(const detail::LineIndex& ind
     second = next;
   }
   return second;
+}
+
+// Passes over the plain lines from `p` in the stretch of `index` whose paths `set` dismisses at
+// once, and returns where the first other line begins (or the stretch's end). Where a line ends
+// is known only once it is read, so one walk waits on each line before the next: after the
+// first line, the rest goes to WalkDismissed. A line that is not dismissed costs one reading here.
+__attribute__((noinline)) const char* PassDismissed(const detail::LineIndex& index, const char* p,
+                                                    const FolderSet& set) {
+  const char* const next = AfterDismissed(index, p, set);
+  return next == nullptr ? p : WalkDismissed(index, next, set);
+}
+
+// What a pass over lines found of the folders.
+struct FolderPass {
+  std::vector<bool> found;
+  size_t left = 0;            // asked folders not found
+  std::vector<size_t> marks;  // folders found in the line read last
+  bool lastEnded = true;
+  off_t end = 0;  // after the last complete line read
+};
+
+// Reads the lines of `reader` into `pass` while asked folders are left. With `quietUpTo` at 0 or
+// more, a malformed line that ends after it is logged and read past; below 0 (the second half
+// of a file), the pass stops before a malformed line or a last line without "\n", which the
+// caller's thread reads, and once `cancel` is set.
+void ReadFolders(BlockReader& reader, const std::vector<std::string>& wanted,
+                 const std::vector<bool>& asked, FolderPass& pass, off_t quietUpTo,
+                 const std::atomic<bool>* cancel) {
+  FolderSet set(wanted, pass.found);
+  ReadLine line;
+  // Plain lines are tested straight from the buffer.
+  struct {
+    bool moved = false;
+    std::string_view path;
+    std::string_view pathOld;
+  } plain;
+  const auto test = [&](const detail::LineIndex& index, const char* begin, const char*& newline) {
+    const char* const after = PassDismissed(index, begin, set);
+    if (after != begin) {
+      newline = after - 1;
+      pass.marks.clear();
+      pass.lastEnded = true;
+      return BlockReader::Take::kSkip;
+    }
+    newline = BlockReader::PlainLine(index, begin, plain.moved, plain.path, plain.pathOld);
+    if (newline == nullptr) {
+      return BlockReader::Take::kRefuse;
+    }
+    pass.marks.clear();
+    pass.left -= set.Mark(plain.path, plain.path.size(), asked, pass.found, pass.marks);
+    if (plain.moved) {
+      pass.left -= set.Mark(plain.pathOld, plain.pathOld.size(), asked, pass.found, pass.marks);
+    }
+    pass.lastEnded = true;
+    return pass.left > 0 && (cancel == nullptr || !cancel->load(std::memory_order_relaxed))
+               ? BlockReader::Take::kSkip
+               : BlockReader::Take::kStop;
+  };
+  while (pass.left > 0 && (cancel == nullptr || !cancel->load(std::memory_order_relaxed)) &&
+         reader.SkimPlain(test, pass.end) && reader.Next(line, set.Limit())) {
+    if (quietUpTo < 0 && (!line.isEvent || !line.ended)) {
+      break;
+    }
+    pass.marks.clear();
+    if (!line.isEvent) {
+      if (line.stop > quietUpTo) {
+        detail::WriteLog(false, kFolderUnit, __LINE__, "Malformed command: %.*s",
+                         LogWidth(line.text.size()), line.text.data());
+      }
+    } else {
+      pass.left -= set.Mark(line.path, line.pathSize, asked, pass.found, pass.marks);
+      if (line.event.event == static_cast<unsigned int>(kEventMoved)) {
+        pass.left -= set.Mark(line.pathOld, line.pathOldSize, asked, pass.found, pass.marks);
+      }
+    }
+    pass.lastEnded = line.ended;
+    if (line.ended) {
+      pass.end = line.stop;
+    }
+  }
+}
+
+// What the second thread found in the second half of a file. The thread is joined before this
+// goes, whatever way the reading ends.
+struct SecondHalf {
+  SecondHalf() = default;
+  SecondHalf(const SecondHalf&) = delete;
+  SecondHalf& operator=(const SecondHalf&) = delete;
+  ~SecondHalf() { Join(true); }
+
+  // Waits for the thread, after telling it to stop at once with `cancel`.
+  void Join(bool stop) {
+    if (thread.joinable()) {
+      cancel = stop;
+      thread.join();
+    }
+  }
+
+  FolderPass pass;
+  Tail tail;
+  bool failed = false;
+  std::atomic<bool> cancel{false};
+  std::thread thread;
+};
+
+// Where a second thread may begin reading the file at `fd` from `from`: the start of the first
+// line that begins in the half block after its middle, or 0 when the file is too small to be worth
+// it or no line begins there.
+off_t SplitPoint(int fd, off_t from, size_t blockSize) {
+  struct stat st {};
+  if (blockSize < kSplitMinBlock || fstat(fd, &st) != 0 || !S_ISREG(st.st_mode) ||
+      st.st_size - from < kSplitBlocks * static_cast<off_t>(blockSize)) {
+    return 0;
+  }
+  const off_t middle = from + (st.st_size - from) / 2;
+  std::string bytes;
+  if (!ReadExactly(fd, middle - 1, blockSize / 2, bytes)) {
+    return 0;
+  }
+  const size_t newline = bytes.find('\n');
+  return newline == std::string::npos ? 0 : middle + static_cast<off_t>(newline);
 }
 
 // The folder test of one open file, with what the process remembers of it.
@@ -307,57 +450,66 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
 
   const off_t from = subset ? entry.file.offset : 0;
   const off_t quietUpTo = have ? entry.logged : 0;
-  std::vector<size_t> marks;  // folders found in the line read last
-  bool lastEnded = true;
-  off_t end = from;
-  std::unique_ptr<BlockReader> reader;
-  if (left > 0) {
-    FolderSet set(wanted, wantedFound);
-    reader = std::make_unique<BlockReader>(fd, from, options.blockSize);
-    ReadLine line;
-    // Plain lines are tested straight from the buffer.
-    bool moved = false;
-    std::string_view path;
-    std::string_view pathOld;
-    const auto test = [&](const detail::LineIndex& index, const char* begin, const char*& newline) {
-      const char* const after = PassDismissed(index, begin, set);
-      if (after != begin) {
-        newline = after - 1;
-        marks.clear();
-        lastEnded = true;
-        return BlockReader::Take::kSkip;
-      }
-      newline = BlockReader::PlainLine(index, begin, moved, path, pathOld);
-      if (newline == nullptr) {
-        return BlockReader::Take::kRefuse;
-      }
-      marks.clear();
-      left -= set.Mark(path, path.size(), asked, wantedFound, marks);
-      if (moved) {
-        left -= set.Mark(pathOld, pathOld.size(), asked, wantedFound, marks);
-      }
-      lastEnded = true;
-      return left > 0 ? BlockReader::Take::kSkip : BlockReader::Take::kStop;
-    };
-    while (left > 0 && reader->SkimPlain(test, end) && reader->Next(line, set.Limit())) {
-      marks.clear();
-      if (!line.isEvent) {
-        if (line.stop > quietUpTo) {
-          detail::WriteLog(false, kFolderUnit, __LINE__, "Malformed command: %.*s",
-                           LogWidth(line.text.size()), line.text.data());
+  FolderPass pass;
+  pass.found = std::move(wantedFound);
+  pass.left = left;
+  pass.end = from;
+  Tail tail;
+  const BlockReader* head = nullptr;
+  std::unique_ptr<BlockReader> first;
+  std::unique_ptr<BlockReader> last;
+  if (pass.left > 0) {
+    // A large file is read in two halves at once: this thread reads the first, a second thread
+    // the second, as far as it holds nothing but events. This thread then takes over what the
+    // second found and reads on from where it stopped.
+    const off_t split = SplitPoint(fd, from, options.blockSize);
+    SecondHalf second;
+    if (split > 0) {
+      second.pass.found = pass.found;
+      second.pass.left = pass.left;
+      second.pass.end = split;
+      second.thread = detail::StartQuietThread([&] {
+        try {
+          BlockReader reader(fd, split, options.blockSize / 2);
+          ReadFolders(reader, wanted, asked, second.pass, -1, &second.cancel);
+          second.tail.ok = reader.TailWindow(second.pass.end, second.tail.hash, second.tail.size);
+        } catch (...) {
+          second.failed = true;  // this thread reads the second half itself
         }
-      } else {
-        left -= set.Mark(line.path, line.pathSize, asked, wantedFound, marks);
-        if (line.event.event == static_cast<unsigned int>(kEventMoved)) {
-          left -= set.Mark(line.pathOld, line.pathOldSize, asked, wantedFound, marks);
+      });
+    }
+    const bool halves = second.thread.joinable();
+    first =
+        std::make_unique<BlockReader>(fd, from, halves ? options.blockSize / 2 : options.blockSize);
+    if (halves) {
+      first->StopAt(split);
+    }
+    ReadFolders(*first, wanted, asked, pass, quietUpTo, nullptr);
+    head = first.get();
+    tail.ok = first->TailWindow(pass.end, tail.hash, tail.size);
+    if (halves) {
+      second.Join(pass.end != split);
+      if (pass.end == split && !second.failed) {
+        for (size_t i = 0; i < pass.found.size(); ++i) {
+          if (second.pass.found[i] && !pass.found[i]) {
+            pass.found[i] = true;
+            pass.left -= asked[i] ? 1 : 0;
+          }
         }
-      }
-      lastEnded = line.ended;
-      if (line.ended) {
-        end = line.stop;
+        pass.end = second.pass.end;
+        tail = second.tail;
+        if (pass.left > 0) {
+          last = std::make_unique<BlockReader>(fd, pass.end, options.blockSize);
+          ReadFolders(*last, wanted, asked, pass, quietUpTo, nullptr);
+          tail.ok = last->TailWindow(pass.end, tail.hash, tail.size);
+        }
       }
     }
   }
+  wantedFound = std::move(pass.found);
+  const off_t end = pass.end;
+  const std::vector<size_t>& marks = pass.marks;
+  const bool lastEnded = pass.lastEnded;
   // What a last line without "\n" found counts now, but is not remembered.
   std::vector<bool> complete = wantedFound;
   if (!lastEnded) {
@@ -372,9 +524,9 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
     return;
   }
   FolderEntry next;
-  if (reader == nullptr) {
+  if (head == nullptr) {
     next.file = entry.file;
-  } else if (!Describe(fd, *reader, end, subset ? &entry.file : nullptr, next.file)) {
+  } else if (!Describe(fd, head->Head(), tail, end, subset ? &entry.file : nullptr, next.file)) {
     return;
   }
   for (size_t i = 0; i < wanted.size(); ++i) {
