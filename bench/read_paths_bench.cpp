@@ -325,7 +325,10 @@ class Sandbox {
     }
     if (!WriteQueuesA() || !WriteQueuesB()) {
       m_error = "cannot write the queues";
+      return;
     }
+    // The queues' writeback would otherwise run during the first measurements.
+    sync();
   }
 
   ~Sandbox() {
