@@ -212,13 +212,6 @@ bool Describe(int fd, const std::string& head, const Tail& tail, off_t end, cons
   return true;
 }
 
-bool Describe(int fd, const BlockReader& reader, off_t end, const FileState* before,
-              FileState& out) {
-  Tail tail;
-  tail.ok = reader.TailWindow(end, tail.hash, tail.size);
-  return Describe(fd, reader.Head(), tail, end, before, out);
-}
-
 // True when nothing that could be a queue is at `queueFile`: it is missing, or it is not a regular
 // file. Anything else that keeps it from being looked at (a link on the way, no descriptor left)
 // is for the open to report.
@@ -290,6 +283,46 @@ __attribute__((noinline)) const char* PassDismissed(const detail::LineIndex& ind
                                                     const FolderSet& set) {
   const char* const next = AfterDismissed(index, p, set);
   return next == nullptr ? p : WalkDismissed(index, next, set);
+}
+
+// What a reading of lines found of reindex events.
+struct ReindexPass {
+  bool queued = false;                    // one for the path asked about
+  bool keep = false;                      // whether `paths` holds every one read
+  std::unordered_set<std::string> paths;  // while kept
+  off_t end = 0;                          // after the last complete line read
+};
+
+// Reads the lines of `reader` into `pass` until a reindex event of `path` (with at most `limit`
+// bytes of each path captured), the end of the file, or `cancel`.
+void ReadReindex(BlockReader& reader, const std::string& path, size_t limit, ReindexPass& pass,
+                 const std::atomic<bool>* cancel) {
+  reader.OnlyReindexEvents();
+  ReadLine line;
+  while (!pass.queued && (cancel == nullptr || !cancel->load(std::memory_order_relaxed))) {
+    // Lines without a hint of a reindex event are passed over in bulk.
+    reader.SkipUnhinted(pass.end);
+    if (!reader.Next(line, limit)) {
+      break;
+    }
+    if (!line.isEvent || line.event.event != static_cast<unsigned int>(kEventReindex)) {
+      if (line.ended) {
+        pass.end = line.stop;
+      }
+      continue;
+    }
+    pass.queued = line.pathSize == path.size() && line.path == path;
+    if (!line.ended) {
+      continue;
+    }
+    pass.end = line.stop;
+    if (pass.keep) {
+      pass.keep = line.pathSize <= kRememberedPath && pass.paths.size() < kMaxRemembered;
+      if (pass.keep) {
+        pass.paths.emplace(line.path);
+      }
+    }
+  }
 }
 
 // What a pass over lines found of the folders.
@@ -364,13 +397,30 @@ void ReadFolders(BlockReader& reader, const std::vector<std::string>& wanted,
 
 // What the second thread found in the second half of a file. The thread is joined before this
 // goes, whatever way the reading ends.
+template <class Pass>
 struct SecondHalf {
   SecondHalf() = default;
   SecondHalf(const SecondHalf&) = delete;
   SecondHalf& operator=(const SecondHalf&) = delete;
   ~SecondHalf() { Join(true); }
 
-  // Waits for the thread, after telling it to stop at once with `cancel`.
+  // Runs `read(reader)` on a second thread over the file at `fd` from `split`, in blocks of
+  // `blockSize`; false when no thread could be started.
+  template <class F>
+  bool Start(int fd, off_t split, size_t blockSize, F&& read) {
+    thread = detail::StartQuietThread([this, fd, split, blockSize, read] {
+      try {
+        BlockReader reader(fd, split, blockSize);
+        read(reader);
+        tail.ok = reader.TailWindow(pass.end, tail.hash, tail.size);
+      } catch (...) {
+        failed = true;  // the caller's thread reads the second half itself
+      }
+    });
+    return thread.joinable();
+  }
+
+  // Waits for the thread, after telling it to stop at once with `stop`.
   void Join(bool stop) {
     if (thread.joinable()) {
       cancel = stop;
@@ -378,7 +428,7 @@ struct SecondHalf {
     }
   }
 
-  FolderPass pass;
+  Pass pass;
   Tail tail;
   bool failed = false;
   std::atomic<bool> cancel{false};
@@ -463,22 +513,16 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
     // the second, as far as it holds nothing but events. This thread then takes over what the
     // second found and reads on from where it stopped.
     const off_t split = SplitPoint(fd, from, options.blockSize);
-    SecondHalf second;
+    SecondHalf<FolderPass> second;
+    bool halves = false;
     if (split > 0) {
       second.pass.found = pass.found;
       second.pass.left = pass.left;
       second.pass.end = split;
-      second.thread = detail::StartQuietThread([&] {
-        try {
-          BlockReader reader(fd, split, options.blockSize / 2);
-          ReadFolders(reader, wanted, asked, second.pass, -1, &second.cancel);
-          second.tail.ok = reader.TailWindow(second.pass.end, second.tail.hash, second.tail.size);
-        } catch (...) {
-          second.failed = true;  // this thread reads the second half itself
-        }
+      halves = second.Start(fd, split, options.blockSize / 2, [&](BlockReader& reader) {
+        ReadFolders(reader, wanted, asked, second.pass, -1, &second.cancel);
       });
     }
-    const bool halves = second.thread.joinable();
     first =
         std::make_unique<BlockReader>(fd, from, halves ? options.blockSize / 2 : options.blockSize);
     if (halves) {
@@ -607,43 +651,52 @@ bool IsReindexQueued(const std::string& path, const std::string& queueFile,
   }
   // Every reindex path is collected for later questions; one too long to keep, or too many,
   // and the file is not remembered.
-  bool keep = options.remember;
   const size_t limit = std::max(path.size() + 1, kRememberedPath);
-  BlockReader reader(fd.get(), have ? entry.file.offset : 0, options.blockSize);
-  reader.OnlyReindexEvents();
-  ReadLine line;
-  bool queued = false;
-  off_t end = have ? entry.file.offset : 0;
-  while (!queued) {
-    // Lines without a hint of a reindex event are passed over in bulk.
-    reader.SkipUnhinted(end);
-    if (!reader.Next(line, limit)) {
-      break;
-    }
-    if (!line.isEvent || line.event.event != static_cast<unsigned int>(kEventReindex)) {
-      if (line.ended) {
-        end = line.stop;
-      }
-      continue;
-    }
-    queued = line.pathSize == path.size() && line.path == path;
-    if (!line.ended) {
-      continue;
-    }
-    end = line.stop;
-    if (keep) {
-      keep = line.pathSize <= kRememberedPath && entry.paths.size() < kMaxRemembered;
-      if (keep) {
-        entry.paths.emplace(line.path);
+  const off_t from = have ? entry.file.offset : 0;
+  ReindexPass pass;
+  pass.keep = options.remember;
+  pass.paths = std::move(entry.paths);
+  pass.end = from;
+  // A large file is read in two halves at once, as by the folder test; this thread takes over
+  // what the second found when the first half holds no reindex event of the path.
+  const off_t split = SplitPoint(fd.get(), from, options.blockSize);
+  SecondHalf<ReindexPass> second;
+  bool halves = false;
+  if (split > 0) {
+    second.pass.keep = pass.keep;
+    second.pass.end = split;
+    halves = second.Start(fd.get(), split, options.blockSize / 2, [&](BlockReader& reader) {
+      ReadReindex(reader, path, limit, second.pass, &second.cancel);
+    });
+  }
+  BlockReader reader(fd.get(), from, halves ? options.blockSize / 2 : options.blockSize);
+  if (halves) {
+    reader.StopAt(split);
+  }
+  ReadReindex(reader, path, limit, pass, nullptr);
+  Tail tail;
+  tail.ok = reader.TailWindow(pass.end, tail.hash, tail.size);
+  if (halves) {
+    second.Join(pass.queued || pass.end != split);
+    if (!pass.queued && pass.end == split && !second.failed) {
+      pass.queued = second.pass.queued;
+      pass.end = second.pass.end;
+      tail = second.tail;
+      pass.keep = pass.keep && second.pass.keep;
+      if (pass.keep) {
+        pass.paths.insert(second.pass.paths.begin(), second.pass.paths.end());
+        pass.keep = pass.paths.size() <= kMaxRemembered;
       }
     }
   }
   FileState state;
-  if (keep && Describe(fd.get(), reader, end, have ? &entry.file : nullptr, state)) {
+  if (pass.keep &&
+      Describe(fd.get(), reader.Head(), tail, pass.end, have ? &entry.file : nullptr, state)) {
     entry.file = state;
+    entry.paths = std::move(pass.paths);
     ReindexMemory().Put(queueFile, std::move(entry));
   }
-  return queued;
+  return pass.queued;
 }
 
 bool QueueFoldersWithEvents(const std::vector<std::string>& fullPaths, const std::string& queueFile,
