@@ -445,12 +445,23 @@ off_t SplitPoint(int fd, off_t from, size_t blockSize) {
     return 0;
   }
   const off_t middle = from + (st.st_size - from) / 2;
-  std::string bytes;
-  if (!ReadExactly(fd, middle - 1, blockSize / 2, bytes)) {
-    return 0;
+  // A few KiB at a time, so that a long line at the middle costs no memory.
+  char bytes[kWindow];
+  for (off_t at = middle - 1; at < middle - 1 + static_cast<off_t>(blockSize / 2);) {
+    const ssize_t got = pread(fd, bytes, sizeof bytes, at);
+    if (got < 0 && errno == EINTR) {
+      continue;
+    }
+    if (got <= 0) {
+      return 0;
+    }
+    const void* newline = std::memchr(bytes, '\n', static_cast<size_t>(got));
+    if (newline != nullptr) {
+      return at + (static_cast<const char*>(newline) - bytes) + 1;
+    }
+    at += got;
   }
-  const size_t newline = bytes.find('\n');
-  return newline == std::string::npos ? 0 : middle + static_cast<off_t>(newline);
+  return 0;
 }
 
 // The folder test of one open file, with what the process remembers of it.
