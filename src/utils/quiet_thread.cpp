@@ -1,7 +1,7 @@
 #include "utils/quiet_thread.h"
 
 #include <pthread.h>
-#include <signal.h>
+#include <csignal>
 
 #include <system_error>
 #include <utility>
