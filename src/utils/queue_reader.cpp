@@ -235,9 +235,9 @@ inline const char* AfterDismissed(const detail::LineIndex& index, const char* p,
   return newline + 1;
 }
 
-// WalkDismissed from `p` on, a stretch of at least 1 KiB walked from its start and from its
-// middle at once; the second walk counts only once the first reaches where it began. Kept apart
-// from PassDismissed, so that the walks stay in registers from one line to the next.
+// PassDismissed's walk from `p`: the stretch is walked from `p` and from its middle at once, and
+// the second walk counts only once the first reaches where it began. The common line costs no
+// call here, so that the walks stay in registers from one line to the next.
 __attribute__((noinline)) const char* WalkDismissed(const detail::LineIndex& index, const char* p,
                                                     const FolderSet& set) {
   const char* const end = index.End();
