@@ -67,7 +67,7 @@ TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAllAndLoadTellsItsFailures) {
   }
   EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);
   // A symbolic link in the file's place counts as no file; it is replaced, not written through.
-  const std::string real = sandbox.Path("/real.conf");
+  const std::string real = At("/real.conf");
   ASSERT_EQ(rename(FolderConfPath().c_str(), real.c_str()), 0);
   ASSERT_EQ(symlink(real.c_str(), FolderConfPath().c_str()), 0);
   TestConfig cfg;
@@ -86,7 +86,7 @@ TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAllAndLoadTellsItsFailures) {
   EXPECT_FALSE(cfg.SaveJson());
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_SAVE_JSON);
   EXPECT_EQ(log.Lines(), Lines{"config:N Failed to save json to " + FolderConfPath()});
-  const auto entries = std::filesystem::directory_iterator(sandbox.Path("/usr/wezo/etc/fileindex"));
+  const auto entries = std::filesystem::directory_iterator(At("/usr/wezo/etc/fileindex"));
   EXPECT_EQ(std::distance(entries, {}), 1);  // no temporary file is left
 }
 
@@ -127,7 +127,7 @@ TEST_F(ConfigTest, LockAdmitsOnlySharedBesideSharedAndKeepsItsFilePrivate) {
 
 TEST_F(ConfigTest, LockFileThatOthersCouldHoldIsRefused) {
   const std::string lock = FolderLockPath();
-  const std::string other = sandbox.Path("/other");
+  const std::string other = At("/other");
   testsupport::WriteFile(other, "precious");
   ASSERT_EQ(chmod(other.c_str(), 0644), 0);
   const std::string refused = "config:N Lock file refused, not a regular file of uid " +
@@ -168,7 +168,7 @@ TEST_F(ConfigTest, TextIsOneLineAndOnlyOneWholeValueIsRead) {
 }
 
 TEST_F(ConfigTest, RemovesOnlyOldTemporariesOfTheFile) {
-  const std::string dir = sandbox.Path("/usr/wezo/etc/fileindex/");
+  const std::string dir = At("/usr/wezo/etc/fileindex/");
   const struct Case {
     const char* name;
     bool old, removed;  // a new one's writer may still be saving

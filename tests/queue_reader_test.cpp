@@ -14,7 +14,6 @@
 
 #include "fileindex/utils.h"
 #include "test_support.h"
-#include "utils/folder_set.h"
 #include "utils/line_index.h"
 
 namespace WEZO::FILEINDEX {
@@ -61,7 +60,7 @@ class QueueReaderTest : public testsupport::LibraryTest {
     testsupport::WriteFile(queue, text);
     return queue;
   }
-  std::string queue = sandbox.Path("/queue");
+  std::string queue = At("/queue");
 };
 
 TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
@@ -111,8 +110,8 @@ TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
 
 // A queue that is missing or is no file is no error; a path outside every share is.
 TEST_F(QueueReaderTest, QueueThatCannotBeReadAnswersFalse) {
-  ASSERT_EQ(mkdir(sandbox.Path("/dir").c_str(), 0755), 0);
-  for (const std::string& none : {sandbox.Path("/missing"), sandbox.Path("/dir")}) {
+  ASSERT_EQ(mkdir(At("/dir").c_str(), 0755), 0);
+  for (const std::string& none : {At("/missing"), At("/dir")}) {
     EXPECT_FALSE(IsReindexQueued(volume + "/photo/a", none));
     EXPECT_FALSE(QueueHasFolderEvent("/photo/a", none));
   }
@@ -421,70 +420,6 @@ TEST_F(QueueReaderTest, RemembersWhatItReadOnlyWhileTheQueueIsTheSameFileWithThe
     for (const std::string& path : folders) {
       EXPECT_EQ(IsReindexQueued(path, queue), detail::IsReindexQueued(path, queue, kPlain)) << path;
     }
-  }
-}
-
-// Folders are marked as a path lies in them, as each is found and no longer looked for; only
-// the folders asked about (the even ones) count. A folder found before is not marked again.
-TEST(FolderSetTest, MarksAsThePathLiesInTheFolderWhileFoldersAreFound) {
-  struct Row {
-    std::vector<std::string> folders;
-    std::string before;  // found before the first path
-    std::vector<std::string> paths;
-    std::string after;
-  } rows[] = {
-      {{"/share/a1", "/share/a2", "/share/b1"},
-       "000",
-       {"/share/a1/x", "/share/a1", "/share/a3/x", "/share/a2", "_share/b1/z", "/share/b1/z"},
-       "111"},
-      {{"/s/a", "/s/a/b", "/s/a/b/c"},
-       "000",
-       {"/s/a/x", "/s/a/bc/d", "/s/a/b", "/s/a/b/c/"},
-       "111"},
-      {{"/s/a", "/s/a/b/c", "/s/ab"}, "000", {"/s/a/b/c/d", "/s/ab"}, "111"},
-      {{"/s/a", "/s/a/b", "/s/c"}, "100", {"/s/a/b", "/s/b/c"}, "110"},
-      {{"/s/a", "/s/b", "/s/a"}, "000", {"/s/a/x", "/s/c"}, "101"},
-      {{"/s/a\0b"s, "/s/a", "/s/c"}, "000", {"/s/a\0c/x"s, "/s/a\0"s, "/s/c/x"}, "101"},
-      {{"", "/s"}, "00", {"s/x", "", "/s/x"}, "11"},
-      {{"/s/a", "/s/ab", "/s/a/b", "/s/a/"},
-       "0000",
-       {"/s/ab/x", "/s/a/x", "/s/a//x", "/s/a/b"},
-       "1111"},
-      {{"/s/" + std::string(300, 'l'), "/s/l"},
-       "00",
-       {"/s/" + std::string(301, 'l'), "/s/" + std::string(300, 'l') + "/x"},
-       "10"},
-  };
-  for (const Row& row : rows) {
-    std::vector<bool> found;
-    for (const char c : row.before) found.push_back(c == '1');
-    detail::FolderSet set(row.folders, found);
-    std::vector<std::string> seen;
-    for (const std::string& path : row.paths) {
-      SCOPED_TRACE(row.folders[0] + " / " + path);
-      seen.push_back(path);
-      std::vector<bool> before = found;
-      std::vector<size_t> marks;
-      std::vector<size_t> expected;
-      size_t asked = 0;
-      for (size_t f = 0; f < found.size(); ++f) {
-        const auto holds = [&](const std::string& p) {
-          return StringStartWith(p + "/", row.folders[f] + "/");
-        };
-        if (!before[f] && std::any_of(seen.begin(), seen.end(), holds)) {
-          expected.push_back(f);
-          asked += f % 2 == 0 ? 1 : 0;
-        }
-      }
-      const std::vector<bool> evens = {true, false, true, false};
-      // The reader keeps only the bytes of a path that the set needs.
-      EXPECT_EQ(set.Mark(path.substr(0, set.Limit()), path.size(), evens, found, marks), asked);
-      std::sort(marks.begin(), marks.end());
-      EXPECT_EQ(marks, expected);
-    }
-    std::string after;
-    for (const bool f : found) after += f ? '1' : '0';
-    EXPECT_EQ(after, row.after) << row.folders[0];
   }
 }
 

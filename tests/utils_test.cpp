@@ -36,11 +36,11 @@ TEST_F(UtilsTest, LogLinesCarryUnitLineAndLevelAndKeepErrno) {
 
 TEST_F(UtilsTest, SmallHelpersAnswerOnTheirBoundaries) {
   // File tests do not follow symbolic links.
-  ASSERT_EQ(mkdir(sandbox.Path("/d").c_str(), 0755) | mkfifo(sandbox.Path("/fifo").c_str(), 0644) |
-                symlink("d", sandbox.Path("/ld").c_str()),
+  ASSERT_EQ(mkdir(At("/d").c_str(), 0755) | mkfifo(At("/fifo").c_str(), 0644) |
+                symlink("d", At("/ld").c_str()),
             0);
-  EXPECT_EQ(IsDirExist(sandbox.Path("/d")) + 2 * IsDirExist(sandbox.Path("/ld")) +
-                4 * IsFileExist(sandbox.Path("/fifo")) + 8 * IsDirExist(""),
+  EXPECT_EQ(IsDirExist(At("/d")) + 2 * IsDirExist(At("/ld")) +
+                4 * IsFileExist(At("/fifo")) + 8 * IsDirExist(""),
             1);
   // Compared as C strings: bytes after an embedded NUL do not count.
   EXPECT_TRUE(StringStartWith(std::string("/a\0x", 4), std::string("/a\0y", 4)));

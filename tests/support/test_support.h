@@ -127,12 +127,6 @@ class LibraryTest : public SandboxTest {
 
   void ResetPlatform();  // the constructor's fresh fake platform again, no error, the log cleared
   static Json::Value StatusFile();  // status.conf parsed; fails the test when it is not JSON
-  // The sandbox as older tests name it: Path("/x"), Root().
-  struct Paths {
-    const std::string& root;
-    std::string Path(const std::string& relative) const { return root + relative; }
-    const std::string& Root() const { return root; }
-  } sandbox{root_};
   LogCapture log;
   std::string volume;  // the sandbox's /volume1
 };
