@@ -180,9 +180,14 @@ TEST_F(ConfigTest, RemovesOnlyOldTemporariesOfTheFile) {
     testsupport::WriteFile(dir + c.name, "{");
     ASSERT_EQ(c.old ? utimensat(AT_FDCWD, (dir + c.name).c_str(), twoHoursAgo, 0) : 0, 0);
   }
+  const std::string link = dir + "folder.conf.L1nk00";  // only regular files are temporaries
+  ASSERT_EQ(symlink("folder.conf", link.c_str()) |
+                utimensat(AT_FDCWD, link.c_str(), twoHoursAgo, AT_SYMLINK_NOFOLLOW),
+            0);
   RemoveStaleTemporaries(dir + "folder.conf", 3600);
   for (const Case& c : kCases)
     EXPECT_EQ(testsupport::ModeOf(dir + c.name) < 0, c.removed) << c.name;
+  EXPECT_GE(testsupport::ModeOf(link), 0);
 }
 
 }  // namespace

@@ -167,6 +167,7 @@ TEST_F(SpotlightTest, ReadsSambasDefaultAndRefusesWhatSambaRefuses) {
   ASSERT_EQ(unlink(At("etc/samba/smb.conf").c_str()), 0);
   EXPECT_LT(WEZOSMBIsEnableSpotlight(), 0);
   EXPECT_LT(WEZOSMBSetSpotlight(1), 0);
+  EXPECT_EQ(WLIBCErrGet(), WEZO::PLATFORM::kErrNotFound);
   EXPECT_NE(access(At("etc/samba/smb.conf").c_str(), F_OK), 0);
 }
 
