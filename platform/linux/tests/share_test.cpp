@@ -100,17 +100,21 @@ TEST_F(ShareTest, FailuresAndUnencryptedFoldersAreTold) {
 }
 
 // A configuration that has settled is parsed once and kept; a new file in its place, or one of
-// another size, is read again even when it carries the same modification time.
+// another size or time, is read again even when it carries the same modification second.
 TEST_F(ShareTest, AKeptConfigurationFollowsEveryChangeOfTheFile) {
-  const auto settled = std::filesystem::file_time_type::clock::now() - std::chrono::hours(1);
-  // Each share's file, written with the same time and moved over smb.conf: the second is a new
-  // file of the same size, the third the same file rewritten in place.
+  const auto settled = std::chrono::floor<std::chrono::seconds>(
+      std::filesystem::file_time_type::clock::now() - std::chrono::hours(1));
+  // Each share's file, written in the same second and moved over smb.conf: the second is a new
+  // file of the same size, the third the same file rewritten in place, the fourth that again at
+  // the same size a nanosecond later.
   const char* before = "none";
+  int tick = 0;
   for (const auto& [file, name] : {std::pair{"etc/samba/smb.conf", "aaaa"},
                                    {"etc/samba/next", "bbbb"},
-                                   {"etc/samba/smb.conf", "cc"}}) {
+                                   {"etc/samba/smb.conf", "cc"},
+                                   {"etc/samba/smb.conf", "dd"}}) {
     Write(file, std::string("[") + name + "]\npath = /v/x\n");
-    std::filesystem::last_write_time(At(file), settled);
+    std::filesystem::last_write_time(At(file), settled + std::chrono::nanoseconds(++tick / 4));
     std::filesystem::rename(At(file), At("etc/samba/smb.conf"));
     for (const auto& [asked, found] : {std::pair{name, true}, {before, false}}) {
       PWEZOSHARE share = nullptr;
