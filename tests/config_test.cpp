@@ -6,8 +6,6 @@
 namespace WEZO::FILEINDEX {
 namespace {
 
-using Lines = std::vector<std::string>;
-
 // A configuration file at the folder list's locations, with its document in the open.
 class TestConfig : public Config {
  public:
@@ -55,7 +53,7 @@ TEST_F(ConfigTest, EveryFixedPathLiesUnderAnAbsoluteRoot) {
 TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAllAndLoadTellsItsFailures) {
   const std::string stale = FolderConfPath() + ".a1B2c3";
   for (const bool locked : {false, true}) {
-    testsupport::WriteFile(stale, "{\"half");
+    WriteFile(stale, "{\"half");
     TestConfig cfg;
     ASSERT_TRUE(!locked || cfg.Lock(true));
     const mode_t old = umask(0077);
@@ -75,9 +73,9 @@ TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAllAndLoadTellsItsFailures) {
   EXPECT_EQ(cfg.Doc(), Json::Value(Json::objectValue));
   cfg.Doc()["b"] = 2;
   ASSERT_TRUE(cfg.SaveJson());
-  EXPECT_EQ(testsupport::ReadFile(real), "{}\n");
+  EXPECT_EQ(ReadFile(real), "{}\n");
   EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);  // a file of its own
-  testsupport::WriteFile(FolderConfPath(), "");
+  WriteFile(FolderConfPath(), "");
   EXPECT_FALSE(cfg.LoadJson());
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_LOAD_JSON);
   // A directory in the file's place makes the final rename fail after the data is written.
@@ -128,7 +126,7 @@ TEST_F(ConfigTest, LockAdmitsOnlySharedBesideSharedAndKeepsItsFilePrivate) {
 TEST_F(ConfigTest, LockFileThatOthersCouldHoldIsRefused) {
   const std::string lock = FolderLockPath();
   const std::string other = At("/other");
-  testsupport::WriteFile(other, "precious");
+  WriteFile(other, "precious");
   ASSERT_EQ(chmod(other.c_str(), 0644), 0);
   const std::string refused = "config:N Lock file refused, not a regular file of uid " +
                               std::to_string(geteuid()) + " with one link, path=" + lock;
@@ -146,7 +144,7 @@ TEST_F(ConfigTest, LockFileThatOthersCouldHoldIsRefused) {
     EXPECT_FALSE(TryLock(true, c.refusedLine ? Lines{refused} : Lines{}));
   }
   EXPECT_EQ(testsupport::ModeOf(other), 0644);  // the linked file is not touched
-  EXPECT_EQ(testsupport::ReadFile(other), "precious");
+  EXPECT_EQ(ReadFile(other), "precious");
 }
 
 TEST_F(ConfigTest, TextIsOneLineAndOnlyOneWholeValueIsRead) {
@@ -177,7 +175,7 @@ TEST_F(ConfigTest, RemovesOnlyOldTemporariesOfTheFile) {
                 {"folder.conf.a1-2c3", true, false}, {"folder.confXa1B2c3", true, false}};
   const timespec twoHoursAgo[2] = {{time(nullptr) - 7200, 0}, {time(nullptr) - 7200, 0}};
   for (const Case& c : kCases) {
-    testsupport::WriteFile(dir + c.name, "{");
+    WriteFile(dir + c.name, "{");
     ASSERT_EQ(c.old ? utimensat(AT_FDCWD, (dir + c.name).c_str(), twoHoursAgo, 0) : 0, 0);
   }
   const std::string link = dir + "folder.conf.L1nk00";  // only regular files are temporaries

@@ -13,8 +13,6 @@ namespace WEZO::FILEINDEX {
 namespace {
 
 using Clock = std::chrono::steady_clock;
-using testsupport::FakeDaemon;
-using testsupport::ParseJson;
 
 double SecondsSince(Clock::time_point start) {
   return std::chrono::duration<double>(Clock::now() - start).count();
@@ -71,7 +69,7 @@ TEST_F(DaemonTest, AMissingOrStuckDaemonFailsTheCallWithinABound) {
     SCOPED_TRACE(place);
     const std::string what = place;
     unlink(path.c_str());
-    if (what == "a regular file") testsupport::WriteFile(path, "not a socket");
+    if (what == "a regular file") WriteFile(path, "not a socket");
     ASSERT_TRUE(what != "a bound socket" ||
                 bind(bound, reinterpret_cast<sockaddr*>(&address), sizeof(address)) == 0);
     std::optional<FakeDaemon> daemon;

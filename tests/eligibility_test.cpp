@@ -1,15 +1,12 @@
 #include <wezo/platform.h>
 
 #include <algorithm>
-#include <sstream>
 
 #include "test_support.h"
 #include "utils/eligibility_pass.h"
 
 namespace WEZO::FILEINDEX {
 namespace {
-
-using ::testing::ElementsAre;
 
 class EligibilityTest : public testsupport::LibraryTest {
  protected:

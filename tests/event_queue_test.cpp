@@ -1,30 +1,15 @@
-#include <fcntl.h>
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
 #include <sys/resource.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
-#include <unistd.h>
 
 #include <csignal>
-#include <filesystem>
-#include <functional>
 #include <future>
-#include <sstream>
 
-#include "fake_platform.h"
 #include "fileindex/error.h"
 #include "fileindex/queue.h"
-#include "paths.h"
 #include "test_support.h"
 
 namespace WEZO::FILEINDEX {
 namespace {
-
-using ::testing::ElementsAre;
-using testsupport::ParseJson;
-using testsupport::ReadFile;
-using testsupport::WriteFile;
 
 class EventQueueTest : public testsupport::LibraryTest {
  protected:

@@ -8,10 +8,6 @@
 namespace WEZO::FILEINDEX {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-using testsupport::ParseJson;
-
 std::vector<std::string> PathsOf(const std::vector<Folder>& folders) {
   std::vector<std::string> paths;
   for (const Folder& folder : folders) paths.push_back(folder.GetPath());
@@ -35,7 +31,7 @@ Json::Value Report(const char* bits) {
 class FoldersTest : public testsupport::LibraryTest {
  protected:
   static void LoadText(Folders& folders, const std::string& text) {
-    testsupport::WriteFile(FolderConfPath(), text);
+    WriteFile(FolderConfPath(), text);
     ASSERT_TRUE(folders.Load());
   }
 };
@@ -82,7 +78,7 @@ TEST_F(FoldersTest, FileRoundTripWritesKeyOrderAndIgnoresTheStoredPath) {
   EXPECT_FALSE(folders.Get(get, "/photo/"));
   EXPECT_THAT(log.Lines(), ElementsAre("folders:N No such folder: /photo/"));
   ASSERT_TRUE(folders.Save());
-  const std::string text = testsupport::ReadFile(FolderConfPath());
+  const std::string text = ReadFile(FolderConfPath());
   EXPECT_EQ(ParseJson(text)["/gone/a"], ParseJson(R"({"path":"/gone/a","name":"A","document":false,
                                                  "audio":false,"video":false,"photo":false})"));
   EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);
@@ -103,9 +99,9 @@ TEST_F(FoldersTest, FileRoundTripWritesKeyOrderAndIgnoresTheStoredPath) {
   ASSERT_TRUE(folders.Upsert(report, ParseJson(R"({"path":"/video/c","video":true})")));
   ASSERT_TRUE(folders.Delete(report, "/photo"));
   ASSERT_TRUE(folders.Save());
-  EXPECT_EQ(testsupport::ReadFile(FolderConfPath()), rendered());
+  EXPECT_EQ(ReadFile(FolderConfPath()), rendered());
   // Only an object is a folder list.
-  testsupport::WriteFile(FolderConfPath(), "[1, 2]");
+  WriteFile(FolderConfPath(), "[1, 2]");
   log.Clear();
   Folders array;
   EXPECT_FALSE(array.Load());

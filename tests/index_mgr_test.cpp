@@ -6,10 +6,6 @@
 namespace WEZO::FILEINDEX {
 namespace {
 
-using ::testing::ElementsAre;
-using testsupport::ParseJson;
-using testsupport::WriteFile;
-
 using QueryTest = testsupport::LibraryTest;
 
 TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
@@ -56,7 +52,7 @@ TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
   EXPECT_EQ(FILEIDXIsPathIndexed(nullptr) + FILEIDXIsFullPathIndexed(nullptr) +
                 FILEIDXIsShareIndexed(nullptr),
             0);
-  EXPECT_THAT(log.Lines(), ::testing::IsEmpty());
+  EXPECT_THAT(log.Lines(), IsEmpty());
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_NONE) << "the queries set no code";
 
   // A stored path without a share is logged and skipped.
@@ -65,15 +61,6 @@ TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
   EXPECT_FALSE(IndexMgr::IsShareIndexed("photo"));
   EXPECT_THAT(log.Lines(),
               ::testing::Contains("index_mgr:N Failed to get share name from path: ").Times(2));
-  // A list that cannot be read answers no to every question.
-  for (const char* text : {"{}", "[1]", "{"}) {
-    WriteFile(FolderConfPath(), text);
-    EXPECT_EQ(IndexMgr::List(folders), std::string(text) == "{}") << text;
-    EXPECT_FALSE(IndexMgr::IsPathIndexed("/photo") || IndexMgr::IsPathContainIndexed("") ||
-                 IndexMgr::IsFullPathIndexed(volume + "/photo") ||
-                 IndexMgr::IsShareIndexed("photo"))
-        << text;
-  }
 }
 
 // Answers from what the process read before match a fresh load after each way the files change.
@@ -137,6 +124,7 @@ TEST_F(QueryTest, KeptSnapshotsAnswerAsAFreshLoadAfterEveryChange) {
                 listed && IndexMgr::IsPathContainIndexed("/photo", folders));
       EXPECT_EQ(IndexMgr::IsFullPathIndexed(volume + "/photo/b"),
                 listed && IndexMgr::IsFullPathIndexed(volume + "/photo/b", folders));
+      EXPECT_EQ(IndexMgr::IsShareIndexed("photo"), listed && !folders.empty());
       Json::Value page;
       Json::Value freshPage;
       const Json::Value none(Json::arrayValue);
@@ -147,7 +135,7 @@ TEST_F(QueryTest, KeptSnapshotsAnswerAsAFreshLoadAfterEveryChange) {
       EXPECT_EQ(ErrorHandler::GetError(), code);
       std::vector<std::string> expected;
       if (!c.log.empty()) {
-        expected.assign(6, c.log[0]);  // one read of the list per folder question
+        expected.assign(7, c.log[0]);  // one read of the list per folder question
         expected.push_back(c.log[1]);
       }
       EXPECT_EQ(log.Lines(), expected);
@@ -189,7 +177,7 @@ TEST_F(QueryTest, ThreadsAskingWhileAnotherSavesSeeOneListOrTheOther) {
   second.join();
   detail::SetSnapshotSettleTime(std::chrono::seconds(2));
   EXPECT_EQ(wrong, 0);
-  EXPECT_THAT(log.Lines(), ::testing::IsEmpty());
+  EXPECT_THAT(log.Lines(), IsEmpty());
   EXPECT_TRUE(IndexMgr::IsPathIndexed("/photo/a/x")) << "the last save";
 }
 
@@ -220,7 +208,7 @@ TEST_F(MonitorRegistrationTest, RegistersEveryFolderOfTheShareInListOrderAndDele
   EXPECT_EQ(fake::Get().monitor["fileindex"].count(queue), 0U);
   EXPECT_THAT(fake::Get().CallsTo("MonitorQueue::Delete")[0].args,
               ElementsAre(queue, "fileindex", "1"));
-  EXPECT_THAT(log.Lines(), ::testing::IsEmpty());
+  EXPECT_THAT(log.Lines(), IsEmpty());
 }
 
 TEST_F(MonitorRegistrationTest, NothingReachesTheMonitorWhenAFolderOrTheQueueCannotBePlaced) {

@@ -3,18 +3,13 @@
 // leaves behind: folder.conf, the platform effects in order, the daemon's frames and the queues.
 #include <optional>
 #include <regex>
-#include <sstream>
 
 #include "test_support.h"
 
 namespace WEZO::FILEINDEX {
 namespace {
 
-using testsupport::FakeDaemon;
 using testsupport::Joined;
-using testsupport::ParseJson;
-using testsupport::ReadFile;
-using testsupport::WriteFile;
 using Ms = std::chrono::milliseconds;
 
 const std::string kAllChanged = R"({"audio":true,"document":true,"photo":true,"video":true})";

@@ -1,16 +1,9 @@
 #include "utils/queue_reader.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/stat.h>
-
 #include <algorithm>
 #include <cctype>
-#include <fstream>
-#include <functional>
 #include <memory>
 #include <random>
-#include <sstream>
 
 #include "fileindex/utils.h"
 #include "test_support.h"
@@ -19,7 +12,6 @@
 namespace WEZO::FILEINDEX {
 namespace {
 
-using ::testing::ElementsAre;
 using namespace std::string_literals;
 
 // {"event":<code>,"path":"<path>"<rest>}
@@ -57,7 +49,7 @@ void Append(const std::string& path, const std::string& text) {
 class QueueReaderTest : public testsupport::LibraryTest {
  protected:
   const std::string& Queue(const std::string& text) {
-    testsupport::WriteFile(queue, text);
+    WriteFile(queue, text);
     return queue;
   }
   std::string queue = At("/queue");
@@ -377,7 +369,7 @@ TEST_F(QueueReaderTest, RemembersWhatItReadOnlyWhileTheQueueIsTheSameFileWithThe
     fclose(f);
   };
   const auto replace = [this](const std::string& text) {  // a new inode renamed over it
-    testsupport::WriteFile(queue + ".new", text);
+    WriteFile(queue + ".new", text);
     ASSERT_EQ(rename((queue + ".new").c_str(), queue.c_str()), 0);
   };
   const std::string start = line("65536", a) + "junk\n" + line("2", b + "/x");

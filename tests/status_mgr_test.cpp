@@ -7,11 +7,6 @@
 namespace WEZO::FILEINDEX {
 namespace {
 
-using ::testing::ElementsAre;
-using testsupport::FakeDaemon;
-using testsupport::ParseJson;
-using testsupport::WriteFile;
-
 using StatusMgrTest = testsupport::LibraryTest;
 
 TEST_F(StatusMgrTest, PauseAndResumeStoreTheStateThenTellTheDaemon) {
@@ -39,7 +34,7 @@ TEST_F(StatusMgrTest, PauseAndResumeStoreTheStateThenTellTheDaemon) {
                           ParseJson(R"({"type":"pause","data":{"resume_time":)" +
                                     std::to_string(end) + "}}"),
                           ::testing::_));
-  EXPECT_THAT(log.Lines(), ::testing::IsEmpty());
+  EXPECT_THAT(log.Lines(), IsEmpty());
 }
 
 TEST_F(StatusMgrTest, AnUnreachableDaemonFailsTheCallButTheChangeStays) {

@@ -1,14 +1,9 @@
-#include <map>
-
+#include "utils/storage.h"
 #include "test_support.h"
 #include "utils/queue_reader.h"
-#include "utils/storage.h"
 
 namespace WEZO::FILEINDEX {
 namespace {
-
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
 
 using Getter = int (*)(const char*, char*, int);
 
@@ -82,7 +77,7 @@ std::map<std::string, std::string> Tree(const std::string& dir) {
     const std::string path = entry.path().string().substr(dir.size());
     tree[path] = entry.is_symlink()     ? "<link>"
                  : entry.is_directory() ? "<dir>"
-                                        : testsupport::ReadFile(entry.path().string());
+                                        : ReadFile(entry.path().string());
   }
   return tree;
 }
@@ -116,7 +111,7 @@ TEST_F(StorageTest, NothingBelowTheShareIsReachedThroughALinkInTheMetadataDirect
 TEST_F(StorageTest, RemovingIndexDataTakesWholeTreesAndLinksButNeverWhatALinkPointsTo) {
   std::filesystem::create_directories(db + "/a");
   Write("out/file", "keep");
-  testsupport::WriteFile(queue, "q");
+  WriteFile(queue, "q");
   std::filesystem::create_symlink(out + "/file", queue + ".tmp");
   std::filesystem::create_directory_symlink(out, db + "/a/out");
   std::string deepest = db;

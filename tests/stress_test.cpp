@@ -11,7 +11,6 @@
 #include <atomic>
 #include <climits>
 #include <csignal>
-#include <cstdlib>
 #include <random>
 
 #include "test_support.h"
@@ -44,9 +43,8 @@ Json::Value ReadState() {
 
 // The list request that adds `path` named `name`, or removes it when `name` is empty.
 Json::Value Request(const std::string& path, const std::string& name) {
-  return testsupport::ParseJson(name.empty()
-                                    ? "[\"" + path + "\"]"
-                                    : R"([{"path":")" + path + R"(","name":")" + name + "\"}]");
+  return ParseJson(name.empty() ? "[\"" + path + "\"]"
+                                : R"([{"path":")" + path + R"(","name":")" + name + "\"}]");
 }
 
 // The crash-test writers' change sequence, from k = 1: three of four changes go to folder.conf
@@ -83,7 +81,7 @@ int Temporaries(const std::string& name) {
 
 class StressTest : public testsupport::LibraryTest {
  protected:
-  testsupport::FakeDaemon daemon;
+  FakeDaemon daemon;
 };
 
 using CrashTest = StressTest;
@@ -204,8 +202,8 @@ int Reader(int rounds) {
 
 TEST_F(StressTest, ConcurrentWritersKeepEveryDoneChangeAndReadersSeeUntouchedFolders) {
   const int rounds = CountFromEnv("FILEINDEX_STRESS_ROUNDS", 30);
-  ASSERT_TRUE(IndexMgr::Upsert(testsupport::ParseJson(
-      R"([{"path":"/photo/seed","name":"keep"},{"path":"/video/seed","name":"keep"}])")));
+  ASSERT_TRUE(IndexMgr::Upsert(
+      ParseJson(R"([{"path":"/photo/seed","name":"keep"},{"path":"/video/seed","name":"keep"}])")));
   // Exit codes: 1 an unexpected failure, 2 a writer's lost change, 3 a reader's wrong answer.
   daemon.Connections(1);  // the seed's command served
   // All children are forked before any starts: a fork while the daemon's thread serves a child

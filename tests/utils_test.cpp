@@ -8,9 +8,6 @@
 namespace WEZO::FILEINDEX {
 namespace {
 
-using ::testing::ElementsAre;
-using Lines = std::vector<std::string>;
-
 class UtilsTest : public testsupport::LibraryTest {};
 
 TEST_F(UtilsTest, LogLinesCarryUnitLineAndLevelAndKeepErrno) {
@@ -39,8 +36,8 @@ TEST_F(UtilsTest, SmallHelpersAnswerOnTheirBoundaries) {
   ASSERT_EQ(mkdir(At("/d").c_str(), 0755) | mkfifo(At("/fifo").c_str(), 0644) |
                 symlink("d", At("/ld").c_str()),
             0);
-  EXPECT_EQ(IsDirExist(At("/d")) + 2 * IsDirExist(At("/ld")) +
-                4 * IsFileExist(At("/fifo")) + 8 * IsDirExist(""),
+  EXPECT_EQ(IsDirExist(At("/d")) + 2 * IsDirExist(At("/ld")) + 4 * IsFileExist(At("/fifo")) +
+                8 * IsDirExist(""),
             1);
   // Compared as C strings: bytes after an embedded NUL do not count.
   EXPECT_TRUE(StringStartWith(std::string("/a\0x", 4), std::string("/a\0y", 4)));

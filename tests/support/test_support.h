@@ -133,4 +133,15 @@ class LibraryTest : public SandboxTest {
 
 }  // namespace testsupport
 
+// The library's tests live in its namespace and name the helpers they all use unqualified.
+namespace WEZO::FILEINDEX {
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using testsupport::FakeDaemon;
+using testsupport::ParseJson;
+using testsupport::ReadFile;
+using testsupport::WriteFile;
+using Lines = std::vector<std::string>;
+}  // namespace WEZO::FILEINDEX
+
 #endif  // FILEINDEX_TESTS_SUPPORT_TEST_SUPPORT_H_
