@@ -62,9 +62,9 @@ TEST_F(DaemonTest, AMissingOrStuckDaemonFailsTheCallWithinABound) {
   const auto asFound = signal(SIGPIPE, SIG_DFL);
   using B = FakeDaemon::Behaviour;
   const std::tuple<const char*, std::optional<B>, double> cases[] = {
-      {"no file", std::nullopt, 2.0},           {"a regular file", std::nullopt, 2.0},
-      {"a bound socket", std::nullopt, 2.0},    {"closes unread", B::kAcceptAndClose, 10.0},
-      {"stops reading", B::kStopReading, 10.0}, {"backlog full", B::kHoldConnect, 3.0}};
+      {"closes unread", B::kAcceptAndClose, 10.0}, {"stops reading", B::kStopReading, 10.0},
+      {"backlog full", B::kHoldConnect, 3.0},      {"no file", std::nullopt, 2.0},
+      {"a regular file", std::nullopt, 2.0},       {"a bound socket", std::nullopt, 2.0}};
   for (const auto& [place, behaviour, seconds] : cases) {
     SCOPED_TRACE(place);
     const std::string what = place;

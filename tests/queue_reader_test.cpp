@@ -422,20 +422,12 @@ TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
   std::mt19937 rng(7);
   static constexpr char kBytes[] = "ab\"\\\n/{}6553eE0.9u:_-";
   std::string bytes(600, 'x');
-  for (char& c : bytes) {
-    c = kBytes[rng() % (sizeof kBytes - 1)];
-  }
-  for (const size_t at : {13, 29, 30, 62, 63, 127, 300, 596}) {
-    bytes.replace(at, 4, "6553");
-  }
+  for (char& c : bytes) c = kBytes[rng() % (sizeof kBytes - 1)];
+  for (const size_t at : {13, 29, 30, 62, 63, 127, 300, 596}) bytes.replace(at, 4, "6553");
   // A hint: "6553", or an exponent after digits and points where a number can begin.
   const auto hint = [&bytes](size_t i, size_t size) {
-    if (bytes.compare(i, 4, "6553") == 0 && i + 4 <= size) {
-      return true;
-    }
-    if ((bytes[i] | 0x20) != 'e') {
-      return false;
-    }
+    if (bytes.compare(i, 4, "6553") == 0 && i + 4 <= size) return true;
+    if ((bytes[i] | 0x20) != 'e') return false;
     size_t j = i;
     while (j > 0 &&
            (std::isdigit(static_cast<unsigned char>(bytes[j - 1])) || bytes[j - 1] == '.')) {
@@ -455,15 +447,11 @@ TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
       const char* next = nullptr;  // asked only where a stop follows
       for (const char* p = end; p-- != begin;) {
         next = *p == '"' || *p == '\\' || *p == '\n' ? p : next;
-        if (next != nullptr) {
-          EXPECT_EQ(index->NextStop(p), next) << p - begin;
-        }
+        EXPECT_TRUE(next == nullptr || index->NextStop(p) == next) << p - begin;
       }
       for (size_t from = 0; from < size; from += 7) {
         size_t first = from;
-        while (first < size && !hint(first, size)) {
-          ++first;
-        }
+        while (first < size && !hint(first, size)) ++first;
         const char* found = detail::NextReindexHint(begin, begin + from, end);
         EXPECT_EQ(found == nullptr ? size : static_cast<size_t>(found - begin), first) << from;
       }

@@ -55,21 +55,6 @@ TEST_F(StatusMgrTest, AnUnreachableDaemonFailsTheCallButTheChangeStays) {
             ParseJson(R"({"type":"revive_share_worker","data":{"share_name":"video"}})"));
 }
 
-TEST_F(StatusMgrTest, QueriesAnswerWhileAnotherProcessHoldsTheLockAndChangesGiveUp) {
-  WriteFile(StatusConfPath(), R"({"resume_time":0,"need_reindex":{"photo":true},"done":true})");
-  testsupport::LockHolder holder(StatusLockPath(), true);
-  ASSERT_TRUE(holder.Holding());
-  long long resumeTime = -1;
-  EXPECT_TRUE(StatusMgr::GetPauseInfo(resumeTime));
-  EXPECT_EQ(resumeTime, 0);
-  EXPECT_TRUE(StatusMgr::ShareIsNeedReindex("photo"));
-  EXPECT_FALSE(StatusMgr::ShareIsNoSpace("photo"));
-  EXPECT_TRUE(StatusMgr::IsUpdated("done"));
-  EXPECT_FALSE(StatusMgr::SetUpdated("other"));
-  EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_LOCK);
-  EXPECT_THAT(log.Lines(), ElementsAre("config:N Failed to lock folder"));
-}
-
 using ProgressTest = testsupport::LibraryTest;
 
 // Progress reports, against the clock and the queue files.

@@ -72,9 +72,8 @@ void Platform::AddShare(const std::string& name, const std::string& path) {
 
 std::vector<Call> Platform::CallsTo(const std::string& op) const {
   std::vector<Call> out;
-  for (const Call& c : calls) {
+  for (const Call& c : calls)
     if (c.op == op) out.push_back(c);
-  }
   return out;
 }
 
