@@ -20,9 +20,8 @@ double SecondsSince(Clock::time_point start) {
 
 using DaemonTest = testsupport::LibraryTest;
 
-// One connection per call: the length field (counting the zero, in this machine's byte order),
-// the text and the zero, whole and exact for frames just under, at and over one write piece, and
-// far over the socket buffer.
+// One connection per call: the length (with the zero, host byte order), text and zero, exact for
+// frames under, at and over one write piece, and far over the socket buffer.
 TEST_F(DaemonTest, EachCallIsOneConnectionWithOneExactFrame) {
   FakeDaemon daemon;
   std::vector<std::string> expected;
@@ -50,9 +49,8 @@ TEST_F(DaemonTest, RefusesASocketPathThatLeavesNoRoomForTheTerminatingZero) {
   }
 }
 
-// Nobody listening fails at once without leaking a descriptor; a daemon that closes, stops
-// reading or never accepts fails the call within seconds. SIGPIPE is as a host process may have
-// it: a closed connection must not kill the process, nor the call change the disposition.
+// A stuck daemon fails the call within seconds, nobody listening at once and leaking nothing.
+// SIGPIPE stays as the host process has it, and a closed connection does not raise it.
 TEST_F(DaemonTest, AMissingOrStuckDaemonFailsTheCallWithinABound) {
   const std::string path = DaemonSocketPath();
   sockaddr_un address{};

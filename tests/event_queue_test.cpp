@@ -19,8 +19,7 @@ class EventQueueTest : public testsupport::LibraryTest {
     return R"({"data":)" + data + R"(,"event":)" + std::to_string(event) + R"(,"path":")" + path +
            "\"}\n";
   }
-  // Runs `add` in a child process (with a file size limit when `sizeLimit` is set); Exit() gives
-  // its exit status, 0 when it returned true.
+  // Runs `add` in a child (under a file size limit if set); Exit() gives 0 when it returned true.
   static pid_t Spawn(const std::function<bool()>& add, rlim_t sizeLimit = 0) {
     const pid_t child = fork();
     if (child == 0) {
@@ -75,8 +74,7 @@ TEST_F(EventQueueTest, AQueuedReindexOfExactlyThePathCoversEveryEvent) {
   }
 }
 
-// A writer that finds the queue busy three times running drops its event, so some may be
-// missing; none may be torn.
+// A writer finding the queue busy three times drops its event: lines may be missing, never torn.
 TEST_F(EventQueueTest, LinesOfWritersInSeveralProcessesNeverInterleave) {
   const std::string payload(3000, 'x');  // several pages per line
   std::vector<pid_t> writers;
@@ -160,8 +158,7 @@ TEST_F(EventQueueTest, TheQueueStaysLineAlignedWhenAWriteFallsShort) {
   EXPECT_EQ(ReadFile(queue), "{\"event\":655\n" + line);
   EXPECT_FALSE(std::filesystem::exists(StatusConfPath()));
 
-  // A short write is cut off again and flags the share. The queue is long enough that the
-  // status file, written by the same process, stays below the limit.
+  // A short write is cut off again and flags the share (status.conf stays below the limit).
   const std::string whole = std::string(4000, 'x') + "\n";
   WriteFile(queue, whole);
   EXPECT_EQ(Exit(Spawn(add, whole.size() + line.size() / 2)), 1);

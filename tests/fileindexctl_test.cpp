@@ -1,7 +1,5 @@
-// The admin tool as a program over the shipped library and its Linux platform, in a sandbox
-// appliance (scripts/sandbox-appliance.sh) with the stand-in daemon: what the demo's walk through
-// every operation does not show (exit statuses and messages, JSON equal to the library's answer,
-// a change whose later step failed, check/repair).
+// The admin tool over the shipped library in a sandbox appliance with the stand-in daemon: exit
+// statuses and messages, JSON as the library answers, a half-done change, check and repair.
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <json/reader.h>
@@ -40,8 +38,7 @@ Json::Value Parse(const std::string& text) {
   return value;
 }
 
-// `value` as it reads back from text: the tool's JSON is text, and a number read back is signed
-// where the library may have stored it unsigned.
+// `value` read back from text, as the tool's JSON is (numbers come back signed).
 Json::Value ReadBack(const Json::Value& value) { return Parse(value.toStyledString()); }
 
 class FileindexctlTest : public SandboxTest {
@@ -56,8 +53,7 @@ class FileindexctlTest : public SandboxTest {
   }
   void TearDown() override { StopDaemon(); }
 
-  // Runs `args` with stdout and stderr to tool.out and tool.err and answers its exit status, or
-  // -1; with `pid`, leaves it running and answers 0.
+  // Runs `args` (output to tool.out, tool.err) to its exit status or -1; with `pid`, in the back.
   int Spawn(Args args, pid_t* pid) const {
     std::vector<char*> argv;
     for (std::string& arg : args) argv.push_back(arg.data());
@@ -120,8 +116,7 @@ class FileindexctlTest : public SandboxTest {
 
 TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
   const std::string deep = std::string(2000, '[') + std::string(2000, ']');
-  // The arguments, the exit status, and what stderr holds ("": nothing) and stdout (nothing when
-  // the status is not 0).
+  // Arguments, exit status, part of stderr ("": empty) and of stdout (empty unless status 0).
   const std::tuple<Args, int, std::string, std::string> cases[] = {
       // Columns count characters, not bytes.
       {{"list", "--additional", "status", "-a", "is_valid"},
@@ -135,8 +130,7 @@ TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
       {{"get", "/photo/none"}, 1, "get /photo/none failed: error 4 (no such indexed folder)", ""},
       {{"reindex", "/music"}, 1, "error 0 (a path lies in a share without indexed folders)", ""},
       {{"storage", "nosuch"}, 1, "storage nosuch failed: error 0 (no share named nosuch)", ""},
-      // Accepted by the library, but not what the user expects: a warning, or a refusal under
-      // --strict before the library is called.
+      // What the library takes but the user may not expect: a warning, refused under --strict.
       {{"remove", "/photo/none"}, 0, "warning: /photo/none is not in the list", ""},
       {{"--strict", "remove", "/photo/none"}, 1, "remove: not run: --strict and 1 warning(s)", ""},
       {{"reindex", "/photo/2020"}, 0, "/photo/2020 is in no indexed folder and holds none", ""},
@@ -238,8 +232,7 @@ TEST_F(FileindexctlTest, AStepThatFailsAfterTheSaveIsNamedWithWhatWasSavedAndHow
   const Json::Value report = Parse(paused.out);
   EXPECT_EQ(report["changes"][0]["action"], "paused");
   EXPECT_NE(report["error"]["step"].asString().find("telling the daemon"), std::string::npos);
-  // A service that does not start: named, and nothing after it claimed. The daemon is still down,
-  // so the add starts the service.
+  // A service that does not start (the daemon is down, so the add starts it) is named.
   Write("usr/bin/systemctl",
         "#!/bin/sh\n[ \"$1\" = is-active ] && echo failed\necho failing >&2\nexit 3\n", 0755);
   const Result unstarted = Run({"add", "/video/movies", "--video"});

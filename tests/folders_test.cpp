@@ -82,8 +82,7 @@ TEST_F(FoldersTest, FileRoundTripWritesKeyOrderAndIgnoresTheStoredPath) {
   EXPECT_EQ(ParseJson(text)["/gone/a"], ParseJson(R"({"path":"/gone/a","name":"A","document":false,
                                                  "audio":false,"video":false,"photo":false})"));
   EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);
-  // Byte for byte the render of the records alone, in key order, after the load and after a
-  // change, an addition and a removal: stray members, stored paths and wrong types never survive.
+  // The records alone in key order, byte for byte, after the load and after changes.
   const auto rendered = [&folders] {
     std::vector<Folder> records;
     folders.List(records);

@@ -63,11 +63,9 @@ TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
               ::testing::Contains("index_mgr:N Failed to get share name from path: ").Times(2));
 }
 
-// Answers from what the process read before match a fresh load after each way the files change.
-// Some cases keep every read (no settling time), so that a change the kept snapshot misses shows.
+// Kept answers match a fresh load after each kind of change; some cases keep every read.
 TEST_F(QueryTest, KeptSnapshotsAnswerAsAFreshLoadAfterEveryChange) {
-  // What each file becomes: its text, "-" for removed, or "" for saved by another writer
-  // (/photo/b added, /photo/a removed, photo's flag cleared). Rewritten ones keep their size.
+  // Each file's new text, "-" removed, or "" saved by another writer (/photo/b for /photo/a).
   const std::string unreadableStatus = "config:N Failed to load json from " + StatusConfPath();
   const struct {
     const char *change, *folders, *status;
@@ -144,8 +142,7 @@ TEST_F(QueryTest, KeptSnapshotsAnswerAsAFreshLoadAfterEveryChange) {
   detail::SetSnapshotSettleTime(std::chrono::seconds(2));
 }
 
-// Two threads ask while a third saves the list again and again: every answer is one that either
-// list gives, and no read ever fails.
+// Two threads ask while a third saves again and again: each answer is one list's, none fails.
 TEST_F(QueryTest, ThreadsAskingWhileAnotherSavesSeeOneListOrTheOther) {
   detail::SetSnapshotSettleTime(std::chrono::seconds(0));
   WriteFile(FolderConfPath(), R"({"/photo/a":{}})");

@@ -1,6 +1,5 @@
-// The index manager's operations end to end: real configuration files, queues and a listening
-// daemon socket in the sandbox, the platform faked. Each test states together what an operation
-// leaves behind: folder.conf, the platform effects in order, the daemon's frames and the queues.
+// The index manager's operations end to end, the platform faked: what each leaves behind in
+// folder.conf, the platform effects in order, the daemon's frames and the queues.
 #include <optional>
 #include <regex>
 
@@ -107,9 +106,8 @@ TEST_F(IndexOpsTest, UpsertSavesThenRegistersStartsTellsTheDaemonAndQueuesUpdate
       << "the report of the second element, which switched photo off";
 }
 
-// Each case starts from the list `stored` (none: no file). The registration lists a share's
-// folders, nothing of their settings; the service runs once a folder is listed, unless the daemon
-// stopped answering.
+// From the list `stored` (none: no file): a share is registered with its folders only, and the
+// service runs once a folder is listed unless the daemon stopped answering.
 TEST_F(IndexOpsTest, UpsertsRegisterAndStartWhatTheyNeedAndFailuresAfterTheSaveSkipTheRest) {
   const std::string watch = "watch photo: /photo/a", start = "; Start fileindexd",
                     spotlight = "; Spotlight 1; Restart samba", kept = R"({"/photo/a":{}})";
@@ -158,8 +156,7 @@ TEST_F(IndexOpsTest, UpsertsRegisterAndStartWhatTheyNeedAndFailuresAfterTheSaveS
   }
 }
 
-// The caller blocks in connect until the daemon accepts: by then the change must be saved and
-// its lock still held.
+// The caller blocks in connect until the daemon accepts: the change is saved, the lock held.
 TEST_F(IndexOpsTest, TheDaemonIsToldOfASavedChangeWhileTheLockIsStillHeld) {
   WriteFile(FolderConfPath(), R"({"/video/v":{}})");
   const struct {
@@ -192,8 +189,7 @@ TEST_F(IndexOpsTest, TheDaemonIsToldOfASavedChangeWhileTheLockIsStillHeld) {
   }
 }
 
-// Another process holds both locks: every change fails with nothing touched, the queries read
-// without the locks.
+// Another process holds both locks: changes fail touching nothing; queries read without them.
 TEST_F(IndexOpsTest, AnotherWriterHoldingTheLocksMakesChangesFailWithNothingTouched) {
   FakeDaemon daemon;
   WriteFile(FolderConfPath(), R"({"/photo/a":{},"/video/v":{}})");
@@ -232,9 +228,7 @@ TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {
   FakeDaemon daemon;
   WriteFile(FolderConfPath(), R"({"/photo/a":{"photo":true}})");
   const std::string before = ReadFile(FolderConfPath());
-  // Each shape is malformed for every operation below; several make jsoncpp throw when a value
-  // is read as a type it does not have. Paths that name more than one place, or another place
-  // than they seem to, are refused like any other malformed element.
+  // Malformed for every operation (some make jsoncpp throw), paths naming another place too.
   const Json::Value shapes = ParseJson(R"([{}, {"path":"/photo/b"}, "/photo/a", 1, null, true,
       [1], [null], [true], [[1]], [{}], [{"path":{}}], [{"path":1}], [{"path":["/photo/b"]}],
       [{"path":"/photo/b"},"/photo/a"], ["/photo/a",{"path":"/photo/b"}], [{"path":"/photo/b"},[1]],
@@ -258,8 +252,7 @@ TEST_F(IndexOpsTest, MalformedRequestsAreRefusedWithACodeAndChangeNothing) {
       EXPECT_EQ(ReadFile(FolderConfPath()), before);
     }
   }
-  // A share name that is empty, or that no share can have, names no share: the folder list
-  // would read "" as every share. An update's path is checked as a request's paths are.
+  // A share name empty or impossible names no share ("" would read as every share).
   const std::function<bool()> shareOperations[] = {
       [] { return IndexMgr::Update("/photo/../../etc", Json::Value()); },
       [] { return IndexMgr::Update(std::string("/photo/a\0/../../etc", 19), Json::Value()); },
@@ -303,8 +296,7 @@ TEST_F(IndexOpsTest, DeletingFoldersTellsTheDaemonQueuesTheLastPathAndCleansAnEm
   EXPECT_TRUE(std::filesystem::is_empty(volume + "/photo/@eaDir")) << "index data removed";
   EXPECT_EQ(Log(), "");
 
-  // The last folder: the service stops, Spotlight goes off when it was on. A step that fails
-  // after the save is logged in its own words, and the save stays.
+  // The last folder stops the service and Spotlight; a later failing step leaves the save.
   const struct {
     void (*arrange)(fake::Platform&);
     const char *stored, *request;
@@ -404,8 +396,8 @@ TEST_F(IndexOpsTest, UpdateQueuesOneEventWithThePayload) {
   EXPECT_EQ(Log(), "index_mgr:N GetFullPath failed, path=/music/a.mp3");
 }
 
-// Earlier versions stored paths that a request may no longer name, such as a trailing slash. A
-// share rename or removal changes only the share's folders, not those of a share it prefixes.
+// Paths stored by earlier versions (a trailing slash) are taken as they are; a share change
+// leaves a share it prefixes alone.
 TEST_F(IndexOpsTest, FoldersStoredByEarlierVersionsAreTakenAsTheyAre) {
   FakeDaemon daemon;
   for (const char* share : {"pictures", "photos"}) {

@@ -19,8 +19,7 @@ std::string Ev(const std::string& code, const std::string& path, const std::stri
   return R"({"event":)" + code + R"(,"path":")" + path + '"' + rest + "}";
 }
 
-// "<event> <path> <path_old>" as the parser, or the quick scan, reads the line; "none" for no
-// event, "unsure" when the scan gives up.
+// "<event> <path> <path_old>" as the parser or the quick scan reads it, "none", or "unsure".
 std::string Parsed(const std::string& line) {
   QueueEvent e;
   return ParseQueueLine(line.data(), line.size(), e)
@@ -278,8 +277,7 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
       EXPECT_EQ(found, inFolders);
       EXPECT_EQ(log.Lines(), malformed);
     }
-    // One folder at a time, then all again, through what the process remembers: a line is
-    // logged the first time the process reads it (a last line without "\n" every time).
+    // Folder by folder twice through what the process remembers: a line is logged once.
     detail::ForgetQueueScans();
     Queue(text.empty() ? text : text + "\n");
     log.Clear();
@@ -297,9 +295,8 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
   EXPECT_GT(answers[1], 200);
 }
 
-// The readers look at the buffer 64 bytes and 16 KiB at a time: lines that end at or across
-// those boundaries, odd or not (codes with leading zeros or past an unsigned int in lines of the
-// writers' shape too), the last one with or without "\n", answer as the parser says.
+// Lines ending at or across the readers' 64-byte and 16 KiB steps, odd ones too (odd codes in
+// the writers' shape), with or without a last "\n", answer as the parser says.
 TEST_F(QueueReaderTest, LinesAtTheEdgesOfWhatIsLookedAtOnceAnswerAsTheParser) {
   const std::string f = volume + "/photo/a";
   const std::string probes[] = {
@@ -355,8 +352,7 @@ TEST_F(QueueReaderTest, LinesAtTheEdgesOfWhatIsLookedAtOnceAnswerAsTheParser) {
   }
 }
 
-// The process reads only what was appended to the same file; a queue that the daemon replaced or
-// truncated and wrote again, at the same size too, is read again from its start.
+// Only appends are read on; a queue replaced or rewritten, at the same size too, is read anew.
 TEST_F(QueueReaderTest, RemembersWhatItReadOnlyWhileTheQueueIsTheSameFileWithTheSameBytes) {
   const std::string a = volume + "/photo/a";
   const std::string b = volume + "/photo/b";
@@ -415,9 +411,8 @@ TEST_F(QueueReaderTest, RemembersWhatItReadOnlyWhileTheQueueIsTheSameFileWithThe
   }
 }
 
-// The stretch's stops and the reindex hints against a reading byte by byte, for stretches ending
-// before, at and after the steps of 16, 32 and 64 bytes, stops and hints often adjacent, with and
-// without AVX2.
+// Stops and reindex hints as a byte-by-byte reading finds them, for stretches ending around the
+// 16, 32 and 64-byte steps, with and without AVX2.
 TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
   std::mt19937 rng(7);
   static constexpr char kBytes[] = "ab\"\\\n/{}6553eE0.9u:_-";

@@ -1,11 +1,6 @@
-// An in-memory platform for the library's tests.
-//
-// It implements every operation of wezo/platform.h and wezo/wezotifyd.h that the library calls
-// from the state below, records each call with its arguments, and fails an operation on request.
-// Only the platform is faked: the one operation that creates something on disk (WEZOEAMKDir)
-// really creates the directory, because configuration files, locks, queues and sockets in the
-// tests are real files under a sandbox root. The state is per process; each test process starts
-// from Reset().
+// An in-memory platform for the library's tests: every operation the library calls answers from
+// the state below, is recorded with its arguments and fails on request. WEZOEAMKDir really makes
+// the directory, as files, locks, queues and sockets are real under the sandbox root.
 #ifndef FILEINDEX_TESTS_SUPPORT_FAKE_PLATFORM_H_
 #define FILEINDEX_TESTS_SUPPORT_FAKE_PLATFORM_H_
 
@@ -55,8 +50,7 @@ struct Platform {
   int execResult = 0;                   // what WLIBCExecv returns
   // Monitor registrations by client, then queue path.
   std::map<std::string, std::map<std::string, Json::Value>> monitor;
-  // WLIBCUnicodeUTF8StrCaseCmp's answer when set (strcasecmp otherwise), to play a platform
-  // whose comparison is not a consistent order.
+  // WLIBCUnicodeUTF8StrCaseCmp's answer when set (else strcasecmp): an inconsistent order.
   int (*strCaseCmp)(const char*, const char*) = nullptr;
 
   // ---- failure injection, by area ----

@@ -106,8 +106,7 @@ LockHolder::~LockHolder() {
 
 namespace {
 
-// A path filling sun_path to its last byte is taken: a test puts a daemon where the library must
-// refuse to look.
+// A path filling sun_path is taken: a test puts a daemon where the library must not look.
 sockaddr_un AddressOf(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -115,8 +114,7 @@ sockaddr_un AddressOf(const std::string& path) {
   return address;
 }
 
-// Connects to the socket at `path` (with SOCK_NONBLOCK, not waiting on a full backlog); -1 on
-// failure.
+// Connects to `path` (SOCK_NONBLOCK: not waiting on a full backlog); -1 on failure.
 int ConnectTo(const std::string& path, int flags = 0) {
   const sockaddr_un address = AddressOf(path);
   const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | flags, 0);

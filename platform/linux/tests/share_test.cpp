@@ -14,9 +14,8 @@ namespace {
 
 using ShareTest = SandboxTest;
 
-// Samba's rules at work: comments, continuation lines, names without case or spaces, the last
-// value winning across a parameter's other names, a repeated section, special sections and one
-// without a path.
+// Samba's rules: comments, continuations, names without case or spaces, the last of a parameter's
+// names winning, a repeated section, special sections and one without a path.
 const char* const kConf =
     "; comment\n# [commented]\n[global]\n   read only = no\n"
     "[photo]\n   path = /volume1/photo/\n   READ ONLY = yes\n   writable = yes\n"
@@ -104,9 +103,8 @@ TEST_F(ShareTest, FailuresAndUnencryptedFoldersAreTold) {
 TEST_F(ShareTest, AKeptConfigurationFollowsEveryChangeOfTheFile) {
   const auto settled = std::chrono::floor<std::chrono::seconds>(
       std::filesystem::file_time_type::clock::now() - std::chrono::hours(1));
-  // Each share's file, written in the same second and moved over smb.conf: the second is a new
-  // file of the same size, the third the same file rewritten in place, the fourth that again at
-  // the same size a nanosecond later.
+  // Moved over smb.conf in one second: a new file of the same size, the same file rewritten in
+  // place, and again at the same size a nanosecond later.
   const char* before = "none";
   int tick = 0;
   for (const auto& [file, name] : {std::pair{"etc/samba/smb.conf", "aaaa"},

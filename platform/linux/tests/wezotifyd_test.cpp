@@ -1,5 +1,4 @@
-// The monitor daemon as a program against the real kernel, each test with its own daemon in its
-// own sandbox root; registrations are written through the platform's client API.
+// The monitor daemon against the real kernel, one daemon per sandbox, registered through the API.
 #include <fcntl.h>
 #include <spawn.h>
 #include <sys/file.h>
@@ -150,8 +149,7 @@ TEST_F(WezotifydTest, FlagsTheShareForAReindexWhenTheKernelDropsEvents) {
   })) << Read("log");
 }
 
-// The consumer takes a queue by removing it under its lock: a change that came meanwhile goes to
-// a new queue, not to the file nobody reads any more.
+// The consumer takes a queue by removing it under its lock: a change made meanwhile goes anew.
 TEST_F(WezotifydTest, WritesToANewQueueWhenTheOneItWaitedForIsTaken) {
   Start(1);
   const int taken = open(Queue(1).c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644);
