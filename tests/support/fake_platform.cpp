@@ -244,9 +244,7 @@ int WEZOSMBSetSpotlight(int fEnable) {
   return 0;
 }
 
-int WLIBCUnicodeUTF8StrCaseCmp(const char* szA, const char* szB) {
-  return Get().strCaseCmp != nullptr ? Get().strCaseCmp(szA, szB) : strcasecmp(szA, szB);
-}
+int WLIBCUnicodeUTF8StrCaseCmp(const char* szA, const char* szB) { return strcasecmp(szA, szB); }
 
 }  // extern "C"
 

@@ -50,8 +50,6 @@ struct Platform {
   int execResult = 0;                   // what WLIBCExecv returns
   // Monitor registrations by client, then queue path.
   std::map<std::string, std::map<std::string, Json::Value>> monitor;
-  // WLIBCUnicodeUTF8StrCaseCmp's answer when set (else strcasecmp): an inconsistent order.
-  int (*strCaseCmp)(const char*, const char*) = nullptr;
 
   // ---- failure injection, by area ----
   bool share_get_fails = false, share_name_path_get_fails = false;
