@@ -14,10 +14,6 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 
-double SecondsSince(Clock::time_point start) {
-  return std::chrono::duration<double>(Clock::now() - start).count();
-}
-
 using DaemonTest = testsupport::LibraryTest;
 
 // One connection per call: the length (with the zero, host byte order), text and zero, exact for
@@ -75,7 +71,8 @@ TEST_F(DaemonTest, AMissingOrStuckDaemonFailsTheCallWithinABound) {
     const int descriptors = testsupport::OpenDescriptorCount();
     const Clock::time_point start = Clock::now();
     EXPECT_FALSE(SendCammandToDaemon("t", std::string(1U << 20, 'x')));  // past the buffers
-    EXPECT_LT(SecondsSince(start), seconds);                             // a bound, not a speed
+    EXPECT_LT(std::chrono::duration<double>(Clock::now() - start).count(),
+              seconds);  // a bound, not a speed
     EXPECT_TRUE(behaviour || testsupport::OpenDescriptorCount() == descriptors);
     EXPECT_EQ(signal(SIGPIPE, SIG_DFL), SIG_DFL);
   }

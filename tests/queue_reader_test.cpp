@@ -19,24 +19,15 @@ std::string Ev(const std::string& code, const std::string& path, const std::stri
   return R"({"event":)" + code + R"(,"path":")" + path + '"' + rest + "}";
 }
 
-// "<event> <path> <path_old>" as the parser or the quick scan reads it, "none", or "unsure".
-std::string Parsed(const std::string& line) {
+// "<event> <path> <path_old>" as the parser (`quick`: the scan) reads it, "none", or "unsure".
+std::string LineAs(const std::string& line, bool quick = false) {
   QueueEvent e;
-  return ParseQueueLine(line.data(), line.size(), e)
-             ? std::to_string(e.event) + " " + e.path + " " + e.pathOld
-             : "none";
-}
-std::string Scanned(const std::string& line) {
-  QueueEvent e;
-  switch (detail::ScanQueueLine(line.data(), line.size(), e)) {
-    case detail::LineVerdict::kEvent:
-      return std::to_string(e.event) + " " + e.path + " " + e.pathOld;
-    case detail::LineVerdict::kNoEvent:
-      return "none";
-    case detail::LineVerdict::kUnsure:
-      break;
-  }
-  return "unsure";
+  using V = detail::LineVerdict;
+  const V v = quick ? detail::ScanQueueLine(line.data(), line.size(), e)
+              : ParseQueueLine(line.data(), line.size(), e) ? V::kEvent
+                                                            : V::kNoEvent;
+  if (v == V::kUnsure) return "unsure";
+  return v == V::kEvent ? std::to_string(e.event) + " " + e.path + " " + e.pathOld : "none";
 }
 
 const detail::ReadOptions kPlain{size_t{1} << 20, false};
@@ -93,8 +84,8 @@ TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
                {"", "none", false}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.line);
-    EXPECT_EQ(Parsed(c.line), c.event);
-    const std::string scanned = Scanned(c.line);
+    EXPECT_EQ(LineAs(c.line), c.event);
+    const std::string scanned = LineAs(c.line, true);
     EXPECT_TRUE(scanned == c.event || (!c.quick && scanned == "unsure")) << scanned;
   }
 }
@@ -225,8 +216,8 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
     std::vector<bool> isEvent(lines.size());
     for (size_t i = 0; i < lines.size(); ++i) {
       // The quick scan may give up on any line, but never answers otherwise than the parser.
-      const std::string scanned = Scanned(lines[i]);
-      EXPECT_TRUE(scanned == "unsure" || scanned == Parsed(lines[i])) << lines[i];
+      const std::string scanned = LineAs(lines[i], true);
+      EXPECT_TRUE(scanned == "unsure" || scanned == LineAs(lines[i])) << lines[i];
       isEvent[i] = ParseQueueLine(lines[i].data(), lines[i].size(), events[i]);
     }
     std::vector<std::string> folders;

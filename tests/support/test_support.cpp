@@ -201,24 +201,20 @@ void FakeDaemon::Serve() {
   for (int fd : held) close(fd);
 }
 
-std::vector<std::string> FakeDaemon::Connections(size_t count, std::chrono::milliseconds timeout) {
+std::vector<std::string> FakeDaemon::Connections(size_t count, std::chrono::milliseconds timeout,
+                                                 bool commands) {
+  // A connection closed without a byte asked whether the daemon answers; it is no command.
+  const auto ended = [&] {
+    return static_cast<size_t>(std::count_if(
+        m_ended.begin(), m_ended.end(), [&](const auto& f) { return !commands || !f.empty(); }));
+  };
   std::unique_lock<std::mutex> lock(m_mutex);
-  m_changed.wait_for(lock, timeout, [&] { return m_ended.size() >= count; });
+  m_changed.wait_for(lock, timeout, [&] { return ended() >= count; });
   return m_ended;
 }
 
 std::vector<Json::Value> FakeDaemon::Commands(size_t count, std::chrono::milliseconds timeout) {
-  std::vector<std::string> frames;
-  {
-    // A connection closed without a byte asked whether the daemon answers; it is no command.
-    const auto commands = [this] {
-      return static_cast<size_t>(std::count_if(m_ended.begin(), m_ended.end(),
-                                               [](const std::string& f) { return !f.empty(); }));
-    };
-    std::unique_lock<std::mutex> lock(m_mutex);
-    m_changed.wait_for(lock, timeout, [&] { return commands() >= count; });
-    frames = m_ended;
-  }
+  const std::vector<std::string> frames = Connections(count, timeout, true);
   std::vector<Json::Value> out;
   for (const std::string& frame : frames) {
     if (frame.empty()) continue;

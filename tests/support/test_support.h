@@ -90,9 +90,11 @@ class FakeDaemon {
   FakeDaemon& operator=(const FakeDaemon&) = delete;
 
   void Release();  // kHoldConnect: from now on behave as kRead
-  // Each ended connection's bytes ("" closed unread), once `count` ended or `timeout` passed.
+  // Each ended connection's bytes ("" closed unread), once `count` ended (of those with bytes,
+  // with `commands`) or `timeout` passed.
   std::vector<std::string> Connections(size_t count,
-                                       std::chrono::milliseconds timeout = std::chrono::seconds(5));
+                                       std::chrono::milliseconds timeout = std::chrono::seconds(5),
+                                       bool commands = false);
   // The commands decoded likewise, empty connections left out; a bad length or zero fails.
   std::vector<Json::Value> Commands(size_t count,
                                     std::chrono::milliseconds timeout = std::chrono::seconds(5));
