@@ -191,6 +191,7 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResultAndNamesEachChange) {
       {{"explain", "/photo/2019/trip"}, "unknown_file_system", "/photo/2019"},
       {{"explain", At("volume1/video/movies"), "--full-path"}, "indexable", "/video/movies"},
       {{"explain", "/photo/2019/"}, "resolves_elsewhere", "/photo/2019"},
+      {{"explain", "/photo/latest"}, "resolves_elsewhere", ""},
       {{"explain", "/tv/x"}, "unknown_file_system", ""}};
   for (const auto& [args, rule, holder] : explained) {
     SCOPED_TRACE(args[1]);
@@ -199,11 +200,6 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResultAndNamesEachChange) {
     EXPECT_EQ(said["folder"], holder);
     EXPECT_EQ(said["rule"], fi::IndexRuleKey(fi::FullPathIndexRule(said["full_path"].asString())));
   }
-  EXPECT_EQ(Run({"explain", "/photo/latest"}).out,
-            "path: /photo/latest\nfull path: " + At("volume1/photo/latest") +
-                "\nmay be indexed: no, " +
-                fi::DescribeIndexRule(fi::IndexRule::kResolvesElsewhere) +
-                "\nin an indexed folder: no\n");
 
   const std::pair<Args, const char*> changes[] = {
       {{"share", "rename", "video", "music"},

@@ -43,20 +43,15 @@ class IndexOpsTest : public testsupport::LibraryTest {
     std::vector<std::string> effects;
     for (const fake::Call& call : fake::Get().calls) {
       const std::string first = call.args.empty() ? "" : call.args[0];
-      if (call.op.rfind("WLIBService", 0) == 0) {
-        effects.push_back(call.op.substr(11) + " " + first);
-      } else if (call.op == "WEZOSMBSetSpotlight") {
-        effects.push_back("Spotlight " + first);
-      } else if (call.op == "MonitorQueue::Upsert") {
-        const Json::Value entry = ParseJson(first);
-        std::string text = "watch " + Relative(entry["queue"].asString()).substr(1, 5) + ":";
-        for (const Json::Value& dir : entry["config"]) {
-          text += " " + Relative(dir["path"].asString());
-        }
-        effects.push_back(text);
-      } else if (call.op == "MonitorQueue::Delete") {
+      if (call.op.rfind("WLIBService", 0) == 0) effects.push_back(call.op.substr(11) + " " + first);
+      if (call.op == "WEZOSMBSetSpotlight") effects.push_back("Spotlight " + first);
+      if (call.op == "MonitorQueue::Delete")
         effects.push_back("unwatch " + Relative(first).substr(1, 5));
-      }
+      if (call.op != "MonitorQueue::Upsert") continue;
+      const Json::Value entry = ParseJson(first);
+      std::string text = "watch " + Relative(entry["queue"].asString()).substr(1, 5) + ":";
+      for (const Json::Value& dir : entry["config"]) text += " " + Relative(dir["path"].asString());
+      effects.push_back(text);
     }
     return Joined(effects);
   }

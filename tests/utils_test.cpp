@@ -42,18 +42,6 @@ TEST_F(UtilsTest, SmallHelpersAnswerOnTheirBoundaries) {
   // Compared as C strings: bytes after an embedded NUL do not count.
   EXPECT_TRUE(StringStartWith(std::string("/a\0x", 4), std::string("/a\0y", 4)));
   EXPECT_FALSE(StringStartWith("/vol", "/volume1") || StringStartWith("/Volume1", "/volume1"));
-
-  // Each reader takes only members of its own type and leaves its output alone otherwise.
-  Json::Value obj;
-  ASSERT_TRUE(JsonFromString(obj, R"({"s":"text","b":true,"n":5,"sb":"true"})"));
-  std::string s = "untouched";
-  bool b = false;
-  EXPECT_FALSE(RetrieveStringFromJsonObj(s, "b", obj) || RetrieveStringFromJsonObj(s, "n", obj) ||
-               RetrieveStringFromJsonObj(s, "s", Json::Value("text")));
-  EXPECT_FALSE(RetrieveBoolFromJsonObj(b, "sb", obj) || RetrieveBoolFromJsonObj(b, "n", obj));
-  EXPECT_EQ(s + (b ? "1" : "0"), "untouched0");
-  EXPECT_TRUE(RetrieveStringFromJsonObj(s, "sb", obj) && RetrieveBoolFromJsonObj(b, "b", obj));
-  EXPECT_EQ(s + (b ? "1" : "0"), "true1");
 }
 
 TEST_F(UtilsTest, SharePathsSplitAtTheFirstComponent) {
