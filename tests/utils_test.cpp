@@ -44,21 +44,6 @@ TEST_F(UtilsTest, SmallHelpersAnswerOnTheirBoundaries) {
   EXPECT_FALSE(StringStartWith("/vol", "/volume1") || StringStartWith("/Volume1", "/volume1"));
 }
 
-TEST_F(UtilsTest, SharePathsSplitAtTheFirstComponent) {
-  // The path, its share name (nullptr: refused) and ReplaceShareName(path, "b").
-  const std::tuple<const char*, const char*, const char*> kCases[] = {
-      {"/photo", "photo", "/b"},       {"/photo/", "photo", "/b/"}, {"/", "", "/b"},
-      {"photo/2019", "hoto", nullptr}, {"//x", "", nullptr},        {"", nullptr, ""}};
-  for (const auto& [path, expected, replaced] : kCases) {
-    SCOPED_TRACE(path);
-    std::string name = "old";
-    EXPECT_EQ(GetShareNameByPath(name, path), expected != nullptr);
-    EXPECT_EQ(name, expected != nullptr ? expected : "old");
-    EXPECT_EQ(replaced != nullptr ? ReplaceShareName(path, "b") : "", replaced ? replaced : "");
-  }
-  EXPECT_EQ(ReplaceShareName("/photo/2019", "pictures"), "/pictures/2019");
-}
-
 TEST_F(UtilsTest, FullPathsComeFromTheShareDatabaseAndErrorsOutliveSuccesses) {
   fake::Get().AddShare("flat", "flatshare");
   // The path, its full path ("": refused), the error code left and the lines logged.

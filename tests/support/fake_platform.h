@@ -39,7 +39,6 @@ struct Call {
 };
 
 struct Platform {
-  // ---- state ----
   std::map<std::string, Share> shares;     // by name
   std::map<std::string, PathFacts> facts;  // by exact full path
   PathFacts defaultFacts;                  // for every other path
@@ -51,7 +50,6 @@ struct Platform {
   // Monitor registrations by client, then queue path.
   std::map<std::string, std::map<std::string, Json::Value>> monitor;
 
-  // ---- failure injection, by area ----
   bool share_get_fails = false, share_name_path_get_fails = false;
   int share_get_fails_after = -1;  // when >= 0, share lookups after that many successes fail
   bool encrypted_query_fails = false, encryption_query_fails = false;
@@ -60,7 +58,6 @@ struct Platform {
   bool spotlight_query_fails = false, spotlight_set_fails = false;
   bool monitor_upsert_fails = false, monitor_delete_fails = false;
 
-  // ---- observation ----
   std::vector<Call> calls;   // every call but the string comparison, in order
   int openShareRecords = 0;  // records handed out by WEZOShareGet and not yet freed
   int errCode = 0;
@@ -71,10 +68,8 @@ struct Platform {
   std::vector<Call> CallsTo(const std::string& op) const;
 };
 
-// The process's fake platform.
+// The process's fake platform; Reset() makes it fresh: no shares, calls, failures or error.
 Platform& Get();
-
-// Back to a fresh platform: no shares, no calls, no failures, no last error.
 void Reset();
 
 }  // namespace fake
