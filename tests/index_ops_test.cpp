@@ -364,7 +364,8 @@ TEST_F(IndexOpsTest, ReindexQueuesNothingUnlessEveryElementIsAcceptable) {
 
   // Shares out of space are revived first, once each; a revival that fails does not stop it.
   ASSERT_TRUE(StatusMgr::ShareSetNoSpace("photo", true));
-  ASSERT_TRUE(StatusMgr::ShareSetNoSpace("video", true));
+  ASSERT_TRUE(StatusMgr::ShareSetNoSpace("video", true) &&
+              StatusMgr::ShareSetNeedReindex("video", true));
   {
     FakeDaemon daemon;
     ASSERT_TRUE(IndexMgr::Reindex(ParseJson(R"(["/video/v","/photo/a","/video/v"])")));
@@ -372,6 +373,7 @@ TEST_F(IndexOpsTest, ReindexQueuesNothingUnlessEveryElementIsAcceptable) {
                                  R"(revive_share_worker {"share_name":"video"})");
   }
   EXPECT_FALSE(StatusMgr::ShareIsNoSpace("photo"));
+  EXPECT_TRUE(StatusMgr::ShareIsNeedReindex("video")) << "reviving leaves a reindex pending";
   EXPECT_EQ(Events("video"), "65536 /video/v null") << "the duplicate is dropped";
   ASSERT_TRUE(StatusMgr::ShareSetNoSpace("photo", true));
   std::filesystem::remove_all(volume + "/photo/@eaDir");
@@ -380,6 +382,7 @@ TEST_F(IndexOpsTest, ReindexQueuesNothingUnlessEveryElementIsAcceptable) {
   EXPECT_EQ(Log(),
             "status_mgr:N SendCammandToDaemon failed; "
             "index_mgr:N ShareRevice failed, share=photo");
+  EXPECT_FALSE(StatusMgr::ShareIsNoSpace("photo")) << "cleared although the daemon was not told";
   EXPECT_EQ(Events("photo"), "65536 /photo/a null");
 }
 
