@@ -38,7 +38,6 @@ TEST_F(QueryTest, MembershipHasASlashBoundaryAndNoOtherNormalisation) {
     EXPECT_EQ(IndexMgr::IsFullPathIndexed(volume + c.path, folders), c.indexed && *c.path != '\0');
     EXPECT_EQ(IndexMgr::IsPathContainIndexed(c.path), c.contains);
     EXPECT_EQ(IndexMgr::IsPathContainIndexed(c.path, folders), c.contains);
-    // The C interface answers the same.
     EXPECT_EQ(FILEIDXIsPathIndexed(c.path), c.indexed ? 1 : 0);
     EXPECT_EQ(FILEIDXIsFullPathIndexed((volume + c.path).c_str()), c.indexed && *c.path != '\0');
   }

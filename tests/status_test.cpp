@@ -5,7 +5,6 @@ namespace {
 
 class StatusTest : public testsupport::LibraryTest {
  protected:
-  // A status object loaded from a status file holding `text`.
   void LoadText(Status& status, const std::string& text) {
     WriteFile(StatusConfPath(), text);
     ASSERT_TRUE(status.Load());

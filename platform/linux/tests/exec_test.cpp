@@ -1,9 +1,7 @@
-#include <gtest/gtest.h>
 #include <unistd.h>
 #include <wezo/platform.h>
 
 #include <set>
-#include <string>
 #include <thread>
 #include <tuple>
 

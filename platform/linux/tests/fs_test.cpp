@@ -1,14 +1,10 @@
 #include <sys/mount.h>
-#include <sys/stat.h>
 #include <unistd.h>
 #include <wezo/platform.h>
 #include <wezo/wezotifyd.h>
 
 #include <algorithm>
 #include <climits>
-#include <filesystem>
-#include <fstream>
-#include <string>
 
 #include "internal.h"
 #include "json_io.h"

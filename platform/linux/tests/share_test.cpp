@@ -1,10 +1,7 @@
-#include <sys/stat.h>
 #include <unistd.h>
 #include <wezo/platform.h>
 
 #include <chrono>
-#include <filesystem>
-#include <string>
 #include <tuple>
 
 #include "internal.h"
