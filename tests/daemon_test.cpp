@@ -4,7 +4,6 @@
 #include <csignal>
 #include <cstdint>
 #include <cstring>
-#include <future>
 #include <optional>
 
 #include "test_support.h"
@@ -79,18 +78,6 @@ TEST_F(DaemonTest, AMissingOrStuckDaemonFailsTheCallWithinABound) {
   (void)signal(SIGPIPE, asFound);
   close(bound);
   EXPECT_TRUE(log.Lines().empty());  // the caller decides what a lost command means
-}
-
-// A backlog freed well within the second a connect waits: the command still arrives.
-TEST_F(DaemonTest, ADaemonThatAcceptsWithinASecondGetsTheCommand) {
-  FakeDaemon daemon(FakeDaemon::Behaviour::kHoldConnect);
-  std::future<bool> sent = std::async(std::launch::async, [] {
-    return SendCammandToDaemon("resume", Json::Value(Json::objectValue));
-  });
-  std::this_thread::sleep_for(std::chrono::milliseconds(100));
-  daemon.Release();
-  EXPECT_TRUE(sent.get());
-  EXPECT_EQ(daemon.Commands(1)[0], ParseJson(R"({"type":"resume","data":{}})"));
 }
 
 }  // namespace

@@ -16,8 +16,7 @@ namespace WEZO::FILEINDEX {
 namespace {
 
 int CountFromEnv(const char* name, int fallback) {
-  const char* text = std::getenv(name);
-  const long value = text != nullptr ? std::strtol(text, nullptr, 10) : 0;
+  const long value = std::getenv(name) != nullptr ? std::strtol(std::getenv(name), nullptr, 10) : 0;
   return value > 0 && value <= INT_MAX ? static_cast<int>(value) : fallback;
 }
 

@@ -96,8 +96,8 @@ std::string Joined(const std::vector<std::string>& parts) {
 
 LockHolder::LockHolder(const std::string& path, bool exclusive)
     : m_fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644)) {
-  m_holding = m_fd >= 0 && flock(m_fd, exclusive ? LOCK_EX : LOCK_SH) == 0;
-  EXPECT_TRUE(m_holding) << "could not lock " << path;
+  EXPECT_TRUE(m_fd >= 0 && flock(m_fd, exclusive ? LOCK_EX : LOCK_SH) == 0)
+      << "cannot lock " << path;
 }
 
 LockHolder::~LockHolder() {

@@ -59,6 +59,7 @@ bool LockHeldElsewhere(const std::string& path);  // some descriptor holds a flo
 std::string Joined(const std::vector<std::string>& parts);  // "a; b; c"
 
 // A flock on `path` (created if need be) through a descriptor of its own: another process's.
+// Fails the test when it cannot be had.
 class LockHolder {
  public:
   LockHolder(const std::string& path, bool exclusive);
@@ -66,11 +67,8 @@ class LockHolder {
   LockHolder(const LockHolder&) = delete;
   LockHolder& operator=(const LockHolder&) = delete;
 
-  bool Holding() const { return m_holding; }
-
  private:
   int m_fd = -1;
-  bool m_holding = false;
 };
 
 // A stand-in for the indexing daemon on the sandbox's socket path, served one connection at a time
