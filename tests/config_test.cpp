@@ -6,8 +6,6 @@
 namespace WEZO::FILEINDEX {
 namespace {
 
-using Lines = std::vector<std::string>;
-
 // A configuration file at the folder list's locations, with its document in the open.
 class TestConfig : public Config {
  public:
@@ -55,7 +53,7 @@ TEST_F(ConfigTest, EveryFixedPathLiesUnderAnAbsoluteRoot) {
 TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAllAndLoadTellsItsFailures) {
   const std::string stale = FolderConfPath() + ".a1B2c3";
   for (const bool locked : {false, true}) {
-    testsupport::WriteFile(stale, "{\"half");
+    WriteFile(stale, "{\"half");
     TestConfig cfg;
     ASSERT_TRUE(!locked || cfg.Lock(true));
     const mode_t old = umask(0077);
@@ -67,7 +65,7 @@ TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAllAndLoadTellsItsFailures) {
   }
   EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);
   // A symbolic link in the file's place counts as no file; it is replaced, not written through.
-  const std::string real = sandbox.Path("/real.conf");
+  const std::string real = At("/real.conf");
   ASSERT_EQ(rename(FolderConfPath().c_str(), real.c_str()), 0);
   ASSERT_EQ(symlink(real.c_str(), FolderConfPath().c_str()), 0);
   TestConfig cfg;
@@ -75,9 +73,9 @@ TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAllAndLoadTellsItsFailures) {
   EXPECT_EQ(cfg.Doc(), Json::Value(Json::objectValue));
   cfg.Doc()["b"] = 2;
   ASSERT_TRUE(cfg.SaveJson());
-  EXPECT_EQ(testsupport::ReadFile(real), "{}\n");
+  EXPECT_EQ(ReadFile(real), "{}\n");
   EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);  // a file of its own
-  testsupport::WriteFile(FolderConfPath(), "");
+  WriteFile(FolderConfPath(), "");
   EXPECT_FALSE(cfg.LoadJson());
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_LOAD_JSON);
   // A directory in the file's place makes the final rename fail after the data is written.
@@ -86,7 +84,7 @@ TEST_F(ConfigTest, SaveReplacesTheFileWholeOrNotAtAllAndLoadTellsItsFailures) {
   EXPECT_FALSE(cfg.SaveJson());
   EXPECT_EQ(ErrorHandler::GetError(), FILEINDEX_ERR_SAVE_JSON);
   EXPECT_EQ(log.Lines(), Lines{"config:N Failed to save json to " + FolderConfPath()});
-  const auto entries = std::filesystem::directory_iterator(sandbox.Path("/usr/wezo/etc/fileindex"));
+  const auto entries = std::filesystem::directory_iterator(At("/usr/wezo/etc/fileindex"));
   EXPECT_EQ(std::distance(entries, {}), 1);  // no temporary file is left
 }
 
@@ -94,7 +92,6 @@ TEST_F(ConfigTest, LockAdmitsOnlySharedBesideSharedAndKeepsItsFilePrivate) {
   const int fdsBefore = testsupport::OpenDescriptorCount();
   for (const bool held : {true, false}) {
     testsupport::LockHolder other(FolderLockPath(), /*exclusive=*/held);
-    ASSERT_TRUE(other.Holding());
     for (const bool exclusive : {true, false}) {
       EXPECT_EQ(TryLock(exclusive, {}), !held && !exclusive) << held << exclusive;
     }
@@ -108,12 +105,10 @@ TEST_F(ConfigTest, LockAdmitsOnlySharedBesideSharedAndKeepsItsFilePrivate) {
   // Readable by others, the lock file could be opened and held by any local user.
   EXPECT_EQ(testsupport::ModeOf(FolderLockPath()), 0600);
   int flagged = 0;  // the lock's descriptor does not pass to programs that the caller runs
-  for (int fd = 0; fd < 1024; ++fd) {
-    char target[4096];
-    const ssize_t n = readlink(("/proc/self/fd/" + std::to_string(fd)).c_str(), target, 4095);
-    if (n > 0 && std::string(target, static_cast<size_t>(n)) == FolderLockPath()) {
-      flagged += (fcntl(fd, F_GETFD) & FD_CLOEXEC) != 0 ? 1 : 100;
-    }
+  for (const auto& fd : std::filesystem::directory_iterator("/proc/self/fd")) {
+    std::error_code ec;
+    if (std::filesystem::read_symlink(fd.path(), ec) != FolderLockPath()) continue;
+    flagged += (fcntl(std::stoi(fd.path().filename()), F_GETFD) & FD_CLOEXEC) != 0 ? 1 : 100;
   }
   EXPECT_EQ(flagged, 1);
   EXPECT_FALSE(TryLock(true, {}));  // two objects of one process lock independently
@@ -127,8 +122,8 @@ TEST_F(ConfigTest, LockAdmitsOnlySharedBesideSharedAndKeepsItsFilePrivate) {
 
 TEST_F(ConfigTest, LockFileThatOthersCouldHoldIsRefused) {
   const std::string lock = FolderLockPath();
-  const std::string other = sandbox.Path("/other");
-  testsupport::WriteFile(other, "precious");
+  const std::string other = At("/other");
+  WriteFile(other, "precious");
   ASSERT_EQ(chmod(other.c_str(), 0644), 0);
   const std::string refused = "config:N Lock file refused, not a regular file of uid " +
                               std::to_string(geteuid()) + " with one link, path=" + lock;
@@ -146,7 +141,7 @@ TEST_F(ConfigTest, LockFileThatOthersCouldHoldIsRefused) {
     EXPECT_FALSE(TryLock(true, c.refusedLine ? Lines{refused} : Lines{}));
   }
   EXPECT_EQ(testsupport::ModeOf(other), 0644);  // the linked file is not touched
-  EXPECT_EQ(testsupport::ReadFile(other), "precious");
+  EXPECT_EQ(ReadFile(other), "precious");
 }
 
 TEST_F(ConfigTest, TextIsOneLineAndOnlyOneWholeValueIsRead) {
@@ -168,7 +163,7 @@ TEST_F(ConfigTest, TextIsOneLineAndOnlyOneWholeValueIsRead) {
 }
 
 TEST_F(ConfigTest, RemovesOnlyOldTemporariesOfTheFile) {
-  const std::string dir = sandbox.Path("/usr/wezo/etc/fileindex/");
+  const std::string dir = At("/usr/wezo/etc/fileindex/");
   const struct Case {
     const char* name;
     bool old, removed;  // a new one's writer may still be saving
@@ -177,12 +172,17 @@ TEST_F(ConfigTest, RemovesOnlyOldTemporariesOfTheFile) {
                 {"folder.conf.a1-2c3", true, false}, {"folder.confXa1B2c3", true, false}};
   const timespec twoHoursAgo[2] = {{time(nullptr) - 7200, 0}, {time(nullptr) - 7200, 0}};
   for (const Case& c : kCases) {
-    testsupport::WriteFile(dir + c.name, "{");
+    WriteFile(dir + c.name, "{");
     ASSERT_EQ(c.old ? utimensat(AT_FDCWD, (dir + c.name).c_str(), twoHoursAgo, 0) : 0, 0);
   }
+  const std::string link = dir + "folder.conf.L1nk00";  // only regular files are temporaries
+  ASSERT_EQ(symlink("folder.conf", link.c_str()) |
+                utimensat(AT_FDCWD, link.c_str(), twoHoursAgo, AT_SYMLINK_NOFOLLOW),
+            0);
   RemoveStaleTemporaries(dir + "folder.conf", 3600);
   for (const Case& c : kCases)
     EXPECT_EQ(testsupport::ModeOf(dir + c.name) < 0, c.removed) << c.name;
+  EXPECT_GE(testsupport::ModeOf(link), 0);
 }
 
 }  // namespace

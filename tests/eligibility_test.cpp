@@ -1,15 +1,12 @@
 #include <wezo/platform.h>
 
 #include <algorithm>
-#include <sstream>
 
 #include "test_support.h"
 #include "utils/eligibility_pass.h"
 
 namespace WEZO::FILEINDEX {
 namespace {
-
-using ::testing::ElementsAre;
 
 class EligibilityTest : public testsupport::LibraryTest {
  protected:
@@ -22,8 +19,7 @@ class EligibilityTest : public testsupport::LibraryTest {
   }
 };
 
-// Sets up what `words` name for a path with `facts`: a fact of the path, a share setting, or a
-// query that fails ("?").
+// Sets up what `words` name: a fact of the path, a share setting, or a failing query ("?").
 void Arrange(const std::string& words, fake::PathFacts& facts) {
   fake::Platform& pf = fake::Get();
   fake::Share& photo = pf.shares["photo"];
@@ -48,13 +44,11 @@ void Arrange(const std::string& words, fake::PathFacts& facts) {
   }
 }
 
-// Every rule of the folder check: the rule it yields, the call that decides it (which shows the
-// order in which the rules are tried) and the line it logs.
+// Each rule of the folder check, the call that decides it (the rules' order) and its log line.
 TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
   using R = IndexRule;
   const char* realpath = "check realpath failed, path=%s";
-  // folder: under the volume; "": /photo/2019; setup: see Arrange(); logLine: after "utils:N ",
-  // with %s for the full path.
+  // folder under the volume ("": /photo/2019), setup, rule, call, line after "utils:N " (%s).
   const std::tuple<const char*, const char*, IndexRule, const char*, const char*> cases[] = {
       {"", "", R::kIndexable, "WEZOFSDirIsMntPoint", ""},
       {"/photo/#recycle-notes", "recycle", R::kRecycleBin, "WEZOShareIsShareRecycle", ""},
@@ -110,8 +104,7 @@ TEST_F(EligibilityTest, FolderRulesRefuseInOrder) {
   }
 }
 
-// Folders of one pass, in this order, get the answers of the folder-by-folder check, although
-// the pass asks once per share and resolves each directory once.
+// A pass asks once per share and resolves each directory once, answering as folder by folder.
 TEST_F(EligibilityTest, APassAnswersEachFolderAsTheFolderByFolderCheck) {
   std::filesystem::create_directories(volume + "/photo/2019/sub/deep");
   std::filesystem::create_directories(volume + "/video/clips");
@@ -135,8 +128,7 @@ TEST_F(EligibilityTest, APassAnswersEachFolderAsTheFolderByFolderCheck) {
   }
   EXPECT_EQ(fake::Get().CallsTo("WEZOShareGet").size(), 2U);
   EXPECT_EQ(fake::Get().CallsTo("WLIBShareIsEncryptionGet").size(), 1U);
-  // A share that goes between two passes is seen gone by the second; a share record that cannot
-  // be had is logged once per pass.
+  // A share gone between passes is gone for the second; an unreadable share is logged per pass.
   fake::Get().shares.erase("video");
   for (int i = 0; i < 2; ++i) {
     EligibilityPass later;
@@ -149,8 +141,7 @@ TEST_F(EligibilityTest, APassAnswersEachFolderAsTheFolderByFolderCheck) {
   }
 }
 
-// Rows: '+' skipped or '-' not, the name in /volume1/photo ("no-slash" as it stands), then the
-// setup. The file-system type is asked before anything else, whatever decides.
+// '+' skipped or '-' not, a name in /volume1/photo, the setup; the file-system type comes first.
 TEST_F(EligibilityTest, CrawledItemsAreSkippedByNameLocationAndFileSystem) {
   for (const std::string row :
        {"+no-slash", "+.DS_Store", "-x.DS_Store", "-.ds_store", "+@eaDir", "+WEZO@file_index_queue",

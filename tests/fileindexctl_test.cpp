@@ -1,9 +1,6 @@
-// The admin tool as a program over the shipped library and its Linux platform, in a sandbox
-// appliance (scripts/sandbox-appliance.sh) with the stand-in daemon: what the demo's walk through
-// every operation does not show (exit statuses and messages, JSON equal to the library's answer,
-// a change whose later step failed, check/repair).
+// The admin tool over the shipped library in a sandbox appliance with the stand-in daemon: exit
+// statuses and messages, JSON as the library answers, a half-done change, check and repair.
 #include <fcntl.h>
-#include <gtest/gtest.h>
 #include <json/reader.h>
 #include <json/value.h>
 #include <spawn.h>
@@ -11,10 +8,7 @@
 #include <unistd.h>
 
 #include <csignal>
-#include <filesystem>
 #include <functional>
-#include <memory>
-#include <string>
 #include <tuple>
 #include <vector>
 
@@ -33,15 +27,13 @@ struct Result {
 };
 
 Json::Value Parse(const std::string& text) {
-  Json::CharReaderBuilder builder;
-  std::unique_ptr<Json::CharReader> reader(builder.newCharReader());
   Json::Value value;
-  EXPECT_TRUE(reader->parse(text.data(), text.data() + text.size(), &value, nullptr)) << text;
+  std::istringstream in(text);
+  EXPECT_NO_THROW(in >> value) << text;
   return value;
 }
 
-// `value` as it reads back from text: the tool's JSON is text, and a number read back is signed
-// where the library may have stored it unsigned.
+// `value` read back from text, as the tool's JSON is (numbers come back signed).
 Json::Value ReadBack(const Json::Value& value) { return Parse(value.toStyledString()); }
 
 class FileindexctlTest : public SandboxTest {
@@ -56,8 +48,7 @@ class FileindexctlTest : public SandboxTest {
   }
   void TearDown() override { StopDaemon(); }
 
-  // Runs `args` with stdout and stderr to tool.out and tool.err and answers its exit status, or
-  // -1; with `pid`, leaves it running and answers 0.
+  // Runs `args` (output to tool.out, tool.err) to its exit status or -1; with `pid`, in the back.
   int Spawn(Args args, pid_t* pid) const {
     std::vector<char*> argv;
     for (std::string& arg : args) argv.push_back(arg.data());
@@ -107,7 +98,6 @@ class FileindexctlTest : public SandboxTest {
     const int status = Spawn(all, nullptr);
     return {status, Read("tool.out"), Read("tool.err")};
   }
-  // The tool's --json output of `args`, which must succeed.
   Json::Value RunJson(Args args) const {
     args.insert(args.begin(), "--json");
     const Result result = Run(args);
@@ -120,8 +110,7 @@ class FileindexctlTest : public SandboxTest {
 
 TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
   const std::string deep = std::string(2000, '[') + std::string(2000, ']');
-  // The arguments, the exit status, and what stderr holds ("": nothing) and stdout (nothing when
-  // the status is not 0).
+  // Arguments, exit status, part of stderr ("": empty) and of stdout (empty unless status 0).
   const std::tuple<Args, int, std::string, std::string> cases[] = {
       // Columns count characters, not bytes.
       {{"list", "--additional", "status", "-a", "is_valid"},
@@ -133,19 +122,14 @@ TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
        "2 of 2 folder(s)\n"},
       // The library refuses: its code and the code's meaning.
       {{"get", "/photo/none"}, 1, "get /photo/none failed: error 4 (no such indexed folder)", ""},
-      {{"pause", "99999999"}, 1, "pause failed: error 1 (bad parameter)", ""},
-      {{"add", "--request", "{}"}, 1, "add failed: error 1 (bad parameter)", ""},
       {{"reindex", "/music"}, 1, "error 0 (a path lies in a share without indexed folders)", ""},
       {{"storage", "nosuch"}, 1, "storage nosuch failed: error 0 (no share named nosuch)", ""},
-      // Accepted by the library, but not what the user expects: a warning, or a refusal under
-      // --strict before the library is called.
+      // What the library takes but the user may not expect: a warning, refused under --strict.
       {{"remove", "/photo/none"}, 0, "warning: /photo/none is not in the list", ""},
       {{"--strict", "remove", "/photo/none"}, 1, "remove: not run: --strict and 1 warning(s)", ""},
       {{"reindex", "/photo/2020"}, 0, "/photo/2020 is in no indexed folder and holds none", ""},
       {{"status", "/nosuch"}, 0, "/nosuch is not in the list", ""},
-      {{"share", "rename", "nosuch", "other"}, 0, "share nosuch is in the list; nothing moved", ""},
       {{"share", "remove", "nosuch"}, 0, "share nosuch is in the list; nothing dropped", ""},
-      {{"share", "no-space", "nosuch", "on"}, 0, "warning: no share named nosuch", ""},
       {{"add", "/archive/2018", "--photo"}, 0, "the share is read-only (read_only_share)", ""},
       {{"add", "/tv/x"}, 1, "warning: /tv/x: no share named tv", ""},
       {{"is-indexed", "--quiet", "share", "music"}, 1, "", ""},
@@ -158,7 +142,6 @@ TEST_F(FileindexctlTest, ExitStatusAndMessagesTellWhatHappened) {
       // Usage errors never reach the library.
       {{}, 2, "A subcommand is required", ""},
       {{"frobnicate"}, 2, "unknown command \"frobnicate\"", ""},
-      {{"add"}, 2, "give a share path or --request", ""},
       {{"add", "--request", "[{"}, 2, "--request: not JSON", ""},
       {{"update", "/photo/2019", "--data", deep}, 2, "--data: JSON nested deeper than", ""},
       {{"--root", "relative/dir", "list"}, 2, "--root must be an absolute path", ""},
@@ -202,6 +185,7 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResultAndNamesEachChange) {
       {{"explain", "/photo/2019/trip"}, "unknown_file_system", "/photo/2019"},
       {{"explain", At("volume1/video/movies"), "--full-path"}, "indexable", "/video/movies"},
       {{"explain", "/photo/2019/"}, "resolves_elsewhere", "/photo/2019"},
+      {{"explain", "/photo/latest"}, "resolves_elsewhere", ""},
       {{"explain", "/tv/x"}, "unknown_file_system", ""}};
   for (const auto& [args, rule, holder] : explained) {
     SCOPED_TRACE(args[1]);
@@ -210,11 +194,6 @@ TEST_F(FileindexctlTest, JsonOutputIsTheLibrarysResultAndNamesEachChange) {
     EXPECT_EQ(said["folder"], holder);
     EXPECT_EQ(said["rule"], fi::IndexRuleKey(fi::FullPathIndexRule(said["full_path"].asString())));
   }
-  EXPECT_EQ(Run({"explain", "/photo/latest"}).out,
-            "path: /photo/latest\nfull path: " + At("volume1/photo/latest") +
-                "\nmay be indexed: no, " +
-                fi::DescribeIndexRule(fi::IndexRule::kResolvesElsewhere) +
-                "\nin an indexed folder: no\n");
 
   const std::pair<Args, const char*> changes[] = {
       {{"share", "rename", "video", "music"},
@@ -243,8 +222,7 @@ TEST_F(FileindexctlTest, AStepThatFailsAfterTheSaveIsNamedWithWhatWasSavedAndHow
   const Json::Value report = Parse(paused.out);
   EXPECT_EQ(report["changes"][0]["action"], "paused");
   EXPECT_NE(report["error"]["step"].asString().find("telling the daemon"), std::string::npos);
-  // A service that does not start: named, and nothing after it claimed. The daemon is still down,
-  // so the add starts the service.
+  // A service that does not start (the daemon is down, so the add starts it) is named.
   Write("usr/bin/systemctl",
         "#!/bin/sh\n[ \"$1\" = is-active ] && echo failed\necho failing >&2\nexit 3\n", 0755);
   const Result unstarted = Run({"add", "/video/movies", "--video"});
@@ -253,14 +231,11 @@ TEST_F(FileindexctlTest, AStepThatFailsAfterTheSaveIsNamedWithWhatWasSavedAndHow
       {&added.err, "add failed: error 0 (no code recorded; the library logged: index_mgr:"},
       {&added.err, "saved all the same: updated /photo/2019"},
       {&added.err, "the step that failed: telling the daemon"},
-      {&added.err, "SendCammandToDaemon failed"},
       {&added.err, "not done: queueing the update events"},
       {&added.err, "run the same command again"},
       {&down.out, "indexing: stalled"},
-      {&down.out, "/photo/2019: stalled"},
       {&unstarted.err, "saved all the same: updated /video/movies"},
       {&unstarted.err, "the step that failed: starting the service fileindexd"},
-      {&unstarted.err, "WLIBServiceStart failed"},
       {&unstarted.err, "not done: telling the daemon"},
       {&unstarted.err, "service fileindexd.service: failed"},
       {&unstarted.err, "start the service (systemctl start fileindexd.service)"},

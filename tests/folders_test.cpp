@@ -8,10 +8,6 @@
 namespace WEZO::FILEINDEX {
 namespace {
 
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
-using testsupport::ParseJson;
-
 std::vector<std::string> PathsOf(const std::vector<Folder>& folders) {
   std::vector<std::string> paths;
   for (const Folder& folder : folders) paths.push_back(folder.GetPath());
@@ -35,7 +31,7 @@ Json::Value Report(const char* bits) {
 class FoldersTest : public testsupport::LibraryTest {
  protected:
   static void LoadText(Folders& folders, const std::string& text) {
-    testsupport::WriteFile(FolderConfPath(), text);
+    WriteFile(FolderConfPath(), text);
     ASSERT_TRUE(folders.Load());
   }
 };
@@ -82,12 +78,11 @@ TEST_F(FoldersTest, FileRoundTripWritesKeyOrderAndIgnoresTheStoredPath) {
   EXPECT_FALSE(folders.Get(get, "/photo/"));
   EXPECT_THAT(log.Lines(), ElementsAre("folders:N No such folder: /photo/"));
   ASSERT_TRUE(folders.Save());
-  const std::string text = testsupport::ReadFile(FolderConfPath());
+  const std::string text = ReadFile(FolderConfPath());
   EXPECT_EQ(ParseJson(text)["/gone/a"], ParseJson(R"({"path":"/gone/a","name":"A","document":false,
                                                  "audio":false,"video":false,"photo":false})"));
   EXPECT_EQ(testsupport::ModeOf(FolderConfPath()), 0644);
-  // Byte for byte the render of the records alone, in key order, after the load and after a
-  // change, an addition and a removal: stray members, stored paths and wrong types never survive.
+  // The records alone in key order, byte for byte, after the load and after changes.
   const auto rendered = [&folders] {
     std::vector<Folder> records;
     folders.List(records);
@@ -103,9 +98,9 @@ TEST_F(FoldersTest, FileRoundTripWritesKeyOrderAndIgnoresTheStoredPath) {
   ASSERT_TRUE(folders.Upsert(report, ParseJson(R"({"path":"/video/c","video":true})")));
   ASSERT_TRUE(folders.Delete(report, "/photo"));
   ASSERT_TRUE(folders.Save());
-  EXPECT_EQ(testsupport::ReadFile(FolderConfPath()), rendered());
+  EXPECT_EQ(ReadFile(FolderConfPath()), rendered());
   // Only an object is a folder list.
-  testsupport::WriteFile(FolderConfPath(), "[1, 2]");
+  WriteFile(FolderConfPath(), "[1, 2]");
   log.Clear();
   Folders array;
   EXPECT_FALSE(array.Load());
@@ -118,22 +113,23 @@ TEST_F(FoldersTest, FileRoundTripWritesKeyOrderAndIgnoresTheStoredPath) {
 TEST_F(FoldersTest, PagedListingSortsAndPages) {
   Folders folders;
   LoadText(folders, R"({"/photo/a":{"name":"delta","photo":true}, "/photo/B":{"name":"Charlie"},
-                        "/photo/c":{"name":"bravo","photo":true}, "/video/d":{"name":"Alpha"}})");
+                        "/photo/c":{"name":"bravo","photo":true}, "/video/d":{"name":"Bravo"}})");
   const struct {
     unsigned long offset, limit;
     const char* sortBy;
     const char* direction;
     std::vector<std::string> paths;
   } cases[] = {{1, 2, "path", "", {"/photo/B", "/photo/c"}},
-               {0, 10, "name", "ASC", {"/video/d", "/photo/c", "/photo/B", "/photo/a"}},
+               // Names equal but for case come in their paths' byte order.
+               {0, 10, "name", "ASC", {"/photo/c", "/video/d", "/photo/B", "/photo/a"}},
                {0, 10, "Name", "ASC", {"/photo/a", "/photo/B", "/photo/c", "/video/d"}},
                {3, 10, "name", "asc", {"/photo/a"}},
                {0, 0, "name", "ASC", {}},
                {4, 10, "name", "ASC", {}},
                // Descending pages come from the start of the ascending order, whatever the offset.
-               {2, 10, "name", "DESC", {"/photo/c", "/video/d"}},
+               {2, 10, "name", "DESC", {"/video/d", "/photo/c"}},
                {9, 10, "name", "DESC", {}},
-               {0, 10, "name", "desc", {"/video/d", "/photo/c", "/photo/B", "/photo/a"}},
+               {0, 10, "name", "desc", {"/photo/c", "/video/d", "/photo/B", "/photo/a"}},
                // Sorting by a kind puts the folders without it first.
                {0, 10, "photo", "ASC", {"/photo/B", "/video/d", "/photo/a", "/photo/c"}}};
   for (const auto& c : cases) {
@@ -153,30 +149,6 @@ TEST_F(FoldersTest, PagedListingSortsAndPages) {
   EXPECT_THAT(PathsOf(byShare), ElementsAre("/photo", "/photo/2019"));
   shares.List(byShare, "Photo");
   EXPECT_THAT(byShare, IsEmpty());
-}
-
-TEST_F(FoldersTest, PagedListingNeedsNoConsistentOrderFromThePlatform) {
-  // More folders than a sort puts in order by insertion, with names equal but for case.
-  Json::Value list(Json::objectValue);
-  std::vector<std::string> byteOrder;
-  for (int i = 0; i < 40; ++i) {
-    byteOrder.push_back("/photo/" + std::to_string(i));
-    list[byteOrder.back()]["name"] = i % 2 == 0 ? "Trip" : "TRIP";
-  }
-  std::sort(byteOrder.begin(), byteOrder.end());
-  Folders folders;
-  LoadText(folders, JsonToString(list));
-  // Each string before every other: std::sort given this walks off the vector's end.
-  for (const auto compare : {static_cast<int (*)(const char*, const char*)>(nullptr),
-                             +[](const char*, const char*) { return -1; }}) {
-    fake::Get().strCaseCmp = compare;
-    Json::Value page;
-    ASSERT_TRUE(folders.List(page, 0, 100, "name", "ASC", Json::Value(Json::arrayValue)));
-    std::vector<std::string> paths = PathsOf(page);
-    // Ties come in byte order; with the broken comparison only each folder once.
-    if (compare != nullptr) std::sort(paths.begin(), paths.end());
-    EXPECT_EQ(paths, byteOrder);
-  }
 }
 
 // A changed folder takes only what the request carries; the rest goes back to empty.

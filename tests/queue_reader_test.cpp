@@ -1,26 +1,17 @@
 #include "utils/queue_reader.h"
 
-#include <gmock/gmock.h>
-#include <gtest/gtest.h>
-#include <sys/stat.h>
-
 #include <algorithm>
 #include <cctype>
-#include <fstream>
-#include <functional>
 #include <memory>
 #include <random>
-#include <sstream>
 
 #include "fileindex/utils.h"
 #include "test_support.h"
-#include "utils/folder_set.h"
 #include "utils/line_index.h"
 
 namespace WEZO::FILEINDEX {
 namespace {
 
-using ::testing::ElementsAre;
 using namespace std::string_literals;
 
 // {"event":<code>,"path":"<path>"<rest>}
@@ -28,25 +19,15 @@ std::string Ev(const std::string& code, const std::string& path, const std::stri
   return R"({"event":)" + code + R"(,"path":")" + path + '"' + rest + "}";
 }
 
-// "<event> <path> <path_old>" as the parser, or the quick scan, reads the line; "none" for no
-// event, "unsure" when the scan gives up.
-std::string Parsed(const std::string& line) {
+// "<event> <path> <path_old>" as the parser (`quick`: the scan) reads it, "none", or "unsure".
+std::string LineAs(const std::string& line, bool quick = false) {
   QueueEvent e;
-  return ParseQueueLine(line.data(), line.size(), e)
-             ? std::to_string(e.event) + " " + e.path + " " + e.pathOld
-             : "none";
-}
-std::string Scanned(const std::string& line) {
-  QueueEvent e;
-  switch (detail::ScanQueueLine(line.data(), line.size(), e)) {
-    case detail::LineVerdict::kEvent:
-      return std::to_string(e.event) + " " + e.path + " " + e.pathOld;
-    case detail::LineVerdict::kNoEvent:
-      return "none";
-    case detail::LineVerdict::kUnsure:
-      break;
-  }
-  return "unsure";
+  using V = detail::LineVerdict;
+  const V v = quick ? detail::ScanQueueLine(line.data(), line.size(), e)
+              : ParseQueueLine(line.data(), line.size(), e) ? V::kEvent
+                                                            : V::kNoEvent;
+  if (v == V::kUnsure) return "unsure";
+  return v == V::kEvent ? std::to_string(e.event) + " " + e.path + " " + e.pathOld : "none";
 }
 
 const detail::ReadOptions kPlain{size_t{1} << 20, false};
@@ -58,10 +39,10 @@ void Append(const std::string& path, const std::string& text) {
 class QueueReaderTest : public testsupport::LibraryTest {
  protected:
   const std::string& Queue(const std::string& text) {
-    testsupport::WriteFile(queue, text);
+    WriteFile(queue, text);
     return queue;
   }
-  std::string queue = sandbox.Path("/queue");
+  std::string queue = At("/queue");
 };
 
 TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
@@ -103,16 +84,16 @@ TEST_F(QueueReaderTest, LineIsAnEventExactlyWhenTheStrictParserSaysSo) {
                {"", "none", false}};
   for (const auto& c : cases) {
     SCOPED_TRACE(c.line);
-    EXPECT_EQ(Parsed(c.line), c.event);
-    const std::string scanned = Scanned(c.line);
+    EXPECT_EQ(LineAs(c.line), c.event);
+    const std::string scanned = LineAs(c.line, true);
     EXPECT_TRUE(scanned == c.event || (!c.quick && scanned == "unsure")) << scanned;
   }
 }
 
 // A queue that is missing or is no file is no error; a path outside every share is.
 TEST_F(QueueReaderTest, QueueThatCannotBeReadAnswersFalse) {
-  ASSERT_EQ(mkdir(sandbox.Path("/dir").c_str(), 0755), 0);
-  for (const std::string& none : {sandbox.Path("/missing"), sandbox.Path("/dir")}) {
+  ASSERT_EQ(mkdir(At("/dir").c_str(), 0755), 0);
+  for (const std::string& none : {At("/missing"), At("/dir")}) {
     EXPECT_FALSE(IsReindexQueued(volume + "/photo/a", none));
     EXPECT_FALSE(QueueHasFolderEvent("/photo/a", none));
   }
@@ -235,8 +216,8 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
     std::vector<bool> isEvent(lines.size());
     for (size_t i = 0; i < lines.size(); ++i) {
       // The quick scan may give up on any line, but never answers otherwise than the parser.
-      const std::string scanned = Scanned(lines[i]);
-      EXPECT_TRUE(scanned == "unsure" || scanned == Parsed(lines[i])) << lines[i];
+      const std::string scanned = LineAs(lines[i], true);
+      EXPECT_TRUE(scanned == "unsure" || scanned == LineAs(lines[i])) << lines[i];
       isEvent[i] = ParseQueueLine(lines[i].data(), lines[i].size(), events[i]);
     }
     std::vector<std::string> folders;
@@ -287,8 +268,7 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
       EXPECT_EQ(found, inFolders);
       EXPECT_EQ(log.Lines(), malformed);
     }
-    // One folder at a time, then all again, through what the process remembers: a line is
-    // logged the first time the process reads it (a last line without "\n" every time).
+    // Folder by folder twice through what the process remembers: a line is logged once.
     detail::ForgetQueueScans();
     Queue(text.empty() ? text : text + "\n");
     log.Clear();
@@ -306,30 +286,8 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
   EXPECT_GT(answers[1], 200);
 }
 
-// Codes with leading zeros or at the limit of an unsigned int, in lines of the writers' shape.
-TEST_F(QueueReaderTest, PlainLinesWithOddCodesAnswerAsTheParser) {
-  const std::string f = volume + "/photo/a";
-  for (const std::string& line :
-       {Ev("0256", volume + "/x", R"(,"path_old":")" + f + "/y\""),
-        Ev("00256", f + "x", R"(,"path_old":")" + f + '"'),
-        Ev("0257", f + "x", R"(,"path_old":")" + f + '"'), Ev("065536", f), Ev("0065537", f),
-        Ev("00000065536", f), Ev("4294967295", f), Ev("4294967296", f), Ev("1065536", f),
-        R"({"data":null,"event":065536,"path":")" + f + "\"}"}) {
-    QueueEvent e;
-    const bool isEvent = ParseQueueLine(line.data(), line.size(), e);
-    Queue(Ev("2", volume + "/z") + "\n" + line + "\n");
-    std::vector<bool> found;
-    detail::QueueFoldersWithEvents({f}, queue, found, kPlain);
-    EXPECT_EQ(found[0], isEvent && (StringStartWith(e.path + "/", f + "/") ||
-                                    (e.event == 256 && StringStartWith(e.pathOld + "/", f + "/"))))
-        << line;
-    EXPECT_EQ(detail::IsReindexQueued(f, queue, kPlain), isEvent && e.event == 65536 && e.path == f)
-        << line;
-  }
-}
-
-// The readers look at the buffer 64 bytes and 16 KiB at a time: lines that end at or across
-// those boundaries, odd or not, the last one with or without "\n", answer as the parser says.
+// Lines ending at or across the readers' 64-byte and 16 KiB steps, odd ones too (odd codes in
+// the writers' shape), with or without a last "\n", answer as the parser says.
 TEST_F(QueueReaderTest, LinesAtTheEdgesOfWhatIsLookedAtOnceAnswerAsTheParser) {
   const std::string f = volume + "/photo/a";
   const std::string probes[] = {
@@ -342,7 +300,15 @@ TEST_F(QueueReaderTest, LinesAtTheEdgesOfWhatIsLookedAtOnceAnswerAsTheParser) {
       Ev("2", f + "\\/x"),
       R"({"ev\u0065nt":65536,"path":")" + f + "\"}",
       Ev("65536", f, R"(,"data":"\\")"),
-      Ev("65536", f) + "x"};
+      Ev("65536", f) + "x",
+      Ev("0256", "/x", R"(,"path_old":")" + f + "/y\""),
+      Ev("00256", f + "x", R"(,"path_old":")" + f + '"'),
+      Ev("065536", f),
+      Ev("00000065536", f),
+      Ev("4294967295", f),
+      Ev("4294967296", f),
+      Ev("1065536", f),
+      R"({"data":null,"event":065536,"path":")" + f + "\"}"};
   for (const std::string& probe : probes) {
     QueueEvent e;
     const bool isEvent = ParseQueueLine(probe.data(), probe.size(), e);
@@ -377,8 +343,7 @@ TEST_F(QueueReaderTest, LinesAtTheEdgesOfWhatIsLookedAtOnceAnswerAsTheParser) {
   }
 }
 
-// The process reads only what was appended to the same file; a queue that the daemon replaced or
-// truncated and wrote again, at the same size too, is read again from its start.
+// Only appends are read on; a queue replaced or rewritten, at the same size too, is read anew.
 TEST_F(QueueReaderTest, RemembersWhatItReadOnlyWhileTheQueueIsTheSameFileWithTheSameBytes) {
   const std::string a = volume + "/photo/a";
   const std::string b = volume + "/photo/b";
@@ -391,7 +356,7 @@ TEST_F(QueueReaderTest, RemembersWhatItReadOnlyWhileTheQueueIsTheSameFileWithThe
     fclose(f);
   };
   const auto replace = [this](const std::string& text) {  // a new inode renamed over it
-    testsupport::WriteFile(queue + ".new", text);
+    WriteFile(queue + ".new", text);
     ASSERT_EQ(rename((queue + ".new").c_str(), queue.c_str()), 0);
   };
   const std::string start = line("65536", a) + "junk\n" + line("2", b + "/x");
@@ -437,91 +402,18 @@ TEST_F(QueueReaderTest, RemembersWhatItReadOnlyWhileTheQueueIsTheSameFileWithThe
   }
 }
 
-// Folders are marked as a path lies in them, as each is found and no longer looked for; only
-// the folders asked about (the even ones) count. A folder found before is not marked again.
-TEST(FolderSetTest, MarksAsThePathLiesInTheFolderWhileFoldersAreFound) {
-  struct Row {
-    std::vector<std::string> folders;
-    std::string before;  // found before the first path
-    std::vector<std::string> paths;
-    std::string after;
-  } rows[] = {
-      {{"/share/a1", "/share/a2", "/share/b1"},
-       "000",
-       {"/share/a1/x", "/share/a1", "/share/a3/x", "/share/a2", "_share/b1/z", "/share/b1/z"},
-       "111"},
-      {{"/s/a", "/s/a/b", "/s/a/b/c"},
-       "000",
-       {"/s/a/x", "/s/a/bc/d", "/s/a/b", "/s/a/b/c/"},
-       "111"},
-      {{"/s/a", "/s/a/b/c", "/s/ab"}, "000", {"/s/a/b/c/d", "/s/ab"}, "111"},
-      {{"/s/a", "/s/a/b", "/s/c"}, "100", {"/s/a/b", "/s/b/c"}, "110"},
-      {{"/s/a", "/s/b", "/s/a"}, "000", {"/s/a/x", "/s/c"}, "101"},
-      {{"/s/a\0b"s, "/s/a", "/s/c"}, "000", {"/s/a\0c/x"s, "/s/a\0"s, "/s/c/x"}, "101"},
-      {{"", "/s"}, "00", {"s/x", "", "/s/x"}, "11"},
-      {{"/s/a", "/s/ab", "/s/a/b", "/s/a/"},
-       "0000",
-       {"/s/ab/x", "/s/a/x", "/s/a//x", "/s/a/b"},
-       "1111"},
-      {{"/s/" + std::string(300, 'l'), "/s/l"},
-       "00",
-       {"/s/" + std::string(301, 'l'), "/s/" + std::string(300, 'l') + "/x"},
-       "10"},
-  };
-  for (const Row& row : rows) {
-    std::vector<bool> found;
-    for (const char c : row.before) found.push_back(c == '1');
-    detail::FolderSet set(row.folders, found);
-    std::vector<std::string> seen;
-    for (const std::string& path : row.paths) {
-      SCOPED_TRACE(row.folders[0] + " / " + path);
-      seen.push_back(path);
-      std::vector<bool> before = found;
-      std::vector<size_t> marks;
-      std::vector<size_t> expected;
-      size_t asked = 0;
-      for (size_t f = 0; f < found.size(); ++f) {
-        const auto holds = [&](const std::string& p) {
-          return StringStartWith(p + "/", row.folders[f] + "/");
-        };
-        if (!before[f] && std::any_of(seen.begin(), seen.end(), holds)) {
-          expected.push_back(f);
-          asked += f % 2 == 0 ? 1 : 0;
-        }
-      }
-      const std::vector<bool> evens = {true, false, true, false};
-      // The reader keeps only the bytes of a path that the set needs.
-      EXPECT_EQ(set.Mark(path.substr(0, set.Limit()), path.size(), evens, found, marks), asked);
-      std::sort(marks.begin(), marks.end());
-      EXPECT_EQ(marks, expected);
-    }
-    std::string after;
-    for (const bool f : found) after += f ? '1' : '0';
-    EXPECT_EQ(after, row.after) << row.folders[0];
-  }
-}
-
-// The stretch's stops and the reindex hints against a reading byte by byte, for stretches ending
-// before, at and after the steps of 16, 32 and 64 bytes, stops and hints often adjacent, with and
-// without AVX2.
+// Stops and reindex hints as a byte-by-byte reading finds them, for stretches ending around the
+// 16, 32 and 64-byte steps, with and without AVX2.
 TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
   std::mt19937 rng(7);
   static constexpr char kBytes[] = "ab\"\\\n/{}6553eE0.9u:_-";
   std::string bytes(600, 'x');
-  for (char& c : bytes) {
-    c = kBytes[rng() % (sizeof kBytes - 1)];
-  }
-  for (const size_t at : {13, 29, 30, 62, 63, 127, 300, 596}) {
-    bytes.replace(at, 4, "6553");
-  }
+  for (char& c : bytes) c = kBytes[rng() % (sizeof kBytes - 1)];
+  for (const size_t at : {13, 29, 30, 62, 63, 127, 300, 596}) bytes.replace(at, 4, "6553");
   // A hint: "6553", or an exponent after digits and points where a number can begin.
   const auto hint = [&bytes](size_t i, size_t size) {
-    if (bytes.compare(i, 4, "6553") == 0 && i + 4 <= size) {
-      return true;
-    }
-    if ((bytes[i] | 0x20) != 'e') {
-      return false;
-    }
+    if (bytes.compare(i, 4, "6553") == 0 && i + 4 <= size) return true;
+    if ((bytes[i] | 0x20) != 'e') return false;
     size_t j = i;
     while (j > 0 &&
            (std::isdigit(static_cast<unsigned char>(bytes[j - 1])) || bytes[j - 1] == '.')) {
@@ -541,15 +433,11 @@ TEST(LineIndexTest, FindsWhatAReadingByteByByteFinds) {
       const char* next = nullptr;  // asked only where a stop follows
       for (const char* p = end; p-- != begin;) {
         next = *p == '"' || *p == '\\' || *p == '\n' ? p : next;
-        if (next != nullptr) {
-          EXPECT_EQ(index->NextStop(p), next) << p - begin;
-        }
+        EXPECT_TRUE(next == nullptr || index->NextStop(p) == next) << p - begin;
       }
       for (size_t from = 0; from < size; from += 7) {
         size_t first = from;
-        while (first < size && !hint(first, size)) {
-          ++first;
-        }
+        while (first < size && !hint(first, size)) ++first;
         const char* found = detail::NextReindexHint(begin, begin + from, end);
         EXPECT_EQ(found == nullptr ? size : static_cast<size_t>(found - begin), first) << from;
       }

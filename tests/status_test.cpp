@@ -3,14 +3,10 @@
 namespace WEZO::FILEINDEX {
 namespace {
 
-using ::testing::ElementsAre;
-using Lines = std::vector<std::string>;
-
 class StatusTest : public testsupport::LibraryTest {
  protected:
-  // A status object loaded from a status file holding `text`.
   void LoadText(Status& status, const std::string& text) {
-    testsupport::WriteFile(StatusConfPath(), text);
+    WriteFile(StatusConfPath(), text);
     ASSERT_TRUE(status.Load());
   }
 };
@@ -42,13 +38,13 @@ TEST_F(StatusTest, ValuesReadWithoutThrowingAndFlagsAreKeptByPresence) {
   status.ShareSetNoSpace("photo", true);
   ASSERT_TRUE(status.Save());
   EXPECT_EQ(StatusFile()["need_reindex"], Json::Value(Json::objectValue));
-  EXPECT_EQ(StatusFile()["no_space"], testsupport::ParseJson(R"({"photo":true})"));
+  EXPECT_EQ(StatusFile()["no_space"], ParseJson(R"({"photo":true})"));
   // A status file that is not an object holds nothing; the first change starts a new one.
   LoadText(status, "[true]");
   EXPECT_FALSE(status.IsUpdated("0") || status.ShareIsNoSpace("photo"));
   status.SetUpdated("x");
   ASSERT_TRUE(status.Save());
-  EXPECT_EQ(StatusFile(), testsupport::ParseJson(R"({"x":true})"));
+  EXPECT_EQ(StatusFile(), ParseJson(R"({"x":true})"));
 }
 
 TEST_F(StatusTest, NoSpaceNotifiesTheAdministratorsWithTheExactCommandLine) {

@@ -1,14 +1,9 @@
-#include <map>
-
+#include "utils/storage.h"
 #include "test_support.h"
 #include "utils/queue_reader.h"
-#include "utils/storage.h"
 
 namespace WEZO::FILEINDEX {
 namespace {
-
-using ::testing::ElementsAre;
-using ::testing::IsEmpty;
 
 using Getter = int (*)(const char*, char*, int);
 
@@ -21,8 +16,7 @@ class StorageTest : public testsupport::LibraryTest {
   char buffer[4096];
 };
 
-// Arguments are checked in order before anything is looked up; a failed lookup leaves its own
-// error. A result that does not fit is cut as snprintf cuts, and is still a success.
+// Arguments are checked before any lookup; a result that does not fit is cut as snprintf cuts.
 TEST_F(StorageTest, RefusesBadArgumentsAndWritesTheLocations) {
   const std::string bad = "utils:N Invaild Argument (";
   ASSERT_EQ(FILEIDXQueuePathGet("photo", buffer, sizeof buffer), static_cast<int>(queue.size()));
@@ -50,8 +44,7 @@ TEST_F(StorageTest, RefusesBadArgumentsAndWritesTheLocations) {
   }
 }
 
-// Made when missing; an existing one is no error and loses only its group and world write bits.
-// Directories that cannot be made are logged, and the path still returned.
+// Made when missing, else only its group and world write bits go; a failure is logged.
 TEST_F(StorageTest, TheDatabaseDirectoryIsWritableByItsOwnerOnlyWhateverTheUmask) {
   // Umask, then the mode of a directory already there (0: none), then the mode expected.
   for (const auto& [mask, existing, mode] :
@@ -74,15 +67,14 @@ TEST_F(StorageTest, TheDatabaseDirectoryIsWritableByItsOwnerOnlyWhateverTheUmask
                   "utils:N mkdir failed, path=" + db + ", reason=No such file or directory"));
 }
 
-// Every file and directory below `dir` (links not followed) with its content, "<dir>" or
-// "<link>".
+// Each file below `dir` with its content, "<dir>" or "<link>" (links not followed).
 std::map<std::string, std::string> Tree(const std::string& dir) {
   std::map<std::string, std::string> tree;
   for (const auto& entry : std::filesystem::recursive_directory_iterator(dir)) {
     const std::string path = entry.path().string().substr(dir.size());
     tree[path] = entry.is_symlink()     ? "<link>"
                  : entry.is_directory() ? "<dir>"
-                                        : testsupport::ReadFile(entry.path().string());
+                                        : ReadFile(entry.path().string());
   }
   return tree;
 }
@@ -116,7 +108,7 @@ TEST_F(StorageTest, NothingBelowTheShareIsReachedThroughALinkInTheMetadataDirect
 TEST_F(StorageTest, RemovingIndexDataTakesWholeTreesAndLinksButNeverWhatALinkPointsTo) {
   std::filesystem::create_directories(db + "/a");
   Write("out/file", "keep");
-  testsupport::WriteFile(queue, "q");
+  WriteFile(queue, "q");
   std::filesystem::create_symlink(out + "/file", queue + ".tmp");
   std::filesystem::create_directory_symlink(out, db + "/a/out");
   std::string deepest = db;

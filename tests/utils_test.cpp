@@ -8,9 +8,6 @@
 namespace WEZO::FILEINDEX {
 namespace {
 
-using ::testing::ElementsAre;
-using Lines = std::vector<std::string>;
-
 class UtilsTest : public testsupport::LibraryTest {};
 
 TEST_F(UtilsTest, LogLinesCarryUnitLineAndLevelAndKeepErrno) {
@@ -36,42 +33,15 @@ TEST_F(UtilsTest, LogLinesCarryUnitLineAndLevelAndKeepErrno) {
 
 TEST_F(UtilsTest, SmallHelpersAnswerOnTheirBoundaries) {
   // File tests do not follow symbolic links.
-  ASSERT_EQ(mkdir(sandbox.Path("/d").c_str(), 0755) | mkfifo(sandbox.Path("/fifo").c_str(), 0644) |
-                symlink("d", sandbox.Path("/ld").c_str()),
+  ASSERT_EQ(mkdir(At("/d").c_str(), 0755) | mkfifo(At("/fifo").c_str(), 0644) |
+                symlink("d", At("/ld").c_str()),
             0);
-  EXPECT_EQ(IsDirExist(sandbox.Path("/d")) + 2 * IsDirExist(sandbox.Path("/ld")) +
-                4 * IsFileExist(sandbox.Path("/fifo")) + 8 * IsDirExist(""),
+  EXPECT_EQ(IsDirExist(At("/d")) + 2 * IsDirExist(At("/ld")) + 4 * IsFileExist(At("/fifo")) +
+                8 * IsDirExist(""),
             1);
   // Compared as C strings: bytes after an embedded NUL do not count.
   EXPECT_TRUE(StringStartWith(std::string("/a\0x", 4), std::string("/a\0y", 4)));
   EXPECT_FALSE(StringStartWith("/vol", "/volume1") || StringStartWith("/Volume1", "/volume1"));
-
-  // Each reader takes only members of its own type and leaves its output alone otherwise.
-  Json::Value obj;
-  ASSERT_TRUE(JsonFromString(obj, R"({"s":"text","b":true,"n":5,"sb":"true"})"));
-  std::string s = "untouched";
-  bool b = false;
-  EXPECT_FALSE(RetrieveStringFromJsonObj(s, "b", obj) || RetrieveStringFromJsonObj(s, "n", obj) ||
-               RetrieveStringFromJsonObj(s, "s", Json::Value("text")));
-  EXPECT_FALSE(RetrieveBoolFromJsonObj(b, "sb", obj) || RetrieveBoolFromJsonObj(b, "n", obj));
-  EXPECT_EQ(s + (b ? "1" : "0"), "untouched0");
-  EXPECT_TRUE(RetrieveStringFromJsonObj(s, "sb", obj) && RetrieveBoolFromJsonObj(b, "b", obj));
-  EXPECT_EQ(s + (b ? "1" : "0"), "true1");
-}
-
-TEST_F(UtilsTest, SharePathsSplitAtTheFirstComponent) {
-  // The path, its share name (nullptr: refused) and ReplaceShareName(path, "b").
-  const std::tuple<const char*, const char*, const char*> kCases[] = {
-      {"/photo", "photo", "/b"},       {"/photo/", "photo", "/b/"}, {"/", "", "/b"},
-      {"photo/2019", "hoto", nullptr}, {"//x", "", nullptr},        {"", nullptr, ""}};
-  for (const auto& [path, expected, replaced] : kCases) {
-    SCOPED_TRACE(path);
-    std::string name = "old";
-    EXPECT_EQ(GetShareNameByPath(name, path), expected != nullptr);
-    EXPECT_EQ(name, expected != nullptr ? expected : "old");
-    EXPECT_EQ(replaced != nullptr ? ReplaceShareName(path, "b") : "", replaced ? replaced : "");
-  }
-  EXPECT_EQ(ReplaceShareName("/photo/2019", "pictures"), "/pictures/2019");
 }
 
 TEST_F(UtilsTest, FullPathsComeFromTheShareDatabaseAndErrorsOutliveSuccesses) {

@@ -72,9 +72,8 @@ void Platform::AddShare(const std::string& name, const std::string& path) {
 
 std::vector<Call> Platform::CallsTo(const std::string& op) const {
   std::vector<Call> out;
-  for (const Call& c : calls) {
+  for (const Call& c : calls)
     if (c.op == op) out.push_back(c);
-  }
   return out;
 }
 
@@ -245,9 +244,7 @@ int WEZOSMBSetSpotlight(int fEnable) {
   return 0;
 }
 
-int WLIBCUnicodeUTF8StrCaseCmp(const char* szA, const char* szB) {
-  return Get().strCaseCmp != nullptr ? Get().strCaseCmp(szA, szB) : strcasecmp(szA, szB);
-}
+int WLIBCUnicodeUTF8StrCaseCmp(const char* szA, const char* szB) { return strcasecmp(szA, szB); }
 
 }  // extern "C"
 

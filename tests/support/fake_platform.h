@@ -1,11 +1,6 @@
-// An in-memory platform for the library's tests.
-//
-// It implements every operation of wezo/platform.h and wezo/wezotifyd.h that the library calls
-// from the state below, records each call with its arguments, and fails an operation on request.
-// Only the platform is faked: the one operation that creates something on disk (WEZOEAMKDir)
-// really creates the directory, because configuration files, locks, queues and sockets in the
-// tests are real files under a sandbox root. The state is per process; each test process starts
-// from Reset().
+// An in-memory platform for the library's tests: every operation the library calls answers from
+// the state below, is recorded with its arguments and fails on request. WEZOEAMKDir really makes
+// the directory, as files, locks, queues and sockets are real under the sandbox root.
 #ifndef FILEINDEX_TESTS_SUPPORT_FAKE_PLATFORM_H_
 #define FILEINDEX_TESTS_SUPPORT_FAKE_PLATFORM_H_
 
@@ -44,7 +39,6 @@ struct Call {
 };
 
 struct Platform {
-  // ---- state ----
   std::map<std::string, Share> shares;     // by name
   std::map<std::string, PathFacts> facts;  // by exact full path
   PathFacts defaultFacts;                  // for every other path
@@ -55,11 +49,7 @@ struct Platform {
   int execResult = 0;                   // what WLIBCExecv returns
   // Monitor registrations by client, then queue path.
   std::map<std::string, std::map<std::string, Json::Value>> monitor;
-  // WLIBCUnicodeUTF8StrCaseCmp's answer when set (strcasecmp otherwise), to play a platform
-  // whose comparison is not a consistent order.
-  int (*strCaseCmp)(const char*, const char*) = nullptr;
 
-  // ---- failure injection, by area ----
   bool share_get_fails = false, share_name_path_get_fails = false;
   int share_get_fails_after = -1;  // when >= 0, share lookups after that many successes fail
   bool encrypted_query_fails = false, encryption_query_fails = false;
@@ -68,7 +58,6 @@ struct Platform {
   bool spotlight_query_fails = false, spotlight_set_fails = false;
   bool monitor_upsert_fails = false, monitor_delete_fails = false;
 
-  // ---- observation ----
   std::vector<Call> calls;   // every call but the string comparison, in order
   int openShareRecords = 0;  // records handed out by WEZOShareGet and not yet freed
   int errCode = 0;
@@ -79,10 +68,8 @@ struct Platform {
   std::vector<Call> CallsTo(const std::string& op) const;
 };
 
-// The process's fake platform.
+// The process's fake platform; Reset() makes it fresh: no shares, calls, failures or error.
 Platform& Get();
-
-// Back to a fresh platform: no shares, no calls, no failures, no last error.
 void Reset();
 
 }  // namespace fake

@@ -1,6 +1,5 @@
-// A temporary directory per test, made the library's root prefix for the test's lifetime, with
-// small file helpers over it. Set up in the constructor, so that a derived fixture's constructor
-// already runs inside it; the root holds no symbolic link (it is the canonical path).
+// A canonical temporary directory per test as the library's root prefix, set in the constructor
+// so that derived fixtures run inside it, with small file helpers.
 #ifndef FILEINDEX_TESTS_SUPPORT_SANDBOX_H_
 #define FILEINDEX_TESTS_SUPPORT_SANDBOX_H_
 

@@ -96,8 +96,8 @@ std::string Joined(const std::vector<std::string>& parts) {
 
 LockHolder::LockHolder(const std::string& path, bool exclusive)
     : m_fd(open(path.c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644)) {
-  m_holding = m_fd >= 0 && flock(m_fd, exclusive ? LOCK_EX : LOCK_SH) == 0;
-  EXPECT_TRUE(m_holding) << "could not lock " << path;
+  EXPECT_TRUE(m_fd >= 0 && flock(m_fd, exclusive ? LOCK_EX : LOCK_SH) == 0)
+      << "cannot lock " << path;
 }
 
 LockHolder::~LockHolder() {
@@ -106,8 +106,7 @@ LockHolder::~LockHolder() {
 
 namespace {
 
-// A path filling sun_path to its last byte is taken: a test puts a daemon where the library must
-// refuse to look.
+// A path filling sun_path is taken: a test puts a daemon where the library must not look.
 sockaddr_un AddressOf(const std::string& path) {
   sockaddr_un address{};
   address.sun_family = AF_UNIX;
@@ -115,8 +114,7 @@ sockaddr_un AddressOf(const std::string& path) {
   return address;
 }
 
-// Connects to the socket at `path` (with SOCK_NONBLOCK, not waiting on a full backlog); -1 on
-// failure.
+// Connects to `path` (SOCK_NONBLOCK: not waiting on a full backlog); -1 on failure.
 int ConnectTo(const std::string& path, int flags = 0) {
   const sockaddr_un address = AddressOf(path);
   const int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | flags, 0);
@@ -203,24 +201,20 @@ void FakeDaemon::Serve() {
   for (int fd : held) close(fd);
 }
 
-std::vector<std::string> FakeDaemon::Connections(size_t count, std::chrono::milliseconds timeout) {
+std::vector<std::string> FakeDaemon::Connections(size_t count, std::chrono::milliseconds timeout,
+                                                 bool commands) {
+  // A connection closed without a byte asked whether the daemon answers; it is no command.
+  const auto ended = [&] {
+    return static_cast<size_t>(std::count_if(
+        m_ended.begin(), m_ended.end(), [&](const auto& f) { return !commands || !f.empty(); }));
+  };
   std::unique_lock<std::mutex> lock(m_mutex);
-  m_changed.wait_for(lock, timeout, [&] { return m_ended.size() >= count; });
+  m_changed.wait_for(lock, timeout, [&] { return ended() >= count; });
   return m_ended;
 }
 
 std::vector<Json::Value> FakeDaemon::Commands(size_t count, std::chrono::milliseconds timeout) {
-  std::vector<std::string> frames;
-  {
-    // A connection closed without a byte asked whether the daemon answers; it is no command.
-    const auto commands = [this] {
-      return static_cast<size_t>(std::count_if(m_ended.begin(), m_ended.end(),
-                                               [](const std::string& f) { return !f.empty(); }));
-    };
-    std::unique_lock<std::mutex> lock(m_mutex);
-    m_changed.wait_for(lock, timeout, [&] { return commands() >= count; });
-    frames = m_ended;
-  }
+  const std::vector<std::string> frames = Connections(count, timeout, true);
   std::vector<Json::Value> out;
   for (const std::string& frame : frames) {
     if (frame.empty()) continue;

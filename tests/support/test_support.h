@@ -1,7 +1,5 @@
-// Shared helpers of the library's tests: the fixture with its sandbox root, the captured log,
-// another process that holds a file lock, and a stand-in daemon on the socket. It brings what
-// every library test uses: the library's whole interface, its fixed paths, JSON text and the fake
-// platform.
+// The library tests' fixture, captured log, foreign lock and stand-in daemon, with what every
+// library test uses: the whole interface, its fixed paths, JSON text and the fake platform.
 #ifndef FILEINDEX_TESTS_SUPPORT_TEST_SUPPORT_H_
 #define FILEINDEX_TESTS_SUPPORT_TEST_SUPPORT_H_
 
@@ -60,8 +58,8 @@ int OpenDescriptorCount();
 bool LockHeldElsewhere(const std::string& path);  // some descriptor holds a flock on `path`
 std::string Joined(const std::vector<std::string>& parts);  // "a; b; c"
 
-// A flock on `path` (opened, created if need be) held until destroyed through a descriptor of its
-// own: flock locks belong to the open file, so the library meets it as another process's lock.
+// A flock on `path` (created if need be) through a descriptor of its own: another process's.
+// Fails the test when it cannot be had.
 class LockHolder {
  public:
   LockHolder(const std::string& path, bool exclusive);
@@ -69,11 +67,8 @@ class LockHolder {
   LockHolder(const LockHolder&) = delete;
   LockHolder& operator=(const LockHolder&) = delete;
 
-  bool Holding() const { return m_holding; }
-
  private:
   int m_fd = -1;
-  bool m_holding = false;
 };
 
 // A stand-in for the indexing daemon on the sandbox's socket path, served one connection at a time
@@ -93,13 +88,12 @@ class FakeDaemon {
   FakeDaemon& operator=(const FakeDaemon&) = delete;
 
   void Release();  // kHoldConnect: from now on behave as kRead
-  // The bytes of each ended connection in order ("" when closed unread), once `count` have ended
-  // or `timeout` passed.
+  // Each ended connection's bytes ("" closed unread), once `count` ended (of those with bytes,
+  // with `commands`) or `timeout` passed.
   std::vector<std::string> Connections(size_t count,
-                                       std::chrono::milliseconds timeout = std::chrono::seconds(5));
-  // The commands decoded, once `count` have ended or `timeout` passed; connections closed without
-  // a byte are left out. A length field that is not the rest's size, or no single final zero,
-  // fails.
+                                       std::chrono::milliseconds timeout = std::chrono::seconds(5),
+                                       bool commands = false);
+  // The commands decoded likewise, empty connections left out; a bad length or zero fails.
   std::vector<Json::Value> Commands(size_t count,
                                     std::chrono::milliseconds timeout = std::chrono::seconds(5));
 
@@ -118,25 +112,29 @@ class FakeDaemon {
   std::vector<std::string> m_ended;
 };
 
-// Every library test's fixture: a sandbox root with the appliance's directories, a fresh fake
-// platform with shares "photo" and "video" (both made on its /volume1), the log captured, no
-// error, LOG_LEVEL 3.
+// The appliance's directories in the sandbox, a fresh fake platform with shares "photo" and
+// "video" on /volume1, the log captured, no error, LOG_LEVEL 3.
 class LibraryTest : public SandboxTest {
  protected:
   LibraryTest();
 
   void ResetPlatform();  // the constructor's fresh fake platform again, no error, the log cleared
   static Json::Value StatusFile();  // status.conf parsed; fails the test when it is not JSON
-  // The sandbox as older tests name it: Path("/x"), Root().
-  struct Paths {
-    const std::string& root;
-    std::string Path(const std::string& relative) const { return root + relative; }
-    const std::string& Root() const { return root; }
-  } sandbox{root_};
   LogCapture log;
   std::string volume;  // the sandbox's /volume1
 };
 
 }  // namespace testsupport
+
+// The library's tests live in its namespace and name the helpers they all use unqualified.
+namespace WEZO::FILEINDEX {
+using ::testing::ElementsAre;
+using ::testing::IsEmpty;
+using testsupport::FakeDaemon;
+using testsupport::ParseJson;
+using testsupport::ReadFile;
+using testsupport::WriteFile;
+using Lines = std::vector<std::string>;
+}  // namespace WEZO::FILEINDEX
 
 #endif  // FILEINDEX_TESTS_SUPPORT_TEST_SUPPORT_H_

@@ -1,9 +1,7 @@
-#include <gtest/gtest.h>
 #include <unistd.h>
 #include <wezo/platform.h>
 
 #include <set>
-#include <string>
 #include <thread>
 #include <tuple>
 
@@ -24,6 +22,9 @@ TEST_F(ExecTest, OnlyAProgramThatExitsWithZeroSucceedsAndArgumentsPassVerbatim) 
     EXPECT_LT(WLIBCExecv(program.c_str(), argv, 1), 0) << program;
     EXPECT_NE(WLIBCErrGet(), 0) << program;
   }
+  Write("ok", "#!/bin/sh\nexit 0\n", 0755);
+  const char* const alone[] = {"ok", nullptr};  // no argument past the program's name
+  EXPECT_EQ(WLIBCExecv(At("ok").c_str(), alone, 1), 0);
   // No shell: every argument arrives as it was given.
   Write("record", "#!/bin/sh\nout=$1\nshift\nprintf '%s\\n' \"$@\" > \"$out\"\n", 0755);
   const std::string program = At("record");

@@ -1,14 +1,10 @@
 #include <sys/mount.h>
-#include <sys/stat.h>
 #include <unistd.h>
 #include <wezo/platform.h>
 #include <wezo/wezotifyd.h>
 
 #include <algorithm>
 #include <climits>
-#include <filesystem>
-#include <fstream>
-#include <string>
 
 #include "internal.h"
 #include "json_io.h"
@@ -85,8 +81,13 @@ MonitorQueue Entry(const std::string& queue, const std::string& dir) {
 TEST_F(MonitorTest, KeepsOneFilePerClientAndQueueAndRefusesOtherNames) {
   const std::string queue = "/volume1/photo/@eaDir/q";
   const std::string file = At("var/lib/wezotifyd/fx/%2Fvolume1%2Fphoto%2F%40eaDir%2Fq.json");
+  const std::string stale = file + ".a1B2c3";  // a killed writer's temporary file
   ASSERT_TRUE(MonitorQueue::Upsert(Entry(queue, "/volume1/photo/a"), "fx", QUEUE_TYPE_FILE));
+  Write(stale.substr(root_.size()), "{");
+  std::filesystem::last_write_time(
+      stale, std::filesystem::file_time_type::clock::now() - std::chrono::hours(1));
   ASSERT_TRUE(MonitorQueue::Upsert(Entry(queue, "/volume1/photo/b"), "fx", QUEUE_TYPE_FILE));
+  EXPECT_FALSE(std::filesystem::exists(stale));
   Json::Value stored;
   ASSERT_TRUE(WEZO::FILEINDEX::JsonFromFile(stored, file));
   EXPECT_EQ(stored, Entry(queue, "/volume1/photo/b").Entry());

@@ -1,10 +1,7 @@
-#include <sys/stat.h>
 #include <unistd.h>
 #include <wezo/platform.h>
 
 #include <chrono>
-#include <filesystem>
-#include <string>
 #include <tuple>
 
 #include "internal.h"
@@ -14,9 +11,8 @@ namespace {
 
 using ShareTest = SandboxTest;
 
-// Samba's rules at work: comments, continuation lines, names without case or spaces, the last
-// value winning across a parameter's other names, a repeated section, special sections and one
-// without a path.
+// Samba's rules: comments, continuations, names without case or spaces, the last of a parameter's
+// names winning, a repeated section, special sections and one without a path.
 const char* const kConf =
     "; comment\n# [commented]\n[global]\n   read only = no\n"
     "[photo]\n   path = /volume1/photo/\n   READ ONLY = yes\n   writable = yes\n"
@@ -100,17 +96,20 @@ TEST_F(ShareTest, FailuresAndUnencryptedFoldersAreTold) {
 }
 
 // A configuration that has settled is parsed once and kept; a new file in its place, or one of
-// another size, is read again even when it carries the same modification time.
+// another size or time, is read again even when it carries the same modification second.
 TEST_F(ShareTest, AKeptConfigurationFollowsEveryChangeOfTheFile) {
-  const auto settled = std::filesystem::file_time_type::clock::now() - std::chrono::hours(1);
-  // Each share's file, written with the same time and moved over smb.conf: the second is a new
-  // file of the same size, the third the same file rewritten in place.
+  const auto settled = std::chrono::floor<std::chrono::seconds>(
+      std::filesystem::file_time_type::clock::now() - std::chrono::hours(1));
+  // Moved over smb.conf in one second: a new file of the same size, the same file rewritten in
+  // place, and again at the same size a nanosecond later.
   const char* before = "none";
+  int tick = 0;
   for (const auto& [file, name] : {std::pair{"etc/samba/smb.conf", "aaaa"},
                                    {"etc/samba/next", "bbbb"},
-                                   {"etc/samba/smb.conf", "cc"}}) {
+                                   {"etc/samba/smb.conf", "cc"},
+                                   {"etc/samba/smb.conf", "dd"}}) {
     Write(file, std::string("[") + name + "]\npath = /v/x\n");
-    std::filesystem::last_write_time(At(file), settled);
+    std::filesystem::last_write_time(At(file), settled + std::chrono::nanoseconds(++tick / 4));
     std::filesystem::rename(At(file), At("etc/samba/smb.conf"));
     for (const auto& [asked, found] : {std::pair{name, true}, {before, false}}) {
       PWEZOSHARE share = nullptr;
@@ -167,6 +166,7 @@ TEST_F(SpotlightTest, ReadsSambasDefaultAndRefusesWhatSambaRefuses) {
   ASSERT_EQ(unlink(At("etc/samba/smb.conf").c_str()), 0);
   EXPECT_LT(WEZOSMBIsEnableSpotlight(), 0);
   EXPECT_LT(WEZOSMBSetSpotlight(1), 0);
+  EXPECT_EQ(WLIBCErrGet(), WEZO::PLATFORM::kErrNotFound);
   EXPECT_NE(access(At("etc/samba/smb.conf").c_str(), F_OK), 0);
 }
 

@@ -1,18 +1,13 @@
-// The monitor daemon as a program against the real kernel, each test with its own daemon in its
-// own sandbox root; registrations are written through the platform's client API.
+// The monitor daemon against the real kernel, one daemon per sandbox, registered through the API.
 #include <fcntl.h>
 #include <spawn.h>
 #include <sys/file.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 #include <wezo/wezotifyd.h>
 
 #include <chrono>
-#include <filesystem>
-#include <fstream>
 #include <functional>
-#include <string>
 #include <thread>
 #include <tuple>
 #include <vector>
@@ -150,8 +145,7 @@ TEST_F(WezotifydTest, FlagsTheShareForAReindexWhenTheKernelDropsEvents) {
   })) << Read("log");
 }
 
-// The consumer takes a queue by removing it under its lock: a change that came meanwhile goes to
-// a new queue, not to the file nobody reads any more.
+// The consumer takes a queue by removing it under its lock: a change made meanwhile goes anew.
 TEST_F(WezotifydTest, WritesToANewQueueWhenTheOneItWaitedForIsTaken) {
   Start(1);
   const int taken = open(Queue(1).c_str(), O_RDWR | O_CREAT | O_CLOEXEC, 0644);
