@@ -206,10 +206,20 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
   std::mt19937 rng(1234567);  // NOLINT(cert-msc32-c,cert-msc51-cpp): the same queues every run
   int answers[2] = {0, 0};
   for (int round = 0; round < 40; ++round) {
-    // Short queues give "no" answers, long ones "yes"; the first is empty.
+    // Short queues give "no" answers, long ones "yes"; the first is empty. Every tenth is read
+    // in 64 KiB blocks, so in two halves at once.
     detail::ForgetQueueScans();
-    const std::string text = MixedQueue(volume, rng, round == 0 ? 0 : round % 2 == 0 ? 6 : 100);
+    const bool halves = round % 10 == 9;
+    const std::string text = MixedQueue(volume, rng,
+                                        round == 0       ? 0
+                                        : halves         ? 3000
+                                        : round % 2 == 0 ? 6
+                                                         : 100);
     Queue(text);
+    ASSERT_TRUE(!halves || text.size() >= 4 * (size_t{64} << 10));
+    const std::vector<size_t> blockSizes = halves ? std::vector<size_t>{size_t{64} << 10}
+                                                  : std::vector<size_t>{size_t{1} << 20, 61, 7, 1};
+    const detail::ReadOptions remembered{blockSizes[0], true};
     std::vector<std::string> lines = Split(text, '\n');
     if (lines.back().empty()) lines.pop_back();  // no line after the last "\n"
     std::vector<QueueEvent> events(lines.size());
@@ -245,12 +255,12 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
       ++answers[inFolder];
       folders.push_back(path);
       inFolders.push_back(inFolder);
-      for (const size_t blockSize : {size_t{1} << 20, size_t{61}, size_t{7}, size_t{1}}) {
+      for (const size_t blockSize : blockSizes) {
         SCOPED_TRACE(std::to_string(round) + " " + relative + " / " + std::to_string(blockSize));
         EXPECT_EQ(detail::IsReindexQueued(path, queue, {blockSize, false}), reindex);
       }
       // What the process remembers answers the same, whatever was asked before.
-      EXPECT_EQ(IsReindexQueued(path, queue), reindex);
+      EXPECT_EQ(detail::IsReindexQueued(path, queue, remembered), reindex);
     }
     std::vector<std::string> malformed;  // the log line ends where the line has a NUL byte
     for (size_t i = 0; i < lines.size() && i <= lastNeeded; ++i) {
@@ -260,7 +270,7 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
       }
     }
     // All folders in one read, wherever blocks end; each malformed line read is logged once.
-    for (const size_t blockSize : {size_t{1} << 20, size_t{61}, size_t{7}, size_t{1}}) {
+    for (const size_t blockSize : blockSizes) {
       SCOPED_TRACE(std::to_string(round) + " / " + std::to_string(blockSize));
       log.Clear();
       std::vector<bool> found;
@@ -275,7 +285,7 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
     for (int pass = 0; pass < 2; ++pass) {
       for (size_t i = 0; i < folders.size(); ++i) {
         std::vector<bool> found;
-        QueueFoldersWithEvents({folders[i]}, queue, found);
+        detail::QueueFoldersWithEvents({folders[i]}, queue, found, remembered);
         EXPECT_EQ(found[0], inFolders[i]) << folders[i];
       }
     }
