@@ -296,6 +296,30 @@ TEST_F(QueueReaderTest, ReadersAnswerAsParsingEveryLineWhereverBlocksEnd) {
   EXPECT_GT(answers[1], 200);
 }
 
+// A queue of four 64 KiB blocks is read in two halves at once. What the second half finds
+// counts, the reading goes on past a malformed line in it, and each malformed line is logged
+// once, in order.
+TEST_F(QueueReaderTest, TwoHalvesAnswerAndLogAsOneReading) {
+  const std::string a = volume + "/photo/a";
+  const std::string b = volume + "/photo/b";
+  const auto filler = [this](size_t size) {  // lines in no folder asked about
+    std::string text;
+    while (text.size() < size)
+      text += Ev("2", volume + "/photo/x/" + std::to_string(text.size())) + "\n";
+    return text;
+  };
+  // The middle falls in the second filler: "bad 1" is in the first half, the rest in the second.
+  Queue(filler(100 << 10) + "bad 1\n" + filler(150 << 10) + filler(150 << 10) + Ev("2", b + "/y") +
+        "\nbad 2\n" + Ev("65536", a) + "\n" + Ev("2", a + "/z") + "\n");
+  std::vector<bool> found;
+  detail::QueueFoldersWithEvents({a, b, volume + "/photo/none"}, queue, found, {64 << 10, false});
+  EXPECT_EQ(found, (std::vector<bool>{true, true, false}));
+  EXPECT_THAT(log.Lines(), ElementsAre("status_mgr:N Malformed command: bad 1",
+                                       "status_mgr:N Malformed command: bad 2"));
+  EXPECT_TRUE(detail::IsReindexQueued(a, queue, {64 << 10, false}));
+  EXPECT_FALSE(detail::IsReindexQueued(b, queue, {64 << 10, false}));
+}
+
 // Lines ending at or across the readers' 64-byte and 16 KiB steps, odd ones too (odd codes in
 // the writers' shape), with or without a last "\n", answer as the parser says.
 TEST_F(QueueReaderTest, LinesAtTheEdgesOfWhatIsLookedAtOnceAnswerAsTheParser) {
