@@ -516,7 +516,6 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
   pass.left = left;
   pass.end = from;
   Tail tail;
-  const BlockReader* head = nullptr;
   std::unique_ptr<BlockReader> first;
   std::unique_ptr<BlockReader> last;
   if (pass.left > 0) {
@@ -540,7 +539,6 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
       first->StopAt(split);
     }
     ReadFolders(*first, wanted, asked, pass, quietUpTo, nullptr);
-    head = first.get();
     tail.ok = first->TailWindow(pass.end, tail.hash, tail.size);
     if (halves) {
       second.Join(pass.end != split);
@@ -579,9 +577,9 @@ void FoldersInFile(int fd, const std::string& queueFile, const std::vector<std::
     return;
   }
   FolderEntry next;
-  if (head == nullptr) {
+  if (first == nullptr) {
     next.file = entry.file;
-  } else if (!Describe(fd, head->Head(), tail, end, subset ? &entry.file : nullptr, next.file)) {
+  } else if (!Describe(fd, first->Head(), tail, end, subset ? &entry.file : nullptr, next.file)) {
     return;
   }
   for (size_t i = 0; i < wanted.size(); ++i) {
